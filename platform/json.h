@@ -1,0 +1,42 @@
+#pragma once
+
+#include <json/value.h>
+
+#include <string>
+
+/// Text and file operations on JSON values that stock JsonCpp lacks.
+///
+/// Reading is strict: one JSON text and nothing behind it but white space; no comments, no
+/// duplicate keys, no NaN or infinities; at most `kMaxDepth` levels; at most `kMaxSize` bytes; no
+/// number that neither 64-bit integers nor a finite double can hold. Nothing here throws on bad
+/// input, and a value is replaced only when the whole text was good.
+namespace maru::json {
+
+constexpr unsigned kMaxDepth = 64;
+constexpr std::size_t kMaxSize = 64u << 20;
+
+/// Parses `text` into `value`. On false `value` is unchanged and, when asked for, `error` says why.
+bool FromString(const std::string& text, Json::Value& value, std::string* error = nullptr);
+
+/// One line, no line breaks, keys sorted. Bytes of strings are kept as they are, also where they
+/// are not UTF-8 (file names may be anything).
+std::string ToString(const Json::Value& value);
+
+/// Reads and parses a regular file, without following a symbolic link in the last component. On
+/// false `value` is unchanged; `errno` tells of the file, or is 0 when the text was at fault.
+bool FromFile(const std::string& path, Json::Value& value);
+
+/// Writes `value` so that a reader sees the old text or the new one, never a part (temporary file
+/// in the same folder, then rename). New files get mode 0600 less the umask. False with `errno`
+/// set.
+bool ToFile(const Json::Value& value, const std::string& path);
+
+/// Member access that never throws: null, `fallback` or false when `object` is not an object, has
+/// no such member, or the member is of another type.
+const Json::Value& Member(const Json::Value& object, const char* key);
+std::string StringMember(const Json::Value& object, const char* key,
+                         const std::string& fallback = {});
+int IntMember(const Json::Value& object, const char* key, int fallback = 0);
+bool BoolMember(const Json::Value& object, const char* key, bool fallback = false);
+
+}  // namespace maru::json

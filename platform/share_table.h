@@ -1,0 +1,62 @@
+#pragma once
+
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "platform/acl.h"
+
+namespace maru {
+
+/// One shared folder, as the Samba settings define it.
+struct ShareSettings {
+  std::string name;
+  /// Where it lies on the disk. For "homes": the folder that holds the home folders.
+  std::string path;
+  bool available = true;
+  bool read_only = true;
+  bool hide_unreadable = false;
+  bool recycle = false;
+  /// Parametric option `maruseeker:index = no` keeps a share out of the index.
+  bool index = true;
+  /// Parametric option `maruseeker:deny = list read`: 1 forbids listing, 4 forbids reading.
+  unsigned int deny = 0;
+  std::vector<std::string> valid_users, invalid_users, admin_users, read_list, write_list;
+
+  /// "/volume1/NAME".
+  std::string VolumePath() const;
+};
+
+/// The shares of this server at one moment; immutable.
+class ShareTable {
+ public:
+  /// The newest good table. Looks at the settings file's identity and time and reads it again when
+  /// it changed; when the new one has an error, the last good table stays (also across restarts,
+  /// from a copy in the state folder) and `Error` says why. Never null. Thread-safe.
+  static std::shared_ptr<const ShareTable> Current();
+  /// The table as it was last read, without looking at the file: for request children.
+  static void Freeze();
+
+  /// Parses the canonical form. Throws std::runtime_error naming the line.
+  static ShareTable Parse(const std::string& text);
+
+  const std::vector<ShareSettings>& Shares() const { return shares_; }
+  /// Null when there is no such share.
+  const ShareSettings* Find(const std::string& name) const;
+  /// Empty, or why the newest settings are not in force.
+  const std::string& Error() const { return error_; }
+
+ private:
+  std::vector<ShareSettings> shares_;
+  std::string error_;
+  friend class ShareTableSource;
+};
+
+/// MARUSHAREPRIV of the user on the share by the share's lists (platform/share.h says the rules).
+/// Administrators are not treated specially here.
+int PrivilegeOf(const ShareSettings& share, const std::string& user_name, const Identity& identity);
+
+/// The volume under which all shares appear to users: "/volume1".
+inline constexpr const char* kVolume = "/volume1";
+
+}  // namespace maru
