@@ -1,0 +1,58 @@
+#pragma once
+
+#include <cstdint>
+#include <functional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+/// How text becomes words: the same way for documents, names, queries and highlighting.
+///
+/// A word is a run of letters, digits and marks, folded: lower case, compatibility forms and
+/// accents taken off ("Résumé" and "RESUME" are one word), at most kMaxWord bytes (longer runs are
+/// cut there and the rest skipped). In scripts written without spaces (Han, kana, Thai, Lao, Khmer,
+/// Myanmar) every character is a word of its own; a query for several of them is a phrase. Bytes
+/// that are not UTF-8 separate words. Positions count from 1.
+namespace maru::index {
+
+inline constexpr std::size_t kMaxWord = 64;
+
+struct Token {
+  /// Folded; valid only during the call that hands it over.
+  std::string_view word;
+  /// Where it stands in the text, in bytes: [begin, end).
+  std::size_t begin;
+  std::size_t end;
+};
+
+/// Splits `text` and keeps the state (a buffer) from call to call. One thread each.
+class Tokenizer {
+ public:
+  /// Calls `use(const Token&)` for each word in order; a `use` that returns false ends the walk.
+  template <class Use>
+  void ForEach(std::string_view text, Use&& use) {
+    std::size_t at = 0;
+    Token token;
+    while (Next(text, at, token)) {
+      if (!use(static_cast<const Token&>(token))) return;
+    }
+  }
+
+ private:
+  bool Next(std::string_view text, std::size_t& at, Token& token);
+  void Take(char32_t c, std::size_t& length);
+
+  char word_[kMaxWord + 32];
+};
+
+/// The folded words of a short text.
+std::vector<std::string> WordsOf(std::string_view text);
+
+/// The words of a file name, as indexed: its words, and the parts of words that change from letters
+/// to digits or from lower to upper case ("IMG2034.jpg": img2034, jpg, img, 2034).
+std::vector<std::string> WordsOfName(std::string_view name);
+
+/// One word by the same folding, without splitting; for keywords and exact values.
+std::string Fold(std::string_view text);
+
+}  // namespace maru::index
