@@ -24,7 +24,7 @@ struct KindRow {
   std::string_view extensions;  // each between blanks
 };
 
-constexpr std::array kKinds = {
+constexpr std::array kKindRows = {
     KindRow{
         "document",
         " docx wri rtf pptx pps ppsx pdf txt text doc ppt odt odp odg odc odf odb odi odm ott otp "
@@ -52,6 +52,8 @@ constexpr std::array kKinds = {
     KindRow{"archive", " zip tar gz tgz bz2 tbz xz txz zst 7z rar deb rpm iso jar lz lzma cpio "},
 };
 
+static_assert(kKindRows.size() + 2 == kKinds, "folder and other come behind the table");
+
 }  // namespace
 
 std::span<const Field> Fields() {
@@ -68,17 +70,23 @@ const Field* FindField(std::string_view name) {
 std::string_view KindOfExtension(std::string_view extension) {
   if (extension.empty() || extension.find(' ') != std::string_view::npos) return "other";
   const std::string word = " " + std::string(extension) + " ";
-  for (const KindRow& row : kKinds) {
+  for (const KindRow& row : kKindRows) {
     if (row.extensions.find(word) != std::string_view::npos) return row.kind;
   }
   return "other";
 }
 
 bool IsKind(std::string_view kind) {
-  for (const KindRow& row : kKinds) {
-    if (row.kind == kind) return true;
+  return KindNumber(kind) < kKinds;
+}
+
+std::uint8_t KindNumber(std::string_view kind) {
+  std::uint8_t number = 0;
+  for (const KindRow& row : kKindRows) {
+    if (row.kind == kind) return number;
+    ++number;
   }
-  return kind == "folder" || kind == "other";
+  return kind == "folder" ? number : kind == "other" ? number + 1 : kKinds;
 }
 
 std::string ExtensionOf(std::string_view name) {

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstdint>
 #include <span>
 #include <string>
 #include <string_view>
@@ -49,6 +50,10 @@ const Field* FindField(std::string_view name);
 std::string_view KindOfExtension(std::string_view extension);
 /// Whether `kind` is one of them.
 bool IsKind(std::string_view kind);
+/// Number of kinds, and the number of each (from 0, the row of the table; kKinds for an unknown
+/// one).
+inline constexpr std::uint8_t kKinds = 8;
+std::uint8_t KindNumber(std::string_view kind);
 /// The extension of a file name: what follows its last dot, lower-cased; empty without one.
 std::string ExtensionOf(std::string_view name);
 

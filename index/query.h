@@ -42,6 +42,8 @@ struct Query {
 
   static constexpr unsigned kMaxExpansion = 100;
 
+  friend bool operator==(const Query&, const Query&) = default;
+
   /// Deepest tree and most nodes the index takes; a larger one is refused with an Error.
   static constexpr unsigned kMaxDepth = 32;
   static constexpr unsigned kMaxNodes = 4096;

@@ -1,0 +1,91 @@
+#pragma once
+
+#include <xapian.h>
+
+#include <functional>
+#include <map>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "index/directories.h"
+
+/// What the matcher asks about single documents: may these eyes see it, does it lie in that folder, was
+/// it opened before. Consulted in the order of document ids, one share at a time.
+namespace maru::index {
+
+/// Judges documents by their place. Shared by the copies the matcher makes; immutable while matching.
+class PlaceRule {
+ public:
+  virtual ~PlaceRule() = default;
+  /// False: Accepts is the same for every document and need not be asked.
+  virtual bool Judges(std::size_t share) const = 0;
+  virtual bool Accepts(std::size_t share, DocumentId document, const Place& place) const = 0;
+};
+
+/// Share numbers by the engine's name of each database.
+using ShareNumbers = std::map<std::string, std::size_t>;
+
+/// A weightless source of all documents that a rule accepts; also where a search finds out that nobody
+/// waits for it any more (throws Cancelled).
+class PlaceSource : public Xapian::PostingSource {
+ public:
+  PlaceSource(std::shared_ptr<const PlaceRule> rule, std::shared_ptr<const ShareNumbers> shares,
+              std::function<bool()> cancelled)
+      : rule_(std::move(rule)), shares_(std::move(shares)), cancelled_(std::move(cancelled)) {}
+
+  Xapian::doccount get_termfreq_min() const override { return 0; }
+  Xapian::doccount get_termfreq_est() const override { return documents_; }
+  Xapian::doccount get_termfreq_max() const override { return documents_; }
+  void next(double min_weight) override;
+  void skip_to(Xapian::docid document, double min_weight) override;
+  bool check(Xapian::docid document, double min_weight) override;
+  bool at_end() const override { return at_ > last_; }
+  Xapian::docid get_docid() const override { return at_; }
+  PlaceSource* clone() const override { return new PlaceSource(rule_, shares_, cancelled_); }
+  void init(const Xapian::Database& database) override;
+
+ private:
+  bool AcceptsHere();
+  void Rest();
+
+  std::shared_ptr<const PlaceRule> rule_;
+  std::shared_ptr<const ShareNumbers> shares_;
+  std::function<bool()> cancelled_;
+  Xapian::Database database_;
+  Xapian::ValueIterator value_;
+  Xapian::docid at_ = 0;
+  Xapian::docid last_ = 0;
+  Xapian::doccount documents_ = 0;
+  std::size_t share_ = 0;
+  bool judges_ = true;
+  unsigned calls_ = 0;
+};
+
+/// Adds to the weight of single documents.
+class BoostSource : public Xapian::PostingSource {
+ public:
+  using Boosts = std::map<std::pair<std::size_t, DocumentId>, double>;
+  BoostSource(std::shared_ptr<const Boosts> boosts, std::shared_ptr<const ShareNumbers> shares)
+      : boosts_(std::move(boosts)), shares_(std::move(shares)) {}
+
+  Xapian::doccount get_termfreq_min() const override { return 0; }
+  Xapian::doccount get_termfreq_est() const override { return here_.size(); }
+  Xapian::doccount get_termfreq_max() const override { return here_.size(); }
+  double get_weight() const override { return here_[at_].second; }
+  void next(double min_weight) override;
+  void skip_to(Xapian::docid document, double min_weight) override;
+  bool at_end() const override { return at_ >= here_.size(); }
+  Xapian::docid get_docid() const override { return here_[at_].first; }
+  BoostSource* clone() const override { return new BoostSource(boosts_, shares_); }
+  void init(const Xapian::Database& database) override;
+
+ private:
+  std::shared_ptr<const Boosts> boosts_;
+  std::shared_ptr<const ShareNumbers> shares_;
+  std::vector<std::pair<Xapian::docid, double>> here_;
+  std::size_t at_ = 0;
+  bool started_ = false;
+};
+
+}  // namespace maru::index

@@ -1,0 +1,52 @@
+#include "index/record.h"
+
+#include "index/codec.h"
+
+namespace maru::index {
+namespace {
+
+std::uint32_t Fixed32(std::string_view bytes, std::size_t at) {
+  std::uint32_t value = 0;
+  for (std::size_t i = at; i < at + 4; ++i)
+    value = value << 8 | static_cast<unsigned char>(bytes[i]);
+  return value;
+}
+
+}  // namespace
+
+std::string Place::Encode() const {
+  return BigEndian32(parent) + BigEndian32(condition) + static_cast<char>(kind);
+}
+
+Place Place::Decode(std::string_view bytes) {
+  if (bytes.size() != 9) return {};
+  return {Fixed32(bytes, 0), Fixed32(bytes, 4), static_cast<std::uint8_t>(bytes[8])};
+}
+
+std::string StoredRecord::Encode() const {
+  Encoder out;
+  out.String(record.name).Number(record.is_dir).Number(record.size).Signed(record.mtime);
+  out.Number(text.segment).Number(text.offset).Number(text.length);
+  out.String(record.title).Number(record.authors.size());
+  for (const std::string& author : record.authors) out.String(author);
+  return out.Take();
+}
+
+StoredRecord StoredRecord::Decode(std::string_view bytes) {
+  Decoder in(bytes);
+  StoredRecord stored;
+  stored.record.name = in.String();
+  stored.record.is_dir = in.Number() != 0;
+  stored.record.size = in.Number();
+  stored.record.mtime = in.Signed();
+  stored.text.segment = in.Number32();
+  stored.text.offset = in.Number();
+  stored.text.length = in.Number();
+  stored.record.title = in.String();
+  for (std::uint64_t left = in.Number(); left > 0; --left) {
+    stored.record.authors.emplace_back(in.String());
+  }
+  return stored;
+}
+
+}  // namespace maru::index

@@ -1,0 +1,44 @@
+#pragma once
+
+#include <cstdint>
+#include <string>
+#include <string_view>
+
+#include "index/document.h"
+
+namespace maru::index {
+
+/// Which rights record (see directories.h) a document has.
+using ConditionId = std::uint32_t;
+
+/// What matching looks at: value slot 0, nine bytes.
+struct Place {
+  DirectoryId parent = 0;
+  ConditionId condition = 0;
+  /// Row of the kinds' table in fields.h.
+  std::uint8_t kind = 0;
+
+  std::string Encode() const;
+  static Place Decode(std::string_view bytes);
+};
+
+/// Where a document's text lies among the stored texts; length 0: it has none.
+struct TextPlace {
+  std::uint32_t segment = 0;
+  std::uint64_t offset = 0;
+  std::uint64_t length = 0;
+};
+
+/// What a line of a result needs: value slot 1.
+struct StoredRecord {
+  Record record;
+  TextPlace text;
+
+  std::string Encode() const;
+  static StoredRecord Decode(std::string_view bytes);
+};
+
+inline constexpr unsigned kPlaceSlot = 0;
+inline constexpr unsigned kRecordSlot = 1;
+
+}  // namespace maru::index
