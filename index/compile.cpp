@@ -38,9 +38,8 @@ Xapian::Query AnyOf(const std::vector<Xapian::Query>& queries) {
 
 /// Words of Latin letters alone have English forms; everything else stands for itself.
 bool HasForms(const std::string& word) {
-  return word.size() >= kShortestStemmed && std::all_of(word.begin(), word.end(), [](char c) {
-    return c >= 'a' && c <= 'z';
-  });
+  return word.size() >= kShortestStemmed &&
+         std::all_of(word.begin(), word.end(), [](char c) { return c >= 'a' && c <= 'z'; });
 }
 
 const Xapian::Stem& Stemmer() {
@@ -71,8 +70,8 @@ std::vector<std::string> Compiler::WordsWithPrefix(const Xapian::Database& datab
   return result;
 }
 
-/// Words of the vocabulary with the stem of `word`, itself left out. Found by their common beginning, so
-/// the index needs no stems.
+/// Words of the vocabulary with the stem of `word`, itself left out. Found by their common
+/// beginning, so the index needs no stems.
 std::vector<std::string> Compiler::Forms(const std::string& word, std::string_view field_prefix) {
   std::vector<std::string> forms;
   if (!HasForms(word)) return forms;
@@ -84,7 +83,8 @@ std::vector<std::string> Compiler::Forms(const std::string& word, std::string_vi
   for (auto term = database_.allterms_begin(begin); term != database_.allterms_end(begin); ++term) {
     if (++candidates > kMaxFormCandidates || forms.size() >= kMaxForms) break;
     std::string form = (*term).substr(field_prefix.size());
-    if (form.size() <= word.size() + 5 && form != word && HasForms(form) && Stemmer()(form) == stem) {
+    if (form.size() <= word.size() + 5 && form != word && HasForms(form) &&
+        Stemmer()(form) == stem) {
       forms.push_back(std::move(form));
     }
   }
@@ -134,8 +134,9 @@ Xapian::Query Compiler::CompileValue(const Query& query) {
   const Field& field = FieldOf(query.field, {FieldType::kKeyword, FieldType::kFlag});
   if (field.type == FieldType::kFlag) {
     const Xapian::Query flag(TermOf(field.prefix, "1"));
-    return query.text == "1" ? Scaled(flag, 0)
-                             : Xapian::Query(Xapian::Query::OP_AND_NOT, Xapian::Query::MatchAll, flag);
+    return query.text == "1"
+               ? Scaled(flag, 0)
+               : Xapian::Query(Xapian::Query::OP_AND_NOT, Xapian::Query::MatchAll, flag);
   }
   return Scaled(Xapian::Query(TermOf(field.prefix, query.text)), 0);
 }
@@ -144,7 +145,8 @@ Xapian::Query Compiler::CompileRange(const Query& query) {
   const Field& field = FieldOf(query.field, {FieldType::kNumber, FieldType::kTime});
   if (!(query.low <= query.high)) return Xapian::Query::MatchNothing;
   return Xapian::Query(Xapian::Query::OP_VALUE_RANGE, static_cast<Xapian::valueno>(field.slot),
-                       Xapian::sortable_serialise(query.low), Xapian::sortable_serialise(query.high));
+                       Xapian::sortable_serialise(query.low),
+                       Xapian::sortable_serialise(query.high));
 }
 
 Xapian::Query Compiler::CompileParts(const Query& query, unsigned depth) {
@@ -158,18 +160,21 @@ Xapian::Query Compiler::CompileParts(const Query& query, unsigned depth) {
       return AnyOf(parts);
     case Query::Kind::kAndNot:
       if (parts.size() == 1) return parts[0];
-      return Xapian::Query(
-          Xapian::Query::OP_AND_NOT, parts[0],
-          Xapian::Query(Xapian::Query::OP_OR, parts.begin() + 1, parts.end()));
+      return Xapian::Query(Xapian::Query::OP_AND_NOT, parts[0],
+                           Xapian::Query(Xapian::Query::OP_OR, parts.begin() + 1, parts.end()));
     default:
       return Xapian::Query(Xapian::Query::OP_FILTER, parts.begin(), parts.end());
   }
 }
 
-Xapian::Query Compiler::Compile(const Query& query, unsigned depth) {
+void Compiler::CountNode(unsigned depth) {
   if (depth > Query::kMaxDepth || ++nodes_ > Query::kMaxNodes) {
     throw BadQuery("The query is too large");
   }
+}
+
+Xapian::Query Compiler::Compile(const Query& query, unsigned depth) {
+  CountNode(depth);
   switch (query.kind) {
     case Query::Kind::kEverything:
       return Xapian::Query::MatchAll;
@@ -180,6 +185,7 @@ Xapian::Query Compiler::Compile(const Query& query, unsigned depth) {
       if (query.words.empty()) throw BadQuery("A word is missing");
       return CompileWord(query);
     case Query::Kind::kPhrase:
+      if (query.words.empty()) throw BadQuery("A word is missing");
       return CompilePhrase(query);
     case Query::Kind::kValue:
       return CompileValue(query);
@@ -197,7 +203,8 @@ Xapian::Query Compiler::Compile(const Query& query) {
   return Compile(query, 0);
 }
 
-void Compiler::Mark(const Query& query, std::vector<MarkGroup>& groups) {
+void Compiler::Mark(const Query& query, unsigned depth, std::vector<MarkGroup>& groups) {
+  CountNode(depth);
   switch (query.kind) {
     case Query::Kind::kWord:
     case Query::Kind::kPrefix:
@@ -209,17 +216,17 @@ void Compiler::Mark(const Query& query, std::vector<MarkGroup>& groups) {
       }
       return;
     case Query::Kind::kAndNot:
-      if (!query.parts.empty()) Mark(query.parts[0], groups);
+      if (!query.parts.empty()) Mark(query.parts[0], depth + 1, groups);
       return;
     default:
-      for (const Query& part : query.parts) Mark(part, groups);
+      for (const Query& part : query.parts) Mark(part, depth + 1, groups);
   }
 }
 
 std::vector<MarkGroup> Compiler::Marks(const Query& query) {
-  Compile(query);
+  nodes_ = 0;
   std::vector<MarkGroup> groups;
-  Mark(query, groups);
+  Mark(query, 0, groups);
   return groups;
 }
 

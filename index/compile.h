@@ -47,7 +47,8 @@ class Compiler {
   Xapian::Query CompileValue(const Query& query);
   Xapian::Query CompileRange(const Query& query);
   Xapian::Query CompileParts(const Query& query, unsigned depth);
-  void Mark(const Query& query, std::vector<MarkGroup>& groups);
+  void Mark(const Query& query, unsigned depth, std::vector<MarkGroup>& groups);
+  void CountNode(unsigned depth);
   std::vector<std::string> Expand(const Query& query, std::string_view field_prefix);
   std::vector<std::string> Forms(const std::string& word, std::string_view field_prefix);
 

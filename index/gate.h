@@ -10,11 +10,12 @@
 
 #include "index/directories.h"
 
-/// What the matcher asks about single documents: may these eyes see it, does it lie in that folder, was
-/// it opened before. Consulted in the order of document ids, one share at a time.
+/// What the matcher asks about single documents: may these eyes see it, does it lie in that folder,
+/// was it opened before. Consulted in the order of document ids, one share at a time.
 namespace maru::index {
 
-/// Judges documents by their place. Shared by the copies the matcher makes; immutable while matching.
+/// Judges documents by their place. Shared by the copies the matcher makes; immutable while
+/// matching.
 class PlaceRule {
  public:
   virtual ~PlaceRule() = default;
@@ -26,8 +27,8 @@ class PlaceRule {
 /// Share numbers by the engine's name of each database.
 using ShareNumbers = std::map<std::string, std::size_t>;
 
-/// A weightless source of all documents that a rule accepts; also where a search finds out that nobody
-/// waits for it any more (throws Cancelled).
+/// A weightless source of all documents that a rule accepts; also where a search finds out that
+/// nobody waits for it any more (throws Cancelled).
 class PlaceSource : public Xapian::PostingSource {
  public:
   PlaceSource(std::shared_ptr<const PlaceRule> rule, std::shared_ptr<const ShareNumbers> shares,

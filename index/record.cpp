@@ -1,7 +1,5 @@
 #include "index/record.h"
 
-#include "index/codec.h"
-
 namespace maru::index {
 namespace {
 
@@ -47,6 +45,28 @@ StoredRecord StoredRecord::Decode(std::string_view bytes) {
     stored.record.authors.emplace_back(in.String());
   }
   return stored;
+}
+
+std::string EntriesKey(DirectoryId directory) {
+  return "e" + BigEndian32(directory);
+}
+
+void EncodeEntry(Encoder& out, const Entry& entry) {
+  out.String(entry.name).Number(entry.document).Number(entry.directory);
+  out.Signed(entry.stamp.ctime_ns).Signed(entry.stamp.mtime_ns);
+  out.Number(entry.stamp.size).Number(entry.stamp.inode);
+}
+
+Entry DecodeEntry(Decoder& in) {
+  Entry entry;
+  entry.name = in.String();
+  entry.document = in.Number32();
+  entry.directory = in.Number32();
+  entry.stamp.ctime_ns = in.Signed();
+  entry.stamp.mtime_ns = in.Signed();
+  entry.stamp.size = in.Number();
+  entry.stamp.inode = in.Number();
+  return entry;
 }
 
 }  // namespace maru::index

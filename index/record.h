@@ -4,6 +4,7 @@
 #include <string>
 #include <string_view>
 
+#include "index/codec.h"
 #include "index/document.h"
 
 namespace maru::index {
@@ -37,6 +38,11 @@ struct StoredRecord {
   std::string Encode() const;
   static StoredRecord Decode(std::string_view bytes);
 };
+
+/// Entries of folders, one behind the other, in the metadata of EntriesKey.
+std::string EntriesKey(DirectoryId directory);
+void EncodeEntry(Encoder& out, const Entry& entry);
+Entry DecodeEntry(Decoder& in);
 
 inline constexpr unsigned kPlaceSlot = 0;
 inline constexpr unsigned kRecordSlot = 1;

@@ -19,28 +19,6 @@
 namespace maru::index {
 namespace {
 
-std::string EntriesKey(DirectoryId directory) {
-  return "e" + BigEndian32(directory);
-}
-
-void EncodeEntry(Encoder& out, const Entry& entry) {
-  out.String(entry.name).Number(entry.document).Number(entry.directory);
-  out.Signed(entry.stamp.ctime_ns).Signed(entry.stamp.mtime_ns);
-  out.Number(entry.stamp.size).Number(entry.stamp.inode);
-}
-
-Entry DecodeEntry(Decoder& in) {
-  Entry entry;
-  entry.name = in.String();
-  entry.document = in.Number32();
-  entry.directory = in.Number32();
-  entry.stamp.ctime_ns = in.Signed();
-  entry.stamp.mtime_ns = in.Signed();
-  entry.stamp.size = in.Number();
-  entry.stamp.inode = in.Number();
-  return entry;
-}
-
 Xapian::WritableDatabase OpenDatabase(const std::string& path) {
   // Left alone, the engine commits by itself after so many documents; here only Commit does.
   setenv("XAPIAN_FLUSH_THRESHOLD", "100000000", 1);

@@ -1,0 +1,329 @@
+#include <algorithm>
+#include <array>
+#include <cmath>
+
+#include "index/engine.h"
+#include "index/fields.h"
+#include "index/fragments.h"
+#include "index/reader_impl.h"
+#include "index/tokenizer.h"
+#include "platform/file_index.h"
+#include "platform/share_table.h"
+
+namespace maru::index {
+namespace {
+
+/// The weight that a boost of 1 adds: about that of a rare word.
+constexpr double kBoostWeight = 10;
+
+/// Sees what the eyes of each share see.
+class EyesRule : public PlaceRule {
+ public:
+  explicit EyesRule(std::vector<std::shared_ptr<const Eyes>> eyes) : eyes_(std::move(eyes)) {}
+  bool Judges(std::size_t share) const override { return share >= eyes_.size() || eyes_[share]; }
+  bool Accepts(std::size_t share, DocumentId, const Place& place) const override {
+    return share < eyes_.size() && eyes_[share]->Sees(place.parent, place.condition);
+  }
+
+ private:
+  std::vector<std::shared_ptr<const Eyes>> eyes_;
+};
+
+/// Accepts what lies under one folder of some shares, and the folder's own document.
+class FolderRule : public PlaceRule {
+ public:
+  struct Share {
+    std::vector<bool> folders;
+    DocumentId self = 0;
+    bool whole = false;
+  };
+  explicit FolderRule(std::vector<Share> shares) : shares_(std::move(shares)) {}
+  bool Judges(std::size_t share) const override {
+    return share >= shares_.size() || !shares_[share].whole;
+  }
+  bool Accepts(std::size_t share, DocumentId document, const Place& place) const override {
+    if (share >= shares_.size()) return false;
+    const Share& here = shares_[share];
+    return document == here.self ||
+           (place.parent < here.folders.size() && here.folders[place.parent]);
+  }
+
+ private:
+  std::vector<Share> shares_;
+};
+
+/// Finds the entry with a path within a share, by the lists of entries.
+std::optional<Entry> Resolve(const Xapian::Database& database, std::string_view path) {
+  const std::string root = database.get_metadata(kRootKey);
+  if (root.empty()) return std::nullopt;
+  Decoder root_in(root);
+  Entry at = DecodeEntry(root_in);
+  while (!path.empty()) {
+    if (path[0] == '/') {
+      path.remove_prefix(1);
+      continue;
+    }
+    const std::string_view name = path.substr(0, path.find('/'));
+    path.remove_prefix(name.size());
+    if (at.directory == 0) return std::nullopt;
+    const std::string entries = database.get_metadata(EntriesKey(at.directory));
+    bool found = false;
+    for (Decoder in(entries); !found && !in.AtEnd();) {
+      Entry entry = DecodeEntry(in);
+      found = entry.name == name;
+      if (found) at = std::move(entry);
+    }
+    if (!found) return std::nullopt;
+  }
+  return at;
+}
+
+/// Counts matches by kind.
+class KindSpy : public Xapian::MatchSpy {
+ public:
+  void operator()(const Xapian::Document& document, double) override {
+    const Place place = Place::Decode(document.get_value(kPlaceSlot));
+    if (place.kind < kKinds) ++counts[place.kind];
+  }
+  std::array<std::uint64_t, kKinds> counts{};
+};
+
+/// The kinds a filter keeps, when that is all it asks.
+std::optional<std::array<bool, kKinds>> KindsOf(const Query& filter) {
+  std::array<bool, kKinds> kinds{};
+  if (filter.kind == Query::Kind::kEverything) {
+    kinds.fill(true);
+    return kinds;
+  }
+  if (filter.kind == Query::Kind::kValue && filter.field == kKind && IsKind(filter.text)) {
+    kinds[KindNumber(filter.text)] = true;
+    return kinds;
+  }
+  if (filter.kind != Query::Kind::kOr) return std::nullopt;
+  for (const Query& part : filter.parts) {
+    const auto some = KindsOf(part);
+    if (!some) return std::nullopt;
+    for (std::size_t i = 0; i < kKinds; ++i) kinds[i] = kinds[i] || (*some)[i];
+  }
+  return kinds;
+}
+
+}  // namespace
+
+EngineReader::~EngineReader() {
+  if (indices_) give_back_(std::move(indices_));
+}
+
+void EngineReader::SetEyes(const Identity& who) {
+  who_ = who;
+  blind_ = false;
+  eyes_.clear();
+  for (std::size_t share = 0; share < indices_->Count(); ++share) {
+    eyes_.push_back(who.unrestricted ? nullptr : indices_->EyesOf(share, who));
+  }
+}
+
+bool EngineReader::Sees(std::size_t share, const Xapian::Document& document) const {
+  if (blind_) return false;
+  if (!eyes_[share]) return true;
+  const Place place = Place::Decode(document.get_value(kPlaceSlot));
+  return eyes_[share]->Sees(place.parent, place.condition);
+}
+
+Xapian::Query EngineReader::Gated(const Xapian::Query& query,
+                                  const std::function<bool()>& cancelled) {
+  if (blind_) return Xapian::Query::MatchNothing;
+  auto* gate = new PlaceSource(std::make_shared<EyesRule>(eyes_), indices_->Numbers(), cancelled);
+  return Xapian::Query(Xapian::Query::OP_FILTER, query, Xapian::Query(gate->release()));
+}
+
+Xapian::Query EngineReader::Under(const std::string& full_path) {
+  static const std::string prefix = maruseeker::fileindex::elastic::GetFileIndexID("");
+  std::string_view wanted = full_path;
+  while (wanted.ends_with('/')) wanted.remove_suffix(1);
+  std::vector<FolderRule::Share> shares(indices_->Count());
+  for (std::size_t i = 0; i < shares.size(); ++i) {
+    const std::string& folder = indices_->Index(i).Folder();
+    std::string_view id = std::string_view(folder).substr(folder.rfind('/') + 1);
+    if (id.starts_with(prefix)) id.remove_prefix(prefix.size());
+    const std::string share = std::string(kVolume) + "/" + std::string(id);
+    shares[i].whole = share == wanted || share.starts_with(std::string(wanted) + "/");
+    if (shares[i].whole || !wanted.starts_with(share + "/")) continue;
+    const auto entry = Resolve(indices_->Database(i), wanted.substr(share.size()));
+    if (!entry) continue;
+    shares[i].self = entry->document;
+    if (entry->directory) shares[i].folders = FoldersUnder(indices_->Table(i), entry->directory);
+  }
+  auto* source = new PlaceSource(std::make_shared<FolderRule>(std::move(shares)),
+                                 indices_->Numbers(), nullptr);
+  return Xapian::Query(Xapian::Query::OP_FILTER, Xapian::Query::MatchAll,
+                       Xapian::Query(source->release()));
+}
+
+Compiler EngineReader::MakeCompiler() {
+  return Compiler(indices_->All(), [this](const std::string& path) { return Under(path); });
+}
+
+Xapian::Enquire EngineReader::Enquire(const Query& query, const SearchOptions& options) {
+  Xapian::Query compiled = MakeCompiler().Compile(query);
+  if (!options.boosts.empty()) {
+    auto boosts = std::make_shared<BoostSource::Boosts>(options.boosts);
+    for (auto& [place, boost] : *boosts) boost *= kBoostWeight;
+    auto* source = new BoostSource(std::move(boosts), indices_->Numbers());
+    compiled =
+        Xapian::Query(Xapian::Query::OP_AND_MAYBE, compiled, Xapian::Query(source->release()));
+  }
+  Xapian::Enquire enquire(indices_->All());
+  enquire.set_query(Gated(compiled, options.cancelled));
+  if (options.sort_field.empty()) return enquire;
+  const Field* field = FindField(options.sort_field);
+  if (!field || field->slot < 0) {
+    throw maruseeker::Error(maruseeker::kErrorBadParameter, "Cannot sort by " + options.sort_field);
+  }
+  enquire.set_sort_by_value_then_relevance(static_cast<Xapian::valueno>(field->slot),
+                                           !options.ascending);
+  return enquire;
+}
+
+Hit EngineReader::HitOf(std::size_t share, DocumentId id, const Xapian::Document& document) const {
+  const DirectoryTable& table = indices_->Table(share);
+  const Place place = Place::Decode(document.get_value(kPlaceSlot));
+  Hit hit;
+  hit.share = share;
+  hit.document = id;
+  hit.record = StoredRecord::Decode(document.get_value(kRecordSlot)).record;
+  hit.owner = table.Condition(place.condition).uid;
+  if (place.parent != 0) hit.path = table.PathOf(place.parent) + "/" + hit.record.name;
+  return hit;
+}
+
+SearchResult EngineReader::Search(const Query& query, const SearchOptions& options) {
+  return OnOneState("Cannot search", [&] {
+    SearchResult result;
+    if (indices_->Count() == 0) return result;
+    const Xapian::doccount everything = indices_->All().get_doccount();
+    const Xapian::MSet matches =
+        Enquire(query, options).get_mset(options.from, options.size, everything);
+    result.total = matches.get_matches_estimated();
+    result.hits.reserve(matches.size());
+    for (auto match = matches.begin(); match != matches.end(); ++match) {
+      Hit hit =
+          HitOf(indices_->ShareOf(*match), indices_->DocumentOf(*match), match.get_document());
+      hit.score = match.get_weight();
+      result.hits.push_back(std::move(hit));
+    }
+    return result;
+  });
+}
+
+std::vector<std::uint64_t> EngineReader::Count(const Query& query,
+                                               const std::vector<Query>& filters,
+                                               const std::function<bool()>& cancelled) {
+  SearchOptions options;
+  options.cancelled = cancelled;
+  std::vector<std::optional<std::array<bool, kKinds>>> kinds;
+  for (const Query& filter : filters) kinds.push_back(KindsOf(filter));
+  const auto counts = OnOneState("Cannot count", [&] {
+    KindSpy spy;
+    if (indices_->Count() == 0) return spy.counts;
+    Xapian::Enquire enquire = Enquire(query, options);
+    enquire.set_weighting_scheme(Xapian::BoolWeight());
+    enquire.add_matchspy(&spy);
+    enquire.get_mset(0, 0, indices_->All().get_doccount());
+    return spy.counts;
+  });
+  std::vector<std::uint64_t> result;
+  for (std::size_t i = 0; i < filters.size(); ++i) {
+    std::uint64_t count = 0;
+    for (std::size_t kind = 0; kinds[i] && kind < kKinds; ++kind) {
+      if ((*kinds[i])[kind]) count += counts[kind];
+    }
+    if (!kinds[i]) {
+      Query narrowed;
+      narrowed.kind = Query::Kind::kFilter;
+      narrowed.parts = {query, filters[i]};
+      count = Search(narrowed, options).total;
+    }
+    result.push_back(count);
+  }
+  return result;
+}
+
+const std::vector<MarkGroup>& EngineReader::MarksOf(const Query& query) {
+  if (!marked_ || !(marked_query_ == query)) {
+    marks_ = MakeCompiler().Marks(query);
+    marked_query_ = query;
+    marked_ = true;
+  }
+  return marks_;
+}
+
+std::vector<Fragment> EngineReader::TextFragments(std::size_t share, DocumentId document,
+                                                  const std::vector<MarkGroup>& groups,
+                                                  const FragmentOptions& options) {
+  const Xapian::Database& database = indices_->Database(share);
+  const std::vector<Span> spans =
+      SpansFromIndex(database, document, FindField(kText)->prefix, groups);
+  std::vector<Fragment> fragments;
+  if (spans.empty()) return fragments;
+  const TextPlace text =
+      StoredRecord::Decode(database.get_document(document).get_value(kRecordSlot)).text;
+  for (const Window& window : BestWindows(spans, options)) {
+    const TextPiece piece = indices_->Index(share).texts.Read(text, window.first, window.last);
+    std::string html = RenderWindow(piece, window, spans);
+    if (!html.empty()) fragments.push_back({std::move(html), window.matches});
+  }
+  return fragments;
+}
+
+std::vector<Fragment> EngineReader::Fragments(std::size_t share, DocumentId document,
+                                              const Query& query, const FragmentOptions& options) {
+  const Field* field = FindField(options.field);
+  if (!field || field->type != FieldType::kText) {
+    throw maruseeker::Error(maruseeker::kErrorBadParameter, "No fragments of " + options.field);
+  }
+  return OnOneState("Cannot read a text", [&]() -> std::vector<Fragment> {
+    if (!Find(share, document)) return {};
+    std::vector<MarkGroup> groups = MarksOf(query);
+    std::erase_if(groups, [&](const MarkGroup& group) { return group.field != options.field; });
+    if (options.field == kText) return TextFragments(share, document, groups, options);
+    const Record record = Find(share, document)->record;
+    std::string text = options.field == kName ? record.name : record.title;
+    if (options.field == kAuthors) {
+      for (const std::string& author : record.authors) text += (text.empty() ? "" : "; ") + author;
+    }
+    const std::vector<Span> spans = SpansInText(text, groups);
+    if (spans.empty()) return {};
+    const Window whole{1, UINT32_MAX, static_cast<unsigned>(spans.size())};
+    return {{RenderWindow({text, 1, false, false}, whole, spans), whole.matches}};
+  });
+}
+
+std::optional<Hit> EngineReader::Find(std::size_t share, DocumentId document) {
+  return OnOneState("Cannot read a document", [&]() -> std::optional<Hit> {
+    if (share >= indices_->Count() || document == 0) return std::nullopt;
+    try {
+      const Xapian::Document found = indices_->Database(share).get_document(document);
+      if (!Sees(share, found)) return std::nullopt;
+      return HitOf(share, document, found);
+    } catch (const Xapian::DocNotFoundError&) {
+      return std::nullopt;
+    }
+  });
+}
+
+std::optional<Hit> EngineReader::Find(std::size_t share, std::string_view path) {
+  const auto entry = OnOneState("Cannot find a path", [&]() -> std::optional<Entry> {
+    if (share >= indices_->Count()) return std::nullopt;
+    return Resolve(indices_->Database(share), path);
+  });
+  return entry ? Find(share, entry->document) : std::nullopt;
+}
+
+std::uint64_t EngineReader::Documents() const {
+  return WithEngine("Cannot read the index", [&] {
+    return indices_->Count() == 0 ? std::uint64_t{0} : indices_->All().get_doccount();
+  });
+}
+
+}  // namespace maru::index

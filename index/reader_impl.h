@@ -1,0 +1,88 @@
+#pragma once
+
+#include <functional>
+#include <memory>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "index/codec.h"
+#include "index/compile.h"
+#include "index/engine.h"
+#include "index/library.h"
+#include "index/reader.h"
+
+namespace maru::index {
+
+/// A Reader on handles borrowed from a Library.
+class EngineReader : public Reader {
+ public:
+  using GiveBack = std::function<void(std::unique_ptr<OpenIndices>)>;
+
+  EngineReader(std::unique_ptr<OpenIndices> indices, GiveBack give_back)
+      : indices_(std::move(indices)), give_back_(std::move(give_back)) {}
+  ~EngineReader() override;
+
+  void SetEyes(const Identity& who) override;
+  SearchResult Search(const Query& query, const SearchOptions& options) override;
+  std::vector<std::uint64_t> Count(const Query& query, const std::vector<Query>& filters,
+                                   const std::function<bool()>& cancelled) override;
+  std::vector<Fragment> Fragments(std::size_t share, DocumentId document, const Query& query,
+                                  const FragmentOptions& options) override;
+  std::optional<Hit> Find(std::size_t share, DocumentId document) override;
+  std::optional<Hit> Find(std::size_t share, std::string_view path) override;
+  std::vector<std::string> Complete(const std::string& field, const std::string& prefix,
+                                    std::size_t limit) override;
+  std::vector<std::string> Correct(const std::string& word, std::size_t limit) override;
+  std::uint64_t Documents() const override;
+
+ private:
+  /// How often a search begins again because the writer overtook it.
+  static constexpr int kTries = 5;
+
+  /// Runs `work` on one state of the indices; begins again on a newer one when the writer overtook
+  /// it.
+  template <class Work>
+  auto OnOneState(const char* doing, Work&& work) -> decltype(work());
+
+  /// The query as these eyes may ask it.
+  Xapian::Query Gated(const Xapian::Query& query, const std::function<bool()>& cancelled);
+  Compiler MakeCompiler();
+  Xapian::Query Under(const std::string& full_path);
+  Xapian::Enquire Enquire(const Query& query, const SearchOptions& options);
+  bool Sees(std::size_t share, const Xapian::Document& document) const;
+  bool SomeDocumentSeen(const std::string& term) const;
+  Hit HitOf(std::size_t share, DocumentId id, const Xapian::Document& document) const;
+  const std::vector<MarkGroup>& MarksOf(const Query& query);
+  std::vector<Fragment> TextFragments(std::size_t share, DocumentId document,
+                                      const std::vector<MarkGroup>& groups,
+                                      const FragmentOptions& options);
+
+  std::unique_ptr<OpenIndices> indices_;
+  GiveBack give_back_;
+  Identity who_;
+  /// One per share; empty until SetEyes. A null: sees everything.
+  std::vector<std::shared_ptr<const Eyes>> eyes_;
+  bool blind_ = true;
+  Query marked_query_;
+  std::vector<MarkGroup> marks_;
+  bool marked_ = false;
+};
+
+template <class Work>
+auto EngineReader::OnOneState(const char* doing, Work&& work) -> decltype(work()) {
+  return WithEngine(doing, [&] {
+    for (int left = kTries; left > 1; --left) {
+      try {
+        return work();
+      } catch (const Xapian::DatabaseModifiedError&) {
+        indices_->Refresh();
+        if (!blind_) SetEyes(who_);
+        marked_ = false;
+      }
+    }
+    return work();
+  });
+}
+
+}  // namespace maru::index
