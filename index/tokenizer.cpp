@@ -27,7 +27,8 @@ bool Between(char32_t c, char32_t first, char32_t last) {
 bool IsSpaceless(char32_t c) {
   return Between(c, 0x3040, 0x30ff) || Between(c, 0x31f0, 0x31ff) || Between(c, 0x3400, 0x4dbf) ||
          Between(c, 0x4e00, 0x9fff) || Between(c, 0xf900, 0xfaff) || Between(c, 0x20000, 0x3ffff) ||
-         Between(c, 0x0e00, 0x0eff) || Between(c, 0x1000, 0x109f) || Between(c, 0x1780, 0x17ff);
+         Between(c, 0x0e00, 0x0eff) || Between(c, 0x1000, 0x109f) || Between(c, 0x1780, 0x17ff) ||
+         Between(c, 0xff66, 0xff9f);
 }
 
 /// Accents and vowel points that readers leave out when they type; the vowel signs of Indic and

@@ -17,8 +17,6 @@ namespace maru::index::test {
 class IndexTest : public testing::Test {
  protected:
   IndexTest() {
-    char name[] = "/tmp/maru-index-XXXXXX";
-    root_ = mkdtemp(name);
     writer_ = std::make_unique<Writer>(Path());
     const FileRights open = Rights(0, 0755);
     Document top;
@@ -86,7 +84,12 @@ class IndexTest : public testing::Test {
     return options;
   }
 
-  std::string root_;
+  static std::string MakeFolder() {
+    char name[] = "/tmp/maru-index-XXXXXX";
+    return mkdtemp(name);
+  }
+
+  const std::string root_ = MakeFolder();
   std::unique_ptr<Writer> writer_;
   Library library_{root_};
 };

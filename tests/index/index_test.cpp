@@ -4,6 +4,7 @@
 #include <unistd.h>
 
 #include <fstream>
+#include <random>
 #include <thread>
 
 #include "common/error.h"
