@@ -1,0 +1,43 @@
+#pragma once
+
+#include <pthread.h>
+
+namespace maruseeker {
+
+/// A POSIX mutex with default attributes; not recursive. Each operation is true when the system's
+/// call returned 0.
+class Mutex {
+ public:
+  Mutex();
+  ~Mutex();
+  Mutex(const Mutex&) = delete;
+  Mutex& operator=(const Mutex&) = delete;
+
+  bool Lock();
+  bool TryLock();
+  bool Unlock();
+
+ private:
+  pthread_mutex_t mutex_;
+};
+
+/// Holds a mutex for a scope. Failing to unlock ends the process.
+class LockMutex {
+ public:
+  explicit LockMutex(Mutex& mutex);
+  ~LockMutex();
+  LockMutex(const LockMutex&) = delete;
+  LockMutex& operator=(const LockMutex&) = delete;
+
+ private:
+  Mutex& mutex_;
+};
+
+namespace sdk {
+
+/// The only lock of the process: held around every account lookup, credential switch and platform
+/// call on a shared folder. Made on first use.
+Mutex& SDKMutex();
+
+}  // namespace sdk
+}  // namespace maruseeker
