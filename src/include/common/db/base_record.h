@@ -1,0 +1,22 @@
+#pragma once
+
+#include "platform/marudbquery.h"
+
+namespace maruseeker::db {
+
+/// A row of a table whose rows belong to somebody and say something at some time.
+class BaseRecord : public marudbquery::Updatable, public marudbquery::Insertable {
+ public:
+  ~BaseRecord() override = default;
+
+  /// The row that this record was read from.
+  virtual marudbquery::Condition SameRow() const = 0;
+  /// Rows of the same owner.
+  virtual marudbquery::Condition SameOwner() const = 0;
+  /// Takes every field from a fetched row. Throws what SOCI throws when a column is missing.
+  virtual void FromValues(const soci::values& values) = 0;
+  /// Rows of the same owner that say the same.
+  virtual marudbquery::Condition SameContent() const = 0;
+};
+
+}  // namespace maruseeker::db
