@@ -1,7 +1,8 @@
 #pragma once
 
+#include <span>
 #include <string>
-#include <vector>
+#include <variant>
 
 namespace maru {
 
@@ -43,5 +44,24 @@ struct Config {
 
   static constexpr const char* kDefaultPath = "/etc/maruseeker/maruseeker.conf";
 };
+
+/// One row of the table of settings.
+struct Setting {
+  enum Form { kWord, kPath, kOptionalPath, kText, kNumber, kFlag };
+
+  const char* name;
+  std::variant<std::string Config::*, int Config::*, bool Config::*> member;
+  Form form;
+  /// Bounds of a number.
+  int minimum, maximum;
+  /// One sentence for a person.
+  const char* help;
+
+  /// The value as it is written in the file: text, a number, or yes or no.
+  std::string ValueIn(const Config& config) const;
+};
+
+/// All settings, in the order in which they are shown.
+std::span<const Setting> Settings();
 
 }  // namespace maru

@@ -7,12 +7,15 @@
 /// Text and file operations on JSON values that stock JsonCpp lacks.
 ///
 /// Reading is strict: one JSON text and nothing behind it but white space; no comments, no
-/// duplicate keys, no NaN or infinities; at most `kMaxDepth` levels; at most `kMaxSize` bytes; no
-/// number that neither 64-bit integers nor a finite double can hold. Nothing here throws on bad
-/// input, and a value is replaced only when the whole text was good.
+/// duplicate keys, no NaN or infinities, no raw control characters, no half surrogate pairs; at
+/// most `kMaxDepth` levels, `kMaxValues` values and `kMaxSize` bytes; no number that neither 64-bit
+/// integers nor a finite double can hold (an integer beyond 64 bits becomes a double). Nothing here
+/// throws on bad input, and a value is replaced only when the whole text was good.
 namespace maru::json {
 
 constexpr unsigned kMaxDepth = 64;
+/// A value in memory takes a hundred bytes, on the wire perhaps two.
+constexpr std::size_t kMaxValues = 1u << 20;
 constexpr std::size_t kMaxSize = 64u << 20;
 
 /// Parses `text` into `value`. On false `value` is unchanged and, when asked for, `error` says why.

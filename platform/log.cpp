@@ -12,6 +12,10 @@
 namespace maru {
 namespace {
 
+// What OpenLog was told, for after a fork.
+const char* log_program = nullptr;
+int log_options = LOG_PID;
+
 __attribute__((format(printf, 1, 0))) std::string Format(const char* format, va_list arguments) {
   va_list again;
   va_copy(again, arguments);
@@ -55,7 +59,14 @@ void LogLine(const char* file, int line, const char* function, const char* forma
 }
 
 void OpenLog(const char* program, bool foreground) {
-  openlog(program, LOG_PID | (foreground ? LOG_PERROR : 0), LOG_DAEMON);
+  log_program = program;
+  log_options = LOG_PID | (foreground ? LOG_PERROR : 0);
+  ReopenLog();
+}
+
+void ReopenLog() {
+  closelog();
+  openlog(log_program, log_options, LOG_DAEMON);
 }
 
 }  // namespace maru

@@ -18,6 +18,9 @@ void LogLine(const char* file, int line, const char* function, const char* forma
 /// standard error.
 void OpenLog(const char* program, bool foreground);
 
+/// Lets go of the log's descriptor; the next line opens the log anew, as OpenLog said.
+void ReopenLog();
+
 }  // namespace maru
 
 #define MARU_LOG(...) ::maru::LogLine(__FILE_NAME__, __LINE__, __func__, __VA_ARGS__)

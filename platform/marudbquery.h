@@ -11,7 +11,7 @@
 
 /// The database query layer: statements from conditions, over SOCI. Values are always bound, never
 /// part of the statement's text; table and column names are checked against the table's own
-/// columns, and an unknown one makes Execute fail. Nothing here throws but Session's constructor;
+/// columns, and an unknown one makes Execute fail. Nothing here throws but Session's own functions;
 /// statements report through their results and `GetLastError`.
 namespace marudbquery {
 
@@ -70,18 +70,22 @@ class Condition {
 class Session {
  public:
   /// `connection` as SOCI takes it ("sqlite3://...", "postgresql://..."). `schema` is run when the
-  /// database is opened, and must be harmless to repeat.
+  /// database is opened: statements parted by ";" that are harmless to repeat. Throws
+  /// std::invalid_argument for another kind of database.
   Session(std::string connection, std::string schema);
   ~Session();
   Session(const Session&) = delete;
   Session& operator=(const Session&) = delete;
 
   /// Runs `work` in one write transaction (SQLite: BEGIN IMMEDIATE): committed when it returns
-  /// true, rolled back otherwise. False with `error` set on any failure.
+  /// true, rolled back otherwise. False when it was not, with `error` empty
+  /// when `work` itself said so; does not throw.
   bool Transaction(const std::function<bool()>& work, std::string& error);
 
-  /// For the statements of this layer.
+  /// For the statements of this layer. Those that open the database throw when it cannot be.
   soci::session& Open();
+  bool IsSQLite() const;
+  bool HasTable(const std::string& table);
   bool HasColumn(const std::string& table, const std::string& column);
 
  private:

@@ -20,12 +20,13 @@ class Preference {
   template <class T>
   T Get(const std::string& key) const;
 
-  /// Stores a value (atomically). False with errno when the file cannot be written; throws as Get
-  /// does, and when the value is out of bounds.
+  /// Stores a value (atomically); for root and the service. False with errno when the file cannot
+  /// be written; throws as Get does, and when the value is out of bounds.
   template <class T>
   bool Set(const std::string& key, T value);
 
  private:
+  uid_t uid_;
   std::string path_;
 };
 

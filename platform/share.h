@@ -24,8 +24,8 @@ enum MARUSHAREPRIV { kSharePrivReadWrite = 1, kSharePrivReadOnly = 2, kSharePriv
 int MARUShareGet(const char* name, MARUSHARE** share);
 void MARUShareFree(MARUSHARE* share);
 
-/// MARUSHAREPRIV of the user on the share, from `available`, `valid users`, `invalid users`, `admin
-/// users`, `read list`, `write list` and `read only`, with @, + and & groups and %S. Members of the
+/// MARUSHAREPRIV of the user on the share, from `available`, `invalid users`, `valid users`, `read
+/// list`, `write list` and `read only`, with @, + and & groups and %S. Members of the
 /// administrators' group have kSharePrivReadWrite everywhere. An unknown user has none.
 int MARUShareUserPrivGet(const char* user_name, const MARUSHARE* share);
 

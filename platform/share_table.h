@@ -21,7 +21,7 @@ struct ShareSettings {
   bool index = true;
   /// Parametric option `maruseeker:deny = list read`: 1 forbids listing, 4 forbids reading.
   unsigned int deny = 0;
-  std::vector<std::string> valid_users, invalid_users, admin_users, read_list, write_list;
+  std::vector<std::string> valid_users, invalid_users, read_list, write_list;
 
   /// "/volume1/NAME".
   std::string VolumePath() const;
@@ -31,13 +31,16 @@ struct ShareSettings {
 class ShareTable {
  public:
   /// The newest good table. Looks at the settings file's identity and time and reads it again when
-  /// it changed; when the new one has an error, the last good table stays (also across restarts,
-  /// from a copy in the state folder) and `Error` says why. Never null. Thread-safe.
+  /// it changed, and once a minute for the sake of files that it includes; when the new one has an
+  /// error, the last good table stays (also across restarts, from a copy in the state folder) and
+  /// `Error` says why. The same settings give the same object. Never null; throws only what
+  /// Config::Get throws. Thread-safe.
   static std::shared_ptr<const ShareTable> Current();
   /// The table as it was last read, without looking at the file: for request children.
   static void Freeze();
 
-  /// Parses the canonical form. Throws std::runtime_error naming the line.
+  /// Parses the canonical form. Shares that are no folders of one place (printers, paths with
+  /// variables) are left out. Throws std::runtime_error naming the line.
   static ShareTable Parse(const std::string& text);
 
   const std::vector<ShareSettings>& Shares() const { return shares_; }
@@ -53,7 +56,8 @@ class ShareTable {
 };
 
 /// MARUSHAREPRIV of the user on the share by the share's lists (platform/share.h says the rules).
-/// Administrators are not treated specially here.
+/// Administrators are not treated specially here, nor are Samba's `admin users`, whose file
+/// operations are root's but who enter no share and write to none without the lists.
 int PrivilegeOf(const ShareSettings& share, const std::string& user_name, const Identity& identity);
 
 /// The volume under which all shares appear to users: "/volume1".

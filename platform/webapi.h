@@ -97,12 +97,13 @@ class APIResponse {
 
   /// False until one of the setters was called.
   bool IsSet() const { return set_; }
-  bool IsSuccess() const { return set_ && error_code_ == 0; }
+  bool IsSuccess() const { return success_; }
   int ErrorCode() const { return error_code_; }
   const Json::Value& Data() const { return data_; }
 
  private:
   bool set_ = false;
+  bool success_ = false;
   int error_code_ = 0;
   Json::Value data_;
 };

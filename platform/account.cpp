@@ -1,0 +1,116 @@
+#include "platform/account.h"
+
+#include <errno.h>
+#include <stdio.h>
+#include <stdlib.h>
+#include <string.h>
+
+#include <algorithm>
+
+#include "platform/config.h"
+#include "platform/guard.h"
+#include "platform/name_service.h"
+#include "platform/share_table.h"
+
+using maru::Account;
+using maru::Fail;
+using maru::Guarded;
+
+namespace {
+
+// The share that holds the home folders.
+constexpr const char* kHomes = "homes";
+
+int LookupError() {
+  return errno == 0 ? kErrNotFound : kErrSystem;
+}
+
+/// The record and its name in one piece of memory.
+int ToRecord(const std::optional<Account>& account, MARUUSER** user) {
+  if (!account) return Fail(LookupError(), -1);
+  const std::size_t size = account->name.size() + 1;
+  void* memory = malloc(sizeof(MARUUSER) + size);
+  if (!memory) return Fail(kErrSystem, -1);
+  char* name = static_cast<char*>(memory) + sizeof(MARUUSER);
+  memcpy(name, account->name.c_str(), size);
+  *user = new (memory) MARUUSER{name, account->uid, account->gid, 0};
+  return 0;
+}
+
+}  // namespace
+
+int MARUUserGet(const char* name, MARUUSER** user) {
+  if (!name || !user) return Fail(kErrBadParameter, -1);
+  *user = nullptr;
+  return Guarded("MARUUserGet", -1, [&] { return ToRecord(maru::AccountByName(name), user); });
+}
+
+int MARUUserGetByUID(uid_t uid, MARUUSER** user) {
+  if (!user) return Fail(kErrBadParameter, -1);
+  *user = nullptr;
+  return Guarded("MARUUserGetByUID", -1, [&] { return ToRecord(maru::AccountByUID(uid), user); });
+}
+
+void MARUUserFree(MARUUSER* user) {
+  free(user);
+}
+
+bool MARUServiceUserHomeIsEnabled(int, const char*) {
+  return Guarded("MARUServiceUserHomeIsEnabled", false, [] {
+    const auto table = maru::ShareTable::Current();
+    const maru::ShareSettings* homes = table->Find(kHomes);
+    return homes && homes->available;
+  });
+}
+
+int MARUServiceHomePathGet(const char* user_name, char* path, std::size_t size) {
+  if (!user_name || !path) return Fail(kErrBadParameter, -1);
+  return Guarded("MARUServiceHomePathGet", -1, [&] {
+    const std::optional<Account> account = maru::AccountByName(user_name);
+    if (!account) return Fail(LookupError(), -1);
+    const auto table = maru::ShareTable::Current();
+    const maru::ShareSettings* homes = table->Find(kHomes);
+    if (!homes || !homes->available) return Fail(kErrNotFound, -1);
+    // The account may name its folder differently from itself.
+    const std::string base = homes->path + "/";
+    const std::string folder = account->home.starts_with(base) && account->home.size() > base.size()
+                                   ? account->home.substr(base.size())
+                                   : account->name;
+    const std::string home = homes->VolumePath() + "/" + folder;
+    if (home.size() >= size) return Fail(kErrBadParameter, -1);
+    memcpy(path, home.c_str(), home.size() + 1);
+    return static_cast<int>(home.size());
+  });
+}
+
+int MLIBGroupIsAdminGroupMem(const char* user_name, int) {
+  if (!user_name) return Fail(kErrBadParameter, -1);
+  return Guarded("MLIBGroupIsAdminGroupMem", -1, [&] {
+    const std::optional<Account> account = maru::AccountByName(user_name);
+    if (!account) return Fail(LookupError(), -1);
+    const std::optional<gid_t> admins = maru::GroupByName(maru::Config::Get().admin_group);
+    if (!admins) return errno == 0 ? 0 : Fail(kErrSystem, -1);
+    const auto groups = maru::GroupsOf(*account);
+    if (!groups) return Fail(kErrSystem, -1);
+    return std::find(groups->begin(), groups->end(), *admins) != groups->end() ? 1 : 0;
+  });
+}
+
+MLIBCSzList* MLIBGroupInfoListGet(const char* user_name, bool with_primary) {
+  constexpr MLIBCSzList* kNone = nullptr;
+  if (!user_name) return Fail(kErrBadParameter, kNone);
+  return Guarded("MLIBGroupInfoListGet", kNone, [&] {
+    const std::optional<Account> account = maru::AccountByName(user_name);
+    if (!account) return Fail(LookupError(), kNone);
+    const auto groups = maru::GroupsOf(*account);
+    MLIBCSzList* list = groups ? MLIBCSzListAlloc(static_cast<int>(groups->size())) : nullptr;
+    if (!list) return Fail(kErrSystem, kNone);
+    for (std::size_t i = with_primary ? 0 : 1; i < groups->size(); ++i) {
+      if (MLIBCSzListPush(&list, std::to_string((*groups)[i]).c_str()) < 0) {
+        MLIBCSzListFree(list);
+        return Fail(kErrSystem, kNone);
+      }
+    }
+    return list;
+  });
+}

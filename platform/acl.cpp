@@ -1,0 +1,94 @@
+#include "platform/acl.h"
+
+#include <errno.h>
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <charconv>
+#include <cstring>
+#include <string_view>
+
+#include "platform/account.h"
+#include "platform/config.h"
+#include "platform/guard.h"
+#include "platform/name_service.h"
+#include "platform/share_table.h"
+#include "platform/unique_fd.h"
+#include "platform/volume_path.h"
+
+namespace {
+
+bool ToIdentity(const char* user_name, const MLIBCSzList* groups, maru::Identity& identity) {
+  const std::optional<maru::Account> account = maru::AccountByName(user_name);
+  if (!account) return false;
+  identity.uid = account->uid;
+  for (int i = 0; i < MLIBCSzListCount(groups); ++i) {
+    const char* text = MLIBCSzListGet(groups, i);
+    gid_t gid = 0;
+    const char* end = text + strlen(text);
+    if (std::from_chars(text, end, gid).ptr != end) return false;
+    identity.groups.push_back(gid);
+  }
+  std::sort(identity.groups.begin(), identity.groups.end());
+  identity.unrestricted = account->uid == 0 ||
+                          account->name == maru::Config::Get().service_account ||
+                          MLIBGroupIsAdminGroupMem(user_name, 0) == 1;
+  return true;
+}
+
+bool IsLink(int descriptor) {
+  struct stat status;
+  return fstat(descriptor, &status) != 0 || S_ISLNK(status.st_mode);
+}
+
+/// The bits of `rest` under the share's folder; -1 with errno.
+int Walk(const maru::Identity& who, const std::string& folder, std::string_view rest) {
+  maru::UniqueFd at(open(folder.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+  maru::FileRights rights;
+  while (at) {
+    if (IsLink(at.Get())) return 0;
+    if (!maru::ReadFileRights(at.Get(), "", rights)) break;
+    const int bits = maru::RightsOf(who, rights);
+    const std::string name(maru::TakeComponent(rest));
+    if (name.empty()) return bits;
+    if (!(bits & kACLExecute)) return 0;
+    at = maru::UniqueFd(openat(at.Get(), name.c_str(), O_PATH | O_NOFOLLOW | O_CLOEXEC));
+  }
+  return errno == EACCES ? 0 : -1;
+}
+
+}  // namespace
+
+int MARUACLPermGet(const char* path, unsigned int* bits) {
+  if (!path || !bits || faccessat(AT_FDCWD, path, F_OK, AT_EACCESS) != 0) return -1;
+  *bits = 0;
+  if (faccessat(AT_FDCWD, path, R_OK, AT_EACCESS) == 0) *bits |= kACLRead;
+  if (faccessat(AT_FDCWD, path, W_OK, AT_EACCESS) == 0) *bits |= kACLWrite;
+  if (faccessat(AT_FDCWD, path, X_OK, AT_EACCESS) == 0) *bits |= kACLExecute;
+  errno = 0;
+  return 0;
+}
+
+int MARUACLPermCalc(const char* user_name, const MLIBCSzList* groups, const char* path, int* bits) {
+  if (!user_name || !path || !bits) {
+    errno = EINVAL;
+    return -1;
+  }
+  return maru::Guarded("MARUACLPermCalc", -1, [&] {
+    maru::Identity who;
+    maru::VolumePath place;
+    if (!maru::SplitVolumePath(path, place) ||
+        !maru::ShareTable::Current()->Find(std::string(place.share)) ||
+        !ToIdentity(user_name, groups, who)) {
+      errno = ENOENT;
+      return -1;
+    }
+    const int walked = Walk(who, std::string(place.folder), place.rest);
+    if (walked < 0) return -1;
+    errno = 0;
+    *bits = walked;
+    return 0;
+  });
+}

@@ -1,0 +1,30 @@
+#pragma once
+
+#include <exception>
+
+#include "platform/log.h"
+#include "platform/process.h"
+
+namespace maru {
+
+/// The one wall of the functions that must not throw: the result of `body`, or `failure` when it
+/// throws, which is logged and set as the last error. For this room.
+template <class Result, class Body>
+Result Guarded(const char* operation, Result failure, Body body) {
+  try {
+    return body();
+  } catch (const std::exception& exception) {
+    MARU_LOG("%s: %s", operation, exception.what());
+    MLIBCErrSet(kErrSystem);
+    return failure;
+  }
+}
+
+/// Sets the last error and passes the result on.
+template <class Result>
+Result Fail(int code, Result result) {
+  MLIBCErrSet(code);
+  return result;
+}
+
+}  // namespace maru

@@ -1,0 +1,209 @@
+#include "platform/json.h"
+
+#include <errno.h>
+#include <json/reader.h>
+#include <json/writer.h>
+
+#include <memory>
+#include <sstream>
+#include <string_view>
+
+#include "platform/whole_file.h"
+
+namespace maru::json {
+namespace {
+
+/// Refuses what the library would let pass, or throw at: control characters in strings, numbers of
+/// other grammars, surrogates without their partner, too many levels or values. Everything else is
+/// left to the parser.
+class StrictnessCheck {
+ public:
+  explicit StrictnessCheck(std::string_view text) : text_(text) {}
+
+  /// Null, or what is wrong.
+  const char* Fault() {
+    while (at_ < text_.size()) {
+      const char c = text_[at_];
+      const char* fault = nullptr;
+      if (c == '"') {
+        fault = String();
+      } else if (c == '-' || c == '+' || IsDigit(c)) {
+        fault = Number();
+      } else {
+        fault = Structure(c);
+        ++at_;
+      }
+      if (fault) return fault;
+    }
+    return nullptr;
+  }
+
+ private:
+  static bool IsDigit(char c) { return c >= '0' && c <= '9'; }
+  char Peek() const { return at_ < text_.size() ? text_[at_] : '\0'; }
+
+  const char* Structure(char c) {
+    if (c == '[' || c == '{') {
+      if (++depth_ > kMaxDepth) return "too many levels";
+      ++values_;
+    } else if (c == ']' || c == '}') {
+      if (depth_ > 0) --depth_;
+    } else if (c == ',') {
+      ++values_;
+    }
+    return values_ > kMaxValues ? "too many values" : nullptr;
+  }
+
+  const char* String() {
+    for (++at_; at_ < text_.size(); ++at_) {
+      const auto c = static_cast<unsigned char>(text_[at_]);
+      if (c == '"') {
+        ++at_;
+        return nullptr;
+      }
+      if (c < 0x20) return "a control character in a string";
+      if (c != '\\') continue;
+      ++at_;
+      if (Peek() == 'u' && !UnicodeEscape()) return "half of a surrogate pair";
+    }
+    return "a string without an end";
+  }
+
+  /// Stands on the u of an escape, and leaves on the last character of it, or of the pair.
+  bool UnicodeEscape() {
+    const unsigned unit = HexUnit(at_ + 1);
+    if (unit < 0xd800 || unit > 0xdfff) return true;
+    if (unit > 0xdbff || text_.substr(at_ + 5, 2) != "\\u") return false;
+    const unsigned low = HexUnit(at_ + 7);
+    if (low < 0xdc00 || low > 0xdfff) return false;
+    at_ += 10;
+    return true;
+  }
+
+  /// Four hexadecimal digits, or 0, which the parser then judges.
+  unsigned HexUnit(std::size_t from) const {
+    unsigned unit = 0;
+    if (from + 4 > text_.size()) return 0;
+    for (const char c : text_.substr(from, 4)) {
+      const char lower = static_cast<char>(c | 0x20);
+      if (IsDigit(c)) {
+        unit = unit * 16 + static_cast<unsigned>(c - '0');
+      } else if (lower >= 'a' && lower <= 'f') {
+        unit = unit * 16 + static_cast<unsigned>(lower - 'a') + 10;
+      } else {
+        return 0;
+      }
+    }
+    return unit;
+  }
+
+  const char* Number() {
+    constexpr const char* kFault = "a malformed number";
+    if (Peek() == '-') ++at_;
+    const bool zero = Peek() == '0';
+    const std::size_t digits = Digits();
+    if (digits == 0 || (zero && digits > 1)) return kFault;
+    if (Peek() == '.') {
+      ++at_;
+      if (Digits() == 0) return kFault;
+    }
+    if (Peek() == 'e' || Peek() == 'E') {
+      ++at_;
+      if (Peek() == '+' || Peek() == '-') ++at_;
+      if (Digits() == 0) return kFault;
+    }
+    return nullptr;
+  }
+
+  std::size_t Digits() {
+    const std::size_t start = at_;
+    while (IsDigit(Peek())) ++at_;
+    return at_ - start;
+  }
+
+  std::string_view text_;
+  std::size_t at_ = 0;
+  std::size_t depth_ = 0;
+  std::size_t values_ = 0;
+};
+
+std::unique_ptr<Json::CharReader> NewReader() {
+  Json::CharReaderBuilder builder;
+  Json::CharReaderBuilder::strictMode(&builder.settings_);
+  builder["strictRoot"] = false;
+  builder["skipBom"] = false;
+  builder["stackLimit"] = kMaxDepth + 1;
+  return std::unique_ptr<Json::CharReader>(builder.newCharReader());
+}
+
+std::unique_ptr<Json::StreamWriter> NewWriter() {
+  Json::StreamWriterBuilder builder;
+  builder["indentation"] = "";
+  builder["commentStyle"] = "None";
+  builder["emitUTF8"] = true;
+  return std::unique_ptr<Json::StreamWriter>(builder.newStreamWriter());
+}
+
+bool Refuse(std::string* error, std::string reason) {
+  if (error) *error = std::move(reason);
+  return false;
+}
+
+}  // namespace
+
+bool FromString(const std::string& text, Json::Value& value, std::string* error) {
+  if (text.size() > kMaxSize) return Refuse(error, "too long");
+  if (const char* fault = StrictnessCheck(text).Fault()) return Refuse(error, fault);
+  try {
+    thread_local const std::unique_ptr<Json::CharReader> reader = NewReader();
+    Json::Value parsed;
+    std::string reason;
+    if (!reader->parse(text.data(), text.data() + text.size(), &parsed, &reason)) {
+      return Refuse(error, std::move(reason));
+    }
+    value = std::move(parsed);
+    return true;
+  } catch (const std::exception& exception) {
+    return Refuse(error, exception.what());
+  }
+}
+
+std::string ToString(const Json::Value& value) {
+  thread_local const std::unique_ptr<Json::StreamWriter> writer = NewWriter();
+  std::ostringstream stream;
+  writer->write(value, &stream);
+  return std::move(stream).str();
+}
+
+bool FromFile(const std::string& path, Json::Value& value) {
+  std::string text;
+  if (!ReadWholeFile(path, kMaxSize, text)) return false;
+  errno = 0;
+  return FromString(text, value);
+}
+
+bool ToFile(const Json::Value& value, const std::string& path) {
+  return WriteWholeFile(path, ToString(value) + "\n", 0600);
+}
+
+const Json::Value& Member(const Json::Value& object, const char* key) {
+  if (!object.isObject()) return Json::Value::nullSingleton();
+  return object[key];
+}
+
+std::string StringMember(const Json::Value& object, const char* key, const std::string& fallback) {
+  const Json::Value& member = Member(object, key);
+  return member.isString() ? member.asString() : fallback;
+}
+
+int IntMember(const Json::Value& object, const char* key, int fallback) {
+  const Json::Value& member = Member(object, key);
+  return member.isInt() ? member.asInt() : fallback;
+}
+
+bool BoolMember(const Json::Value& object, const char* key, bool fallback) {
+  const Json::Value& member = Member(object, key);
+  return member.isBool() ? member.asBool() : fallback;
+}
+
+}  // namespace maru::json

@@ -1,0 +1,174 @@
+#include <soci/sqlite3/soci-sqlite3.h>
+#include <unistd.h>
+
+#include <map>
+#include <set>
+#include <stdexcept>
+#include <string_view>
+
+#include "platform/config.h"
+#include "platform/marudbquery_impl.h"
+
+namespace marudbquery {
+namespace {
+
+constexpr std::string_view kSQLite = "sqlite3";
+constexpr std::string_view kPostgreSQL = "postgresql";
+// The longest queue of writers is far shorter; a lock held longer is a fault to report.
+constexpr const char* kBusyTimeout = "PRAGMA busy_timeout = 20000";
+
+std::unique_ptr<soci::session> Connect(std::string_view backend, const std::string& connection) {
+  if (backend == kSQLite) return std::make_unique<soci::session>(soci::sqlite3, connection);
+  // Loaded only where it is asked for, and by name, never from the current folder.
+  static const bool registered = [] {
+    soci::dynamic_backends::register_backend("postgresql", "libsoci_postgresql.so.4.0");
+    return true;
+  }();
+  static_cast<void>(registered);
+  return std::make_unique<soci::session>(std::string(backend), connection);
+}
+
+void PrepareSQLite(soci::session& database) {
+  database << kBusyTimeout;
+  std::string mode;
+  database << "PRAGMA journal_mode", soci::into(mode);
+  if (mode == "wal") return;
+  try {
+    database << "PRAGMA journal_mode = WAL", soci::into(mode);
+  } catch (const soci::soci_error&) {
+    // Another process is using it just now; readers then wait for writers until the next one comes.
+  }
+}
+
+void RunSchema(soci::session& database, std::string_view schema) {
+  while (!schema.empty()) {
+    const std::size_t end = std::min(schema.find(';'), schema.size());
+    const std::string statement(schema.substr(0, end));
+    schema.remove_prefix(std::min(end + 1, schema.size()));
+    if (statement.find_first_not_of(" \n") != std::string::npos) database << statement;
+  }
+}
+
+}  // namespace
+
+struct Session::State {
+  std::string backend;
+  std::string connection;
+  std::string schema;
+  std::unique_ptr<soci::session> database;
+  pid_t owner = 0;
+  std::map<std::string, std::set<std::string>> columns;
+
+  /// A child must not close its parent's connection, nor use it: it forgets it.
+  void Forget() {
+    if (owner == getpid()) return;
+    static_cast<void>(database.release());
+    columns.clear();
+  }
+
+  const std::set<std::string>& Columns(soci::session& open, const std::string& table);
+};
+
+const std::set<std::string>& Session::State::Columns(soci::session& open,
+                                                     const std::string& table) {
+  const auto known = columns.find(table);
+  if (known != columns.end()) return known->second;
+  const char* query = backend == kSQLite
+                          ? "SELECT name FROM pragma_table_info(:t)"
+                          : "SELECT column_name FROM information_schema.columns "
+                            "WHERE table_schema = current_schema() AND table_name = :t";
+  std::set<std::string> names;
+  const soci::rowset<std::string> rows = (open.prepare << query, soci::use(table));
+  names.insert(rows.begin(), rows.end());
+  return columns[table] = std::move(names);
+}
+
+Session::Session(std::string connection, std::string schema) : state_(new State) {
+  const std::size_t end = connection.find("://");
+  state_->backend = connection.substr(0, end);
+  if (end == std::string::npos || (state_->backend != kSQLite && state_->backend != kPostgreSQL)) {
+    throw std::invalid_argument("a database is named by sqlite3:// or postgresql://");
+  }
+  state_->connection = connection.substr(end + 3);
+  state_->schema = std::move(schema);
+}
+
+Session::~Session() {
+  state_->Forget();
+}
+
+soci::session& Session::Open() {
+  state_->Forget();
+  if (state_->database) return *state_->database;
+  auto database = Connect(state_->backend, state_->connection);
+  if (IsSQLite()) PrepareSQLite(*database);
+  RunSchema(*database, state_->schema);
+  state_->database = std::move(database);
+  state_->owner = getpid();
+  return *state_->database;
+}
+
+bool Session::IsSQLite() const {
+  return state_->backend == kSQLite;
+}
+
+bool Session::HasTable(const std::string& table) {
+  soci::session& open = Open();
+  return !state_->Columns(open, table).empty();
+}
+
+bool Session::HasColumn(const std::string& table, const std::string& column) {
+  soci::session& open = Open();
+  return state_->Columns(open, table).contains(column);
+}
+
+bool Session::Transaction(const std::function<bool()>& work, std::string& error) {
+  bool begun = false;
+  bool agreed = false;
+  const bool done = Walled(error, [&] {
+    soci::session& database = Open();
+    // A write lock from the start: a transaction that first read could not wait for it.
+    database << (IsSQLite() ? "BEGIN IMMEDIATE" : "BEGIN");
+    begun = true;
+    agreed = work();
+    if (agreed) database << "COMMIT";
+  });
+  if (done && agreed) return true;
+  std::string ignored;
+  if (begun) Walled(ignored, [&] { Open() << "ROLLBACK"; });
+  return false;
+}
+
+}  // namespace marudbquery
+
+namespace maruseeker::db {
+namespace {
+
+constexpr const char* kSQLiteSchema =
+    "CREATE TABLE IF NOT EXISTS search_history (id INTEGER PRIMARY KEY AUTOINCREMENT,"
+    " uid BIGINT NOT NULL, keyword TEXT NOT NULL, create_time BIGINT NOT NULL);"
+    "CREATE INDEX IF NOT EXISTS search_history_by_user"
+    " ON search_history (uid, create_time)";
+
+constexpr const char* kPostgreSQLSchema =
+    "CREATE TABLE IF NOT EXISTS search_history (id SERIAL PRIMARY KEY,"
+    " uid BIGINT NOT NULL, keyword TEXT NOT NULL, create_time BIGINT NOT NULL);"
+    "CREATE INDEX IF NOT EXISTS search_history_by_user"
+    " ON search_history (uid, create_time)";
+
+}  // namespace
+
+marudbquery::Session* DBSession::Instance() {
+  static marudbquery::Session session = [] {
+    const maru::Config& config = maru::Config::Get();
+    const std::string& connection = config.history_database;
+    if (connection.empty()) {
+      return marudbquery::Session("sqlite3://" + config.state_dir + "/history.db", kSQLiteSchema);
+    }
+    return marudbquery::Session(
+        connection, connection.starts_with("sqlite3:") ? kSQLiteSchema : kPostgreSQLSchema);
+  }();
+  return &session;
+}
+
+}  // namespace maruseeker::db

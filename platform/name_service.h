@@ -1,0 +1,27 @@
+#pragma once
+
+#include <sys/types.h>
+
+#include <optional>
+#include <string>
+#include <vector>
+
+/// Accounts and groups of the name service (NSS), without its buffers. For this room. An empty
+/// answer leaves errno 0 when there is no such account, else what went wrong.
+namespace maru {
+
+struct Account {
+  std::string name;
+  uid_t uid = 0;
+  gid_t gid = 0;
+  std::string home;
+};
+
+std::optional<Account> AccountByName(const std::string& name);
+std::optional<Account> AccountByUID(uid_t uid);
+std::optional<gid_t> GroupByName(const std::string& name);
+
+/// The account's groups, the primary one first, each once.
+std::optional<std::vector<gid_t>> GroupsOf(const Account& account);
+
+}  // namespace maru

@@ -1,0 +1,141 @@
+#include "platform/share.h"
+
+#include <errno.h>
+#include <fcntl.h>
+#include <string.h>
+#include <sys/stat.h>
+#include <sys/statvfs.h>
+
+#include <string>
+
+#include "platform/account.h"
+#include "platform/guard.h"
+#include "platform/share_table.h"
+#include "platform/volume_path.h"
+
+using maru::Fail;
+using maru::Guarded;
+using maru::ShareSettings;
+using maru::ShareTable;
+
+namespace {
+
+/// The settings of the share that a record stands for.
+template <class Ask>
+int AskSettings(const char* operation, const MARUSHARE* share, int* value, Ask ask) {
+  if (!share || !value) return Fail(kErrBadParameter, -1);
+  return Guarded(operation, -1, [&] {
+    const auto table = ShareTable::Current();
+    const ShareSettings* settings = table->Find(share->szName);
+    if (!settings) return Fail(kErrNotFound, -1);
+    *value = ask(*settings) ? 1 : 0;
+    return 0;
+  });
+}
+
+MARUSHARE* NewRecord(const ShareSettings& settings) {
+  return new MARUSHARE{strdup(settings.name.c_str()), strdup(settings.VolumePath().c_str()),
+                       settings.deny};
+}
+
+bool CopyText(std::string_view text, char* buffer, std::size_t size) {
+  if (!buffer || text.size() >= size) return false;
+  memcpy(buffer, text.data(), text.size());
+  buffer[text.size()] = '\0';
+  return true;
+}
+
+}  // namespace
+
+int MARUShareGet(const char* name, MARUSHARE** share) {
+  if (!name || !share) return Fail(kErrBadParameter, -1);
+  *share = nullptr;
+  return Guarded("MARUShareGet", -1, [&] {
+    const auto table = ShareTable::Current();
+    const ShareSettings* settings = table->Find(name);
+    if (!settings) return Fail(kErrNotFound, -1);
+    *share = NewRecord(*settings);
+    return 0;
+  });
+}
+
+void MARUShareFree(MARUSHARE* share) {
+  if (!share) return;
+  free(share->szName);
+  free(share->szPath);
+  delete share;
+}
+
+int MARUShareUserPrivGet(const char* user_name, const MARUSHARE* share) {
+  if (!user_name || !share) return Fail(kErrBadParameter, -1);
+  return Guarded("MARUShareUserPrivGet", -1, [&] {
+    maru::Identity identity;
+    const auto table = ShareTable::Current();
+    const ShareSettings* settings = table->Find(share->szName);
+    if (!settings) return Fail(kErrNotFound, -1);
+    if (!maru::IdentityOfUser(user_name, identity)) return static_cast<int>(kSharePrivNone);
+    if (MLIBGroupIsAdminGroupMem(user_name, 0) == 1) return static_cast<int>(kSharePrivReadWrite);
+    return maru::PrivilegeOf(*settings, user_name, identity);
+  });
+}
+
+int MARUShareNamePathGet(const char* volume_path, char* name, std::size_t name_size,
+                         char* share_path, std::size_t path_size) {
+  if (!volume_path) return Fail(kErrBadParameter, -1);
+  return Guarded("MARUShareNamePathGet", -1, [&] {
+    maru::VolumePath place;
+    if (!maru::SplitVolumePath(volume_path, place)) return Fail(kErrBadParameter, -1);
+    if (!ShareTable::Current()->Find(std::string(place.share))) return Fail(kErrNotFound, -1);
+    if (!CopyText(place.share, name, name_size) || !CopyText(place.folder, share_path, path_size)) {
+      return Fail(kErrBadParameter, -1);
+    }
+    return 0;
+  });
+}
+
+int MLIBShareHideUnreadableGet(const MARUSHARE* share, int* value) {
+  return AskSettings("MLIBShareHideUnreadableGet", share, value,
+                     [](const ShareSettings& settings) { return settings.hide_unreadable; });
+}
+
+int MLIBShareIsEncryptedGet(const MARUSHARE* share, int* value) {
+  if (!share || !value) return Fail(kErrBadParameter, -1);
+  struct statx status;
+  if (statx(AT_FDCWD, share->szPath, 0, STATX_TYPE, &status) != 0) return Fail(kErrSystem, -1);
+  *value = status.stx_attributes & STATX_ATTR_ENCRYPTED ? 1 : 0;
+  return 0;
+}
+
+int MLIBShareIsEncryptionGet(const MARUSHARE* share, int* value) {
+  return MLIBShareIsEncryptedGet(share, value);
+}
+
+int MLIBShareIsReadOnlyGet(const MARUSHARE* share, int* value) {
+  if (!share || !value) return Fail(kErrBadParameter, -1);
+  struct statvfs status;
+  if (statvfs(share->szPath, &status) != 0) return Fail(kErrSystem, -1);
+  *value = status.f_flag & ST_RDONLY ? 1 : 0;
+  return 0;
+}
+
+int MLIBShareRecycleStatusGet(const MARUSHARE* share, int* value) {
+  return AskSettings("MLIBShareRecycleStatusGet", share, value,
+                     [](const ShareSettings& settings) { return settings.recycle; });
+}
+
+int MLIBShareEnum(MLIBCSzList** list, MLIBShareFilter filter) {
+  if (!list || !*list || !filter) return Fail(kErrBadParameter, -1);
+  return Guarded("MLIBShareEnum", -1, [&] {
+    int count = 0;
+    const auto table = ShareTable::Current();
+    for (const ShareSettings& settings : table->Shares()) {
+      MARUSHARE* share = NewRecord(settings);
+      const bool selected = filter(share) == 0;
+      MARUShareFree(share);
+      if (!selected) continue;
+      if (MLIBCSzListPush(list, settings.name.c_str()) < 0) return Fail(kErrSystem, -1);
+      ++count;
+    }
+    return count;
+  });
+}

@@ -1,0 +1,155 @@
+#include <errno.h>
+#include <string.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <mutex>
+#include <stdexcept>
+
+#include "platform/config.h"
+#include "platform/log.h"
+#include "platform/name_service.h"
+#include "platform/samba.h"
+#include "platform/share_table.h"
+#include "platform/whole_file.h"
+
+namespace maru {
+namespace {
+
+constexpr std::size_t kMaxFile = 64u << 20;
+constexpr std::chrono::minutes kReadAgain{1};
+
+/// What tells one state of a file from another.
+struct Stamp {
+  dev_t device = 0;
+  ino_t inode = 0;
+  off_t size = 0;
+  std::int64_t modified = 0;
+  std::int64_t changed = 0;
+
+  friend bool operator==(const Stamp&, const Stamp&) = default;
+};
+
+std::int64_t Nanoseconds(const timespec& time) {
+  return std::int64_t{time.tv_sec} * 1'000'000'000 + time.tv_nsec;
+}
+
+Stamp StampOf(const std::string& path) {
+  struct stat status;
+  if (stat(path.c_str(), &status) != 0) return {};
+  return {status.st_dev, status.st_ino, status.st_size, Nanoseconds(status.st_mtim),
+          Nanoseconds(status.st_ctim)};
+}
+
+std::string ReadSettings(const Config& config) {
+  if (!config.samba_config_canonical) return CanonicalSamba(config.samba_config);
+  std::string text;
+  if (!ReadWholeFile(config.samba_config, kMaxFile, text)) {
+    throw std::runtime_error(config.samba_config + ": " + strerror(errno));
+  }
+  return text;
+}
+
+std::string CopyPath(const Config& config) {
+  return config.state_dir + "/shares.conf";
+}
+
+/// Keeps the last good settings for a start with bad ones. Only root and the service keep a copy;
+/// a root without the right to write into the service's folder leaves it to the service.
+void KeepCopy(const Config& config, const std::string& text) {
+  const std::optional<Account> service = AccountByName(config.service_account);
+  if (!service || (geteuid() != 0 && geteuid() != service->uid)) return;
+  std::string kept;
+  const std::string path = CopyPath(config);
+  if (ReadWholeFile(path, kMaxFile, kept) && kept == text) return;
+  if (!WriteWholeFile(path, text, 0600, service->uid) && errno != EACCES && errno != ENOENT) {
+    MARU_LOG("Cannot keep a copy of the shares in %s", path.c_str());
+  }
+  errno = 0;
+}
+
+}  // namespace
+
+/// The table of this process, and when to read it anew.
+class ShareTableSource {
+ public:
+  std::shared_ptr<const ShareTable> Current() {
+    const std::lock_guard lock(mutex_);
+    const Config& config = Config::Get();
+    if (table_ && frozen_) return table_;
+    const Stamp stamp = StampOf(config.samba_config);
+    const auto now = std::chrono::steady_clock::now();
+    if (table_ && stamp == stamp_ && now < read_again_) return table_;
+    stamp_ = stamp;
+    read_again_ = now + kReadAgain;
+    Read(config);
+    return table_;
+  }
+
+  void Freeze() {
+    const std::lock_guard lock(mutex_);
+    frozen_ = true;
+  }
+
+ private:
+  void Read(const Config& config) {
+    try {
+      std::string text = ReadSettings(config);
+      if (table_ && table_->Error().empty() && text == text_) return;
+      table_ = std::make_shared<ShareTable>(ShareTable::Parse(text));
+      text_ = std::move(text);
+      KeepCopy(config, text_);
+    } catch (const std::exception& error) {
+      Stay(config, error.what());
+    }
+  }
+
+  /// Goes on with the last good table, or its copy, or none.
+  void Stay(const Config& config, const std::string& why) {
+    if (table_ && table_->Error() == why) return;
+    errno = 0;
+    MARU_LOG("The settings of the shares are not in force: %s", why.c_str());
+    auto stale = std::make_shared<ShareTable>(table_ ? *table_ : Copy(config));
+    stale->error_ = why;
+    table_ = std::move(stale);
+  }
+
+  static ShareTable Copy(const Config& config) {
+    std::string text;
+    if (!ReadWholeFile(CopyPath(config), kMaxFile, text)) return {};
+    try {
+      return ShareTable::Parse(text);
+    } catch (const std::exception& error) {
+      errno = 0;
+      MARU_LOG("%s: %s", CopyPath(config).c_str(), error.what());
+      return {};
+    }
+  }
+
+  std::mutex mutex_;
+  bool frozen_ = false;
+  std::shared_ptr<const ShareTable> table_;
+  std::string text_;
+  Stamp stamp_;
+  std::chrono::steady_clock::time_point read_again_;
+};
+
+namespace {
+
+ShareTableSource& Source() {
+  static ShareTableSource source;
+  return source;
+}
+
+}  // namespace
+
+std::shared_ptr<const ShareTable> ShareTable::Current() {
+  return Source().Current();
+}
+
+void ShareTable::Freeze() {
+  Source().Freeze();
+}
+
+}  // namespace maru

@@ -1,0 +1,78 @@
+#include "platform/whole_file.h"
+
+#include <errno.h>
+#include <fcntl.h>
+#include <stdio.h>
+#include <stdlib.h>
+#include <sys/stat.h>
+
+#include "platform/unique_fd.h"
+
+namespace maru {
+namespace {
+
+bool WriteAll(int descriptor, std::string_view text) {
+  while (!text.empty()) {
+    const ssize_t written = write(descriptor, text.data(), text.size());
+    if (written < 0 && errno == EINTR) continue;
+    if (written < 0) return false;
+    text.remove_prefix(static_cast<std::size_t>(written));
+  }
+  return true;
+}
+
+mode_t Umask() {
+  const mode_t mask = umask(077);
+  umask(mask);
+  return mask;
+}
+
+}  // namespace
+
+bool ReadWholeFile(const std::string& path, std::size_t limit, std::string& text) {
+  // Without O_NONBLOCK a planted FIFO would hold the process here.
+  const UniqueFd file(
+      open(path.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+  if (!file) return false;
+  struct stat status;
+  if (fstat(file.Get(), &status) != 0) return false;
+  if (!S_ISREG(status.st_mode)) {
+    errno = EINVAL;
+    return false;
+  }
+  std::string content;
+  std::size_t size = 0;
+  for (;;) {
+    content.resize(
+        std::min(limit + 1, std::max(size + 4096, static_cast<std::size_t>(status.st_size) + 1)));
+    const ssize_t count = read(file.Get(), content.data() + size, content.size() - size);
+    if (count < 0 && errno == EINTR) continue;
+    if (count < 0) return false;
+    if (count == 0) break;
+    size += static_cast<std::size_t>(count);
+    if (size > limit) {
+      errno = EFBIG;
+      return false;
+    }
+  }
+  content.resize(size);
+  text = std::move(content);
+  return true;
+}
+
+bool WriteWholeFile(const std::string& path, std::string_view text, mode_t mode, uid_t owner) {
+  std::string temporary = path + ".XXXXXX";
+  const UniqueFd file(mkostemp(temporary.data(), O_CLOEXEC));
+  if (!file) return false;
+  const bool written =
+      WriteAll(file.Get(), text) && fchmod(file.Get(), mode & ~Umask()) == 0 &&
+      (owner == static_cast<uid_t>(-1) || fchown(file.Get(), owner, static_cast<gid_t>(-1)) == 0) &&
+      rename(temporary.c_str(), path.c_str()) == 0;
+  if (written) return true;
+  const int error = errno;
+  unlink(temporary.c_str());
+  errno = error;
+  return false;
+}
+
+}  // namespace maru
