@@ -27,6 +27,11 @@ inline constexpr const char* kTextsKey = "texts";
 inline constexpr const char* kFormat = "1";
 /// The database's folder within an index folder.
 inline constexpr const char* kDatabaseFolder = "/db";
+/// In it: the file that each commit replaces.
+inline constexpr const char* kVersionFile = "/iamglass";
+/// During a first crawl: the metadata, and the merged database before it takes its place.
+inline constexpr const char* kMetadataPart = "/part.0";
+inline constexpr const char* kNewDatabaseFolder = "/db.new";
 
 /// A term of a field, as written by the indexer and asked for by queries.
 inline std::string TermOf(std::string_view prefix, std::string_view word) {

@@ -53,13 +53,24 @@ std::shared_ptr<const Eyes> SharedIndex::EyesOf(const std::shared_ptr<const Dire
   return eyes;
 }
 
+FileIdentity FileIdentity::Of(const std::string& path) {
+  struct stat status {};
+  if (stat(path.c_str(), &status) != 0) return {};
+  return {status.st_dev, status.st_ino,
+          status.st_ctim.tv_sec * std::int64_t{1'000'000'000} + status.st_ctim.tv_nsec};
+}
+
 OpenIndices::OpenIndices(std::vector<std::shared_ptr<SharedIndex>> indices) {
   auto numbers = std::make_shared<ShareNumbers>();
   for (auto& index : indices) {
-    Xapian::Database database(index->Folder() + kDatabaseFolder, Xapian::DB_BACKEND_GLASS);
+    const std::string path = index->Folder() + kDatabaseFolder;
+    FileIdentity folder = FileIdentity::Of(path);
+    // Renamed and filled folders keep their inode: only that tells them apart.
+    folder.changed_ns = 0;
+    Xapian::Database database(path, Xapian::DB_BACKEND_GLASS);
     all_.add_database(database);
     (*numbers)[database.get_uuid()] = shares_.size();
-    shares_.push_back({std::move(index), std::move(database), nullptr});
+    shares_.push_back({std::move(index), std::move(database), nullptr, folder, {}});
   }
   numbers_ = std::move(numbers);
   Refresh();
@@ -67,11 +78,16 @@ OpenIndices::OpenIndices(std::vector<std::shared_ptr<SharedIndex>> indices) {
 
 void OpenIndices::Refresh() {
   for (Share& share : shares_) {
-    if (!share.database.reopen() && share.table) continue;
-    if (!numbers_->contains(share.database.get_uuid())) {
-      throw Xapian::DatabaseOpeningError("The index was made anew");
-    }
+    const std::string path = share.index->Folder() + kDatabaseFolder;
+    FileIdentity folder = FileIdentity::Of(path);
+    folder.changed_ns = 0;
+    if (folder != share.folder) throw Xapian::DatabaseOpeningError("The index was made anew");
+    // Every commit puts a new version file in place of the old one.
+    const FileIdentity version = FileIdentity::Of(path + kVersionFile);
+    if (share.table && version == share.version) continue;
+    share.database.reopen();
     share.table = share.index->Table(share.database);
+    share.version = version;
   }
 }
 

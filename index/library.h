@@ -45,6 +45,16 @@ class SharedIndex {
   std::vector<Known> known_;
 };
 
+/// Tells a file from the one that took its place.
+struct FileIdentity {
+  std::uint64_t device = 0;
+  std::uint64_t inode = 0;
+  std::int64_t changed_ns = 0;
+
+  static FileIdentity Of(const std::string& path);
+  friend bool operator==(const FileIdentity&, const FileIdentity&) = default;
+};
+
 /// Handles on some indices, opened together; one thread at a time.
 class OpenIndices {
  public:
@@ -77,6 +87,8 @@ class OpenIndices {
     std::shared_ptr<SharedIndex> index;
     Xapian::Database database;
     std::shared_ptr<const DirectoryTable> table;
+    FileIdentity folder;
+    FileIdentity version;
   };
   std::vector<Share> shares_;
   Xapian::Database all_;

@@ -1,5 +1,7 @@
 #include "index/writer.h"
 
+#include <fcntl.h>
+#include <stdio.h>
 #include <stdlib.h>
 #include <sys/stat.h>
 
@@ -9,6 +11,7 @@
 #include <filesystem>
 #include <map>
 
+#include "index/bulk.h"
 #include "index/codec.h"
 #include "index/directories.h"
 #include "index/engine.h"
@@ -19,7 +22,28 @@
 namespace maru::index {
 namespace {
 
+void RemoveAll(const std::string& folder, bool (*which)(const std::string& name)) {
+  std::error_code ignored;
+  for (const auto& entry : std::filesystem::directory_iterator(folder, ignored)) {
+    if (which(entry.path().filename())) std::filesystem::remove_all(entry.path());
+  }
+}
+
+/// Left behind by a first crawl that was cut off.
+bool IsUnfinished(const std::string& name) {
+  return name.starts_with("part.") || name == kNewDatabaseFolder + 1;
+}
+
+bool IsAnything(const std::string&) {
+  return true;
+}
+
 Xapian::WritableDatabase OpenDatabase(const std::string& path) {
+  return Xapian::WritableDatabase(path, Xapian::DB_CREATE_OR_OPEN | Xapian::DB_BACKEND_GLASS);
+}
+
+/// Makes the folder where there is none, and empties an index of another format.
+Xapian::WritableDatabase OpenIndex(const std::string& path) {
   // Left alone, the engine commits by itself after so many documents; here only Commit does.
   setenv("XAPIAN_FLUSH_THRESHOLD", "100000000", 1);
   if (mkdir(path.c_str(), 0700) != 0 && errno != EEXIST) {
@@ -27,18 +51,17 @@ Xapian::WritableDatabase OpenDatabase(const std::string& path) {
                             "Cannot make " + path + ": " + std::strerror(errno));
   }
   return WithEngine("Cannot open the index", [&] {
-    const int flags = Xapian::DB_CREATE_OR_OPEN | Xapian::DB_BACKEND_GLASS;
-    Xapian::WritableDatabase database(path + kDatabaseFolder, flags);
+    Xapian::WritableDatabase database = OpenDatabase(path + kDatabaseFolder);
+    RemoveAll(path, IsUnfinished);
     const std::string format = database.get_metadata(kFormatKey);
     if (format == kFormat) return database;
     if (!format.empty() || database.get_doccount() > 0) {
       database.close();
-      for (const auto& entry : std::filesystem::directory_iterator(path)) {
-        std::filesystem::remove_all(entry.path());
-      }
-      database = Xapian::WritableDatabase(path + kDatabaseFolder, flags);
+      RemoveAll(path, IsAnything);
+      database = OpenDatabase(path + kDatabaseFolder);
     }
     database.set_metadata(kFormatKey, kFormat);
+    database.commit();
     return database;
   });
 }
@@ -47,7 +70,7 @@ Xapian::WritableDatabase OpenDatabase(const std::string& path) {
 
 struct Writer::State {
   explicit State(const std::string& path)
-      : folder(path), database(OpenDatabase(path)), texts(path) {
+      : folder(path), main(OpenIndex(path)), database(main), texts(path) {
     WithEngine("Cannot read the index", [&] {
       table.Load(Read());
       const std::string live = database.get_metadata(kTextsKey);
@@ -81,7 +104,8 @@ struct Writer::State {
     const TextPlace text = texts.Append(parts.packed_text);
     live_texts[text.segment] += text.length;
     Place(parts.engine, parts.document, text);
-    pending += parts.size;
+    // The bulk builder bounds its memory itself.
+    if (!bulk) pending += parts.size;
   }
 
   void ForgetText(DocumentId id) {
@@ -94,8 +118,17 @@ struct Writer::State {
   void SweepTexts();
   void CopyTexts(const std::vector<std::uint32_t>& segments);
 
+  void BeginBulk();
+  void EndBulk();
+  void CommitDatabase();
+
   std::string folder;
+  /// Keeps the lock of the index for as long as the Writer lives.
+  Xapian::WritableDatabase main;
+  /// Where things are written: the index itself, or, during a first crawl, a database for the
+  /// metadata alone beside the parts with the documents.
   Xapian::WritableDatabase database;
+  std::unique_ptr<BulkBuilder> bulk;
   TextWriter texts;
   DirectoryTable table;
   std::map<std::uint32_t, std::uint64_t> live_texts;
@@ -136,10 +169,51 @@ void Writer::State::CopyTexts(const std::vector<std::uint32_t>& segments) {
   for (const std::uint32_t segment : segments) live_texts.erase(segment);
 }
 
+/// A fresh index is built in parts and appears whole: nobody could see it grow anyway.
+void Writer::State::BeginBulk() {
+  database = OpenDatabase(folder + kMetadataPart);
+  database.set_metadata(kFormatKey, kFormat);
+  bulk = std::make_unique<BulkBuilder>(folder);
+}
+
+void Writer::State::EndBulk() {
+  CommitDatabase();
+  database.close();
+  const std::string merged = folder + kNewDatabaseFolder;
+  bulk->Merge(folder + kMetadataPart, merged);
+  bulk.reset();
+  Xapian::WritableDatabase next(merged, Xapian::DB_OPEN);
+  if (renameat2(AT_FDCWD, merged.c_str(), AT_FDCWD, (folder + kDatabaseFolder).c_str(),
+                RENAME_EXCHANGE) != 0) {
+    throw maruseeker::Error(
+        maruseeker::kErrorDaemonExchange,
+        std::string("Cannot put the new index in place: ") + std::strerror(errno));
+  }
+  main.close();
+  next.close();
+  main = database = OpenDatabase(folder + kDatabaseFolder);
+  std::filesystem::remove_all(merged);
+}
+
+void Writer::State::CommitDatabase() {
+  texts.Sync();
+  table.Save(
+      [&](const std::string& key, const std::string& value) { database.set_metadata(key, value); });
+  Encoder live;
+  for (const auto& [segment, bytes] : live_texts) live.Number(segment).Number(bytes);
+  database.set_metadata(kTextsKey, live.Take());
+  database.commit();
+  pending = 0;
+}
+
 Writer::Writer(const std::string& path) : state_(std::make_unique<State>(path)) {
-  WithEngine("Cannot tidy the index", [&] { state_->SweepTexts(); });
-  if (state_->table.Commit() == 0) state_->pending = 1;
-  Commit();
+  WithEngine("Cannot tidy the index", [&] {
+    state_->SweepTexts();
+    if (state_->table.Commit() == 0)
+      state_->BeginBulk();
+    else
+      Commit();
+  });
   for (const auto& [segment, size] : state_->texts.SegmentSizes()) {
     if (!state_->live_texts.contains(segment)) state_->texts.RemoveSegment(segment);
   }
@@ -211,13 +285,16 @@ void Writer::RemoveDirectory(DirectoryId id) {
 
 DocumentId Writer::Add(Prepared prepared) {
   return WithEngine("Cannot write the index", [&] {
-    state_->Complete(*prepared.parts_);
-    return state_->database.add_document(prepared.parts_->engine);
+    Prepared::Parts& parts = *prepared.parts_;
+    state_->Complete(parts);
+    if (state_->bulk) return state_->bulk->Add(std::move(parts.engine), parts.size);
+    return state_->database.add_document(parts.engine);
   });
 }
 
 void Writer::Replace(DocumentId id, Prepared prepared) {
   WithEngine("Cannot write the index", [&] {
+    if (state_->bulk) state_->EndBulk();
     state_->ForgetText(id);
     state_->Complete(*prepared.parts_);
     state_->database.replace_document(id, prepared.parts_->engine);
@@ -226,6 +303,7 @@ void Writer::Replace(DocumentId id, Prepared prepared) {
 
 void Writer::Update(DocumentId id, const Document& document) {
   WithEngine("Cannot write the index", [&] {
+    if (state_->bulk) state_->EndBulk();
     Xapian::Document engine = state_->database.get_document(id);
     const StoredRecord stored = StoredRecord::Decode(engine.get_value(kRecordSlot));
     const Place place = Place::Decode(engine.get_value(kPlaceSlot));
@@ -245,6 +323,7 @@ void Writer::Update(DocumentId id, const Document& document) {
 
 void Writer::Remove(DocumentId id) {
   WithEngine("Cannot write the index", [&] {
+    if (state_->bulk) state_->EndBulk();
     state_->ForgetText(id);
     state_->database.delete_document(id);
     state_->pending += 1000;
@@ -253,17 +332,11 @@ void Writer::Remove(DocumentId id) {
 
 void Writer::Commit() {
   WithEngine("Cannot commit the index", [&] {
-    State& state = *state_;
-    if (state.pending == 0) return;
-    state.texts.Sync();
-    state.table.Save([&](const std::string& key, const std::string& value) {
-      state.database.set_metadata(key, value);
-    });
-    Encoder live;
-    for (const auto& [segment, bytes] : state.live_texts) live.Number(segment).Number(bytes);
-    state.database.set_metadata(kTextsKey, live.Take());
-    state.database.commit();
-    state.pending = 0;
+    if (state_->bulk) {
+      state_->EndBulk();
+    } else if (state_->pending > 0) {
+      state_->CommitDatabase();
+    }
   });
 }
 
@@ -272,7 +345,9 @@ std::size_t Writer::Pending() const {
 }
 
 std::uint32_t Writer::Documents() const {
-  return WithEngine("Cannot read the index", [&] { return state_->database.get_doccount(); });
+  return WithEngine("Cannot read the index", [&] {
+    return state_->bulk ? state_->bulk->Documents() : state_->database.get_doccount();
+  });
 }
 
 }  // namespace maru::index

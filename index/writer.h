@@ -68,9 +68,12 @@ class Writer {
   void Update(DocumentId id, const Document& document_without_text);
   void Remove(DocumentId id);
 
-  /// All since the last Commit becomes visible at once. Not more often than 5 times a second.
+  /// All since the last Commit becomes visible at once. Not more often than 5 times a second. The
+  /// documents of a fresh index are built in parts, on threads of the writer's own, and put
+  /// together by the first Commit (or Replace, Update, Remove): best once, at the end of a first
+  /// crawl.
   void Commit();
-  /// Bytes waiting for a Commit, about; the caller commits when this passes its bound.
+  /// Bytes in memory waiting for a Commit, about; the caller commits when this passes its bound.
   std::size_t Pending() const;
   /// Documents in the index.
   std::uint32_t Documents() const;
