@@ -47,7 +47,8 @@ unsigned int SDKShare::GetFTPPrivilege() const {
 }
 
 int SDKShare::GetPrivilege(const std::string& user_name) const {
-  return MARUShareUserPrivGet(user_name.c_str(), share_info_);
+  const int privilege = MARUShareUserPrivGet(user_name.c_str(), share_info_);
+  return privilege < 0 ? static_cast<int>(kSharePrivNone) : privilege;
 }
 
 bool SDKShare::CanBeIndexed() const {

@@ -28,7 +28,8 @@ class SDKShare {
   bool IsSpaceEnough() const;
   /// Flag 1 forbids listing, flag 4 forbids reading.
   unsigned int GetFTPPrivilege() const;
-  /// The user's privilege on the share as a whole (platform/share.h); 4 means no access.
+  /// The user's privilege on the share as a whole (platform/share.h); 4 means no access, and so
+  /// does a privilege that cannot be told.
   int GetPrivilege(const std::string& user_name) const;
   /// Neither encrypted nor read-only.
   bool CanBeIndexed() const;
