@@ -1,0 +1,175 @@
+#!/usr/bin/python3
+"""Bursts of queries, of which the newest wins, and the history, which no answer waits for."""
+
+import pathlib
+import pwd
+import sqlite3
+import threading
+import unittest
+
+import fake_daemon
+import road
+
+BURST = 20
+ALICE = 60001
+
+
+def processes_of(uid):
+    """Process ids of a user, zombies included."""
+    found = []
+    for entry in pathlib.Path("/proc").glob("[0-9]*"):
+        try:
+            if entry.stat().st_uid == uid or f"\nUid:\t{uid}" in (entry / "status").read_text():
+                found.append(int(entry.name))
+        except OSError:
+            pass
+    return found
+
+
+def zombies():
+    found = []
+    for entry in pathlib.Path("/proc").glob("[0-9]*/stat"):
+        try:
+            if entry.read_text().rsplit(")", 1)[1].split()[0] == "Z":
+                found.append(entry.parent.name)
+        except OSError:
+            pass
+    return found
+
+
+class QueriesTest(road.RoadTest):
+    @classmethod
+    def prepare(cls, services):
+        services.index()
+        services.start_web()
+        cls.token = services.sign_in("alice")
+
+    def send(self, serial, query_id):
+        request = road.search_request("harbour", query_id=query_id, query_serial=serial)
+        return self.services.begin(self.services.connect(), "POST", road.SEARCH_PATH, request,
+                                   self.token)
+
+    def assert_served_as_ever(self):
+        hit = {"MARUMDPath": "/volume1/docs/welcome.txt", "MARUMDOwnerUserID": "0"}
+        with fake_daemon.FakeDaemon(fake_daemon.replies({"total": 1}, hit, {"success": True})):
+            data = road.search(self.services, self.token, "welcome", query_id="later",
+                               query_serial=1)
+            self.assertEqual(1, data["total"])
+        road.wait_until(lambda: not processes_of(ALICE) and not zombies(), "no process left behind")
+
+    def test_each_newer_query_ends_the_older_one(self):
+        answer = threading.Event()
+
+        def behave(connection, request, ended):
+            answer.wait()
+            fake_daemon.replies({"total": 0}, {"success": True})(connection, request, ended)
+
+        with fake_daemon.FakeDaemon(behave) as daemon:
+            connections = []
+            for serial in range(1, BURST + 1):
+                connections.append(self.send(serial, "typing"))
+                road.wait_until(lambda: len(daemon.requests) == len(connections), "the query")
+            for connection in connections[:-1]:
+                status, older = self.services.finish(connection)
+                self.assertEqual((409, 1600), (status, older["error"]["code"]))
+            road.wait_until(lambda: len(processes_of(ALICE)) == 1, "the older ones to be gone")
+            answer.set()
+            status, newest = self.services.finish(connections[-1])
+            self.assertEqual((200, {"hits": [], "total": 0}), (status, newest["data"]))
+        self.assert_served_as_ever()
+
+    def test_a_burst_at_once(self):
+        def behave(connection, request, ended):
+            ended.wait(0.2)
+            fake_daemon.replies({"total": 0}, {"success": True})(connection, request, ended)
+
+        with fake_daemon.FakeDaemon(behave):
+            connections = [self.send(serial, "burst") for serial in range(1, BURST + 1)]
+            answers = [self.services.finish(connection) for connection in connections]
+        self.assertTrue(answers[-1][1]["success"], answers[-1])
+        for status, answer in answers[:-1]:
+            # Two that read the query file at the same moment may both be served.
+            self.assertTrue(answer["success"] or (status, answer["error"]["code"]) == (409, 1600))
+        self.assert_served_as_ever()
+
+    def test_an_outdated_query_and_an_id_that_is_a_path(self):
+        with fake_daemon.FakeDaemon(fake_daemon.silence) as daemon:
+            newer = self.send(5, "outdated")
+            road.wait_until(lambda: daemon.requests, "the newer query")
+            for serial in (5, 4):
+                status, answer = self.services.finish(self.send(serial, "outdated"))
+                self.assertEqual((409, 1600), (status, answer["error"]["code"]))
+            status, answer = self.services.finish(self.send(1, "../tmp/x"))
+            self.assertEqual((400, 120), (status, answer["error"]["code"]))
+            # The browser goes away: the process that serves it ends.
+            newer.close()
+            road.wait_until(lambda: not processes_of(ALICE), "the query to end with its client")
+        self.assert_served_as_ever()
+
+
+class HistoryTest(road.RoadTest):
+    @classmethod
+    def prepare(cls, services):
+        services.index()
+        services.start_daemon()
+        services.start_web()
+        cls.token = services.sign_in("alice")
+        road.search(services, cls.token, "first keyword")
+        road.wait_until(cls.databases, "the history's database")
+
+    @staticmethod
+    def databases():
+        """Files in the state folder that hold the history's table."""
+        found = []
+        for path in road.STATE.rglob("*"):
+            if path.is_file() and path.open("rb").read(16).startswith(b"SQLite format 3"):
+                with sqlite3.connect(f"file:{path}?mode=ro", uri=True) as database:
+                    if "search_history" in str(database.execute("SELECT name FROM sqlite_master").fetchall()):
+                        found.append(path)
+        return found
+
+    def keywords(self, uid=ALICE):
+        with sqlite3.connect(self.databases()[0], timeout=road.PATIENCE) as database:
+            rows = database.execute("SELECT keyword FROM search_history WHERE uid = ?"
+                                    " ORDER BY create_time, id", (uid,)).fetchall()
+        return [row[0] for row in rows]
+
+    def test_the_service_writes_it(self):
+        road.wait_until(lambda: "first keyword" in self.keywords(), "the keyword in the history")
+        self.assertEqual(pwd.getpwnam("MaruSeeker").pw_uid, self.databases()[0].stat().st_uid)
+        road.search(self.services, self.services.sign_in("bob"), "  of bob  ")
+        road.wait_until(lambda: self.keywords(60002) == ["of bob"], "bob's keyword, trimmed")
+        self.assertNotIn("of bob", self.keywords())
+
+    def test_a_locked_database_delays_no_answer(self):
+        database = sqlite3.connect(self.databases()[0], timeout=road.PATIENCE, isolation_level=None)
+        database.execute("BEGIN EXCLUSIVE")
+        # While the lock is held nothing can be written; the answer comes all the same.
+        road.search(self.services, self.token, "while locked")
+        database.execute("ROLLBACK")
+        database.close()
+        road.wait_until(lambda: "while locked" in self.keywords(), "the keyword after the lock")
+
+    def test_none_is_lost_and_none_is_doubled(self):
+        words = [f"word {number}" for number in range(12)]
+        errors = []
+
+        def ask(word):
+            try:
+                for _ in range(2):
+                    road.search(self.services, self.token, word)
+            except AssertionError as error:
+                errors.append(error)
+
+        threads = [threading.Thread(target=ask, args=(word,)) for word in words]
+        for thread in threads:
+            thread.start()
+        for thread in threads:
+            thread.join()
+        self.assertFalse(errors)
+        road.wait_until(lambda: set(words) <= set(self.keywords()), "all keywords")
+        self.assertEqual(len(set(self.keywords())), len(self.keywords()))
+
+
+if __name__ == "__main__":
+    unittest.main()
