@@ -167,7 +167,7 @@ void SearchAPI::RecordHistory() const {
   record.uid = request_->GetLoginUID();
   record.create_time = static_cast<std::int64_t>(time(nullptr));
   db::SearchHistoryTable table;
-  MARU_FAIL_IF(!table.UpdateWithTime(record, max), kErrorHistory);
+  MARU_FAIL_IF(!table.UpdateWithTime(record, max), kErrorHistory, table.GetLastError());
 }
 
 void SearchAPI::AnswerNothing() {

@@ -28,8 +28,10 @@ marudbquery::Values SearchHistory::InsertValues() const {
   return {{"uid", static_cast<long long>(uid)}, {"keyword", keyword}, {"create_time", create_time}};
 }
 
-Condition SearchHistory::SameRow() const {
-  return Condition::ConditionFactory<int>("id", "=", id);
+Condition SearchHistory::NotNewer() const {
+  const Condition older = Condition::ConditionFactory<long long>("create_time", "<", create_time);
+  const Condition equal = Condition::ConditionFactory<long long>("create_time", "=", create_time);
+  return older || (equal && Condition::ConditionFactory<int>("id", "<=", id));
 }
 
 Condition SearchHistory::SameOwner() const {
@@ -81,11 +83,9 @@ bool SearchHistoryTable::Prune(const SearchHistory& newest, int max) {
   const Condition others =
       newest.SameOwner() && Condition::ConditionFactory<int>("id", "!=", newest.id);
   std::vector<SearchHistory> excess;
-  if (!GetAll(excess, others, SelectParam(max - 1, 0, "create_time", false))) return false;
+  if (!GetAll(excess, others, SelectParam(max - 1, 1, "create_time", false))) return false;
   if (excess.empty()) return true;
-  Condition rows = Condition::Null();
-  for (const SearchHistory& row : excess) rows = rows || row.SameRow();
-  return Delete(newest.SameOwner() && rows);
+  return Delete(others && excess.front().NotNewer());
 }
 
 }  // namespace maruseeker::db

@@ -9,8 +9,9 @@ class BaseRecord : public marudbquery::Updatable, public marudbquery::Insertable
  public:
   ~BaseRecord() override = default;
 
-  /// The row that this record was read from.
-  virtual marudbquery::Condition SameRow() const = 0;
+  /// This record's row and those of an earlier time, whosever they are; of one time, the lower id
+  /// is the earlier.
+  virtual marudbquery::Condition NotNewer() const = 0;
   /// Rows of the same owner.
   virtual marudbquery::Condition SameOwner() const = 0;
   /// Takes every field from a fetched row. Throws what SOCI throws when a column is missing.

@@ -20,7 +20,7 @@ class SearchHistory : public BaseRecord {
 
   marudbquery::Values UpdateValues() const override;
   marudbquery::Values InsertValues() const override;
-  marudbquery::Condition SameRow() const override;
+  marudbquery::Condition NotNewer() const override;
   marudbquery::Condition SameOwner() const override;
   void FromValues(const soci::values& values) override;
   marudbquery::Condition SameContent() const override;
