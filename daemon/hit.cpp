@@ -1,0 +1,101 @@
+#include "daemon/hit.h"
+
+#include <algorithm>
+#include <limits>
+
+namespace maru::daemon {
+namespace {
+
+using index::Field;
+using index::Hit;
+
+constexpr std::size_t kMaxFieldNames = 64;
+constexpr std::size_t kMaxFieldName = 64;
+
+std::string KindOf(const Hit& hit) {
+  if (hit.record.is_dir) return "folder";
+  return std::string(index::KindOfExtension(index::ExtensionOf(hit.record.name)));
+}
+
+Json::Value AuthorsOf(const Hit& hit) {
+  Json::Value authors(Json::arrayValue);
+  for (const std::string& author : hit.record.authors) authors.append(author);
+  return authors;
+}
+
+Json::Value ValueOf(const Place& place, const Hit& hit, std::string_view field) {
+  if (field == index::kPath) return FullPath(place, hit.path);
+  if (field == index::kName) return hit.record.name;
+  if (field == index::kExtension) return index::ExtensionOf(hit.record.name);
+  if (field == index::kIsDir) return hit.record.is_dir;
+  if (field == index::kSize) return Json::UInt64{hit.record.size};
+  if (field == index::kOwner) return std::to_string(hit.owner);
+  if (field == index::kModTime) return Json::Int64{hit.record.mtime};
+  if (field == index::kKind) return KindOf(hit);
+  if (field == index::kTitle) return hit.record.title;
+  if (field == index::kAuthors) return AuthorsOf(hit);
+  return {};
+}
+
+std::size_t Bounded(std::int64_t number, std::int64_t least, std::int64_t most,
+                    std::int64_t usual) {
+  return static_cast<std::size_t>(number < 1 ? usual : std::clamp(number, least, most));
+}
+
+}  // namespace
+
+std::vector<const Field*> ReadFields(const Arguments& arguments) {
+  std::vector<const Field*> fields;
+  for (const char* list : {"load_field", "fields"}) {
+    for (const std::string& name : arguments.Strings(list, kMaxFieldNames, kMaxFieldName)) {
+      const Field* field = index::FindField(name);
+      if (!field) arguments.Refuse(list, "names an unknown field, " + Quoted(name));
+      if (field->name == index::kText) continue;
+      if (std::find(fields.begin(), fields.end(), field) == fields.end()) fields.push_back(field);
+    }
+  }
+  return fields;
+}
+
+Json::Value HitMessage(const Place& place, const Hit& hit,
+                       const std::vector<const Field*>& fields) {
+  Json::Value message(Json::objectValue);
+  for (const Field* field : fields) {
+    message[std::string(field->name)] = ValueOf(place, hit, field->name);
+  }
+  message[std::string(index::kOwner)] = std::to_string(hit.owner);
+  message["doc_id"] = hit.document;
+  message["id"] = place.id;
+  message["score"] = hit.score;
+  return message;
+}
+
+index::FragmentOptions ReadFragmentOptions(const Arguments& arguments) {
+  constexpr std::int64_t kLow = std::numeric_limits<std::int64_t>::min();
+  constexpr std::int64_t kHigh = std::numeric_limits<std::int64_t>::max();
+  index::FragmentOptions options;
+  options.field = arguments.String("field", kMaxFieldName, std::string(index::kText));
+  const Field* field = index::FindField(options.field);
+  if (!field || field->type != index::FieldType::kText) {
+    arguments.Refuse("field", "is not a text field: " + Quoted(options.field));
+  }
+  options.length = Bounded(arguments.Integer("frag_length", kLow, kHigh, 0), kMinFragmentLength,
+                           kMaxFragmentLength, kDefaultFragmentLength);
+  options.count = Bounded(arguments.Integer("num_fragments", kLow, kHigh, 0), 1, kMaxFragments,
+                          kDefaultFragments);
+  return options;
+}
+
+Json::Value FragmentsOf(index::Reader& reader, const Hit& hit, const index::Query& query,
+                        const std::vector<index::FragmentOptions>& options) {
+  Json::Value fragments(Json::objectValue);
+  for (const index::FragmentOptions& wanted : options) {
+    for (const index::Fragment& fragment :
+         reader.Fragments(hit.share, hit.document, query, wanted)) {
+      fragments[wanted.field].append(fragment.html);
+    }
+  }
+  return fragments;
+}
+
+}  // namespace maru::daemon

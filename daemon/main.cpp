@@ -1,0 +1,93 @@
+#include <pwd.h>
+#include <sys/resource.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <CLI/CLI.hpp>
+#include <csignal>
+#include <exception>
+#include <iostream>
+#include <stdexcept>
+#include <string>
+
+#include "daemon/core.h"
+#include "daemon/history.h"
+#include "daemon/listener.h"
+#include "daemon/privilege.h"
+#include "daemon/server.h"
+#include "platform/config.h"
+#include "platform/log.h"
+
+namespace {
+
+using namespace maru;
+using namespace maru::daemon;
+
+Server* running = nullptr;
+
+void OnSignal(int) {
+  const int error = errno;
+  running->Stop();
+  errno = error;
+}
+
+/// Whom the process will be: the service account for root, else who it is.
+Identity FutureIdentity(const std::string& account) {
+  Identity identity;
+  const bool known =
+      geteuid() == 0 ? IdentityOfUser(account, identity) : IdentityOfUID(geteuid(), identity);
+  if (!known && geteuid() == 0) throw std::runtime_error("There is no account " + account);
+  if (!known) identity.uid = geteuid();
+  return identity;
+}
+
+void RaiseDescriptorLimit() {
+  rlimit limit;
+  if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return;
+  limit.rlim_cur = limit.rlim_max;
+  setrlimit(RLIMIT_NOFILE, &limit);
+}
+
+void Serve(const Config& config) {
+  umask(077);
+  RaiseDescriptorLimit();
+  const Identity identity = FutureIdentity(config.service_account);
+  const Listener listener(config.daemon_socket, identity);
+  DropPrivileges(config.service_account);
+  if (!MayExamineAllFiles()) {
+    MARU_LOG("Running without CAP_DAC_READ_SEARCH: only files that user %u can reach are shown",
+             geteuid());
+  }
+  LibraryIndices indices(config.state_dir + "/index");
+  UsageStore usage(config.state_dir + "/usage.db");
+  Core core{.indices = indices, .usage = usage};
+  core.history = EarlierSearches;
+  Server server(core, listener.Socket(), identity.uid, {});
+  running = &server;
+  for (const int signal : {SIGTERM, SIGINT}) std::signal(signal, OnSignal);
+  std::signal(SIGPIPE, SIG_IGN);
+  server.Run();
+  for (const int signal : {SIGTERM, SIGINT}) std::signal(signal, SIG_IGN);
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  CLI::App app("The search daemon of MaruSeeker.", "maruelasticd");
+  std::string config_file = Config::kDefaultPath;
+  bool foreground = false;
+  app.add_option("--config", config_file, "Configuration file")->type_name("FILE");
+  app.add_flag("--foreground", foreground, "Log to standard error, too");
+  app.set_version_flag("--version", MARUSEEKER_VERSION);
+  CLI11_PARSE(app, argc, argv);
+  OpenLog("maruelasticd", foreground);
+  try {
+    Serve(app.count("--config") ? Config::Load(config_file) : Config::Get());
+    return 0;
+  } catch (const std::exception& error) {
+    errno = 0;
+    MARU_LOG("%s", error.what());
+    if (!foreground) std::cerr << "maruelasticd: " << error.what() << "\n";
+    return 1;
+  }
+}
