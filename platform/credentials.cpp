@@ -33,9 +33,15 @@ bool Read(ProcessIdentity& identity) {
   return true;
 }
 
+/// Asks the kernel only for a change, which may need a right that sameness does not.
+bool SetGroups(const std::vector<gid_t>& wanted) {
+  ProcessIdentity now;
+  return Read(now) && (now.groups == wanted || setgroups(wanted.size(), wanted.data()) == 0);
+}
+
 /// Group rights before user rights: once the user is switched, the right to do so is gone.
 bool Become(const ProcessIdentity& wanted) {
-  if (setresuid(0, 0, 0) != 0 || setgroups(wanted.groups.size(), wanted.groups.data()) != 0 ||
+  if (setresuid(0, 0, 0) != 0 || !SetGroups(wanted.groups) ||
       setresgid(wanted.real_gid, wanted.effective_gid, wanted.saved_gid) != 0 ||
       setresuid(wanted.real_uid, wanted.effective_uid, wanted.saved_uid) != 0) {
     return false;

@@ -50,6 +50,8 @@ class StrictnessCheck {
       if (depth_ > 0) --depth_;
     } else if (c == ',') {
       ++values_;
+    } else if (static_cast<unsigned char>(c) < 0x20 && c != '\n' && c != '\r' && c != '\t') {
+      return "a control character";  // the parser takes a NUL for the end
     }
     return values_ > kMaxValues ? "too many values" : nullptr;
   }

@@ -88,7 +88,8 @@ std::string StatementText::Column(const std::string& name) const {
 
 std::string StatementText::Bind(const Value& value) {
   values_.push_back(value);
-  return ":v" + std::to_string(values_.size());
+  // SQLite looks names up one by one; thousands of values need nameless places.
+  return session_.IsSQLite() ? "?" : ":v" + std::to_string(values_.size());
 }
 
 std::string StatementText::Where(const Condition& condition) {
@@ -104,10 +105,12 @@ std::string StatementText::Of(const Condition::Node& node) {
       // Unlike LIKE these know no special characters and no other case.
       return std::string(session_.IsSQLite() ? "instr(" : "strpos(") + Column(node.column) + ", " +
              Bind(node.value) + ") > 0";
-    case Condition::Node::kAnd:
-      return "(" + Of(*node.left) + " AND " + Of(*node.right) + ")";
-    default:
-      return "(" + Of(*node.left) + " OR " + Of(*node.right) + ")";
+    default: {
+      // One after the other: values are bound in the order of their places.
+      const std::string left = Of(*node.left);
+      const std::string right = Of(*node.right);
+      return "(" + left + (node.kind == Condition::Node::kAnd ? " AND " : " OR ") + right + ")";
+    }
   }
 }
 

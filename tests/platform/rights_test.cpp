@@ -1,0 +1,262 @@
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <sys/mount.h>
+#include <sys/xattr.h>
+
+#include <array>
+#include <random>
+
+#include "platform/account.h"
+#include "platform/acl.h"
+#include "platform/share_table.h"
+#include "tests/platform/support.h"
+
+namespace {
+
+using maru::FileRights;
+using maru::Identity;
+
+constexpr const char* kAttribute = "system.posix_acl_access";
+enum Tag { kUserObject = 1, kUser = 2, kGroupObject = 4, kGroup = 8, kMask = 16, kOther = 32 };
+
+struct Entry {
+  std::uint16_t tag;
+  std::uint16_t bits;
+  std::uint32_t id = ~0u;
+};
+
+std::string Raw(const std::vector<Entry>& entries) {
+  std::string raw("\2\0\0\0", 4);
+  for (const Entry& entry : entries) raw.append(reinterpret_cast<const char*>(&entry), 8);
+  return raw;
+}
+
+std::vector<Identity> Users() {
+  std::vector<Identity> users;
+  for (const char* name : {"alice", "bob", "carol"}) {
+    EXPECT_TRUE(maru::IdentityOfUser(name, users.emplace_back()));
+  }
+  // Of many groups and of none, known to no name service.
+  users.push_back({61001, {60001, 60101, 60102, 61001}});
+  users.push_back({61002, {61002}});
+  return users;
+}
+
+void Become(const Identity& who) {
+  ASSERT_EQ(setgroups(who.groups.size(), who.groups.data()), 0);
+  ASSERT_EQ(setresgid(who.groups[0], who.groups[0], who.groups[0]), 0);
+  ASSERT_EQ(setresuid(who.uid, who.uid, who.uid), 0);
+}
+
+/// What the kernel says to a process that really is that user, path after path.
+std::vector<char> KernelsAnswers(const Identity& who, const std::vector<std::string>& paths) {
+  int ends[2];
+  EXPECT_EQ(pipe(ends), 0);
+  EXPECT_EQ(StatusOfChild([&] {
+              Become(who);
+              std::vector<char> answers;
+              for (const std::string& path : paths) {
+                int bits = 0;
+                const int reading = open(path.c_str(), O_RDONLY | O_CLOEXEC);
+                const int writing = open(path.c_str(), O_WRONLY | O_CLOEXEC);
+                if (reading >= 0) bits |= kACLRead;
+                if (writing >= 0) bits |= kACLWrite;
+                if (faccessat(AT_FDCWD, path.c_str(), X_OK, AT_EACCESS) == 0) bits |= kACLExecute;
+                close(reading);
+                close(writing);
+                answers.push_back(static_cast<char>(bits));
+              }
+              EXPECT_EQ(write(ends[1], answers.data(), answers.size()), ssize_t(answers.size()));
+            }),
+            0);
+  std::vector<char> answers(paths.size());
+  EXPECT_EQ(read(ends[0], answers.data(), answers.size()), ssize_t(answers.size()));
+  close(ends[0]);
+  close(ends[1]);
+  return answers;
+}
+
+class RandomRights {
+ public:
+  void GiveTo(const std::string& path) {
+    const uid_t owners[] = {0, 60001, 60002, 60003, 61001};
+    EXPECT_EQ(chown(path.c_str(), Of(owners), Of(groups_)), 0);
+    EXPECT_EQ(chmod(path.c_str(), static_cast<mode_t>(Below(0777 + 1))), 0);
+    if (Below(4) == 0) return;
+    const std::string acl = Acl();
+    EXPECT_EQ(setxattr(path.c_str(), kAttribute, acl.data(), acl.size(), 0), 0) << errno;
+  }
+  unsigned Below(unsigned n) { return std::uniform_int_distribution<unsigned>(0, n - 1)(random_); }
+
+ private:
+  template <class T, std::size_t N>
+  T Of(const T (&items)[N]) {
+    return items[Below(N)];
+  }
+  Entry New(Tag tag) {
+    return {static_cast<std::uint16_t>(tag), static_cast<std::uint16_t>(Below(8))};
+  }
+  /// Some of the ids, each with bits, in the order that the kernel demands.
+  void Append(std::vector<Entry>& entries, Tag tag, const std::vector<std::uint32_t>& ids) {
+    for (const std::uint32_t id : ids) {
+      if (Below(3) != 0) continue;
+      entries.push_back(New(tag));
+      entries.back().id = id;
+    }
+  }
+  std::string Acl() {
+    std::vector<Entry> entries{New(kUserObject)};
+    Append(entries, kUser, {60001, 60002, 61001, 61002});
+    entries.push_back(New(kGroupObject));
+    Append(entries, kGroup, {60001, 60100, 60101, 60102, 61002});
+    const Entry mask{kMask, static_cast<std::uint16_t>(Below(4) ? Below(8) : 0)};
+    if (entries.size() > 2 || Below(2)) entries.push_back(mask);
+    entries.push_back(New(kOther));
+    return Raw(entries);
+  }
+
+  static constexpr gid_t groups_[] = {0, 60001, 60101, 60102, 61001};
+  std::mt19937 random_{20};
+};
+
+TEST(Rights, AreTheKernels) {
+  NEEDS_ACCOUNTS();
+  const TempFolder folder;
+  RandomRights random;
+  std::vector<std::string> paths;
+  for (int i = 0; i < 800; ++i) {
+    paths.push_back(folder.Write("file" + std::to_string(i), ""));
+    random.GiveTo(paths.back());
+  }
+  // As a person sets them.
+  paths.push_back(folder.Write("by hand", ""));
+  ASSERT_EQ(system(("setfacl -m u:alice:rw,g:work:r,m::r '" + paths.back() + "'").c_str()), 0);
+  for (const Identity& who : Users()) {
+    const std::vector<char> answers = KernelsAnswers(who, paths);
+    for (std::size_t i = 0; i < paths.size(); ++i) {
+      FileRights rights;
+      ASSERT_TRUE(maru::ReadFileRights(AT_FDCWD, paths[i].c_str(), rights));
+      EXPECT_EQ(maru::RightsOf(who, rights), answers[i])
+          << who.uid << " on " << std::oct << rights.uid << ":" << rights.gid << " " << rights.mode
+          << " with an ACL of " << std::dec << rights.acl.size() << " bytes";
+    }
+  }
+}
+
+TEST(Rights, OfAMalformedACLAreNone) {
+  const Identity who{60001, {60001}};
+  FileRights rights{0, 0, 0777, Raw({{kUserObject, 7}, {kGroupObject, 7}, {kOther, 7}})};
+  EXPECT_EQ(maru::RightsOf(who, rights), 7);
+  const std::string good = rights.acl;
+  for (std::size_t size = 1; size < good.size(); ++size) {
+    rights.acl = good.substr(0, size);
+    EXPECT_EQ(maru::RightsOf(who, rights), 0) << size;
+  }
+  rights.acl = good;
+  rights.acl[0] = 3;  // another version
+  EXPECT_EQ(maru::RightsOf(who, rights), 0);
+  rights.acl = Raw({{kUserObject, 7}, {0x40, 7}, {kOther, 7}});
+  EXPECT_EQ(maru::RightsOf(who, rights), 0);
+}
+
+TEST(Rights, ReadingThemFollowsNoLink) {
+  const TempFolder folder;
+  const std::string file = folder.Write("file", "");
+  chmod(file.c_str(), 0640);
+  symlink(file.c_str(), (folder / "link").c_str());
+  const int directory = open((folder / "").c_str(), O_RDONLY | O_DIRECTORY);
+  FileRights rights;
+  ASSERT_TRUE(maru::ReadFileRights(directory, "file", rights));
+  EXPECT_EQ(rights.mode, 0640);
+  ASSERT_TRUE(maru::ReadFileRights(directory, "link", rights));
+  EXPECT_EQ(rights.mode, 0777);
+  ASSERT_TRUE(maru::ReadFileRights(directory, "", rights));
+  EXPECT_EQ(rights.mode, 0755);
+  EXPECT_FALSE(maru::ReadFileRights(directory, "none", rights));
+  EXPECT_EQ(errno, ENOENT);
+  close(directory);
+}
+
+/// A share of the sandbox at its place for users: /volume1/NAME in this process's own namespace.
+class Volume : public testing::Test {
+ protected:
+  void SetUp() override {
+    NEEDS_ACCOUNTS();
+    if (unshare(CLONE_NEWNS) != 0 || mount("", "/", "", MS_REC | MS_PRIVATE, nullptr) != 0) {
+      GTEST_SKIP() << "needs a mount namespace";
+    }
+    mkdir("/volume1", 0755);
+    ASSERT_EQ(mount("test", "/volume1", "tmpfs", 0, "mode=0700"), 0);
+    mkdir("/volume1/photo", 0755);
+    folder_.Write("smb.conf", "[photo]\n\tpath = /srv\n[gone]\n\tpath = /gone\n");
+    Configure(folder_, "samba_config_canonical = yes\n");
+  }
+  void TearDown() override { umount("/volume1"); }
+
+  /// Bits, or -errno.
+  static int Bits(const char* user, const std::string& path) {
+    MLIBCSzList* groups = MLIBGroupInfoListGet(user, true);
+    int bits = -1;
+    errno = 0;
+    if (MARUACLPermCalc(user, groups, path.c_str(), &bits) != 0) bits = -errno;
+    MLIBCSzListFree(groups);
+    return bits;
+  }
+
+  TempFolder folder_;
+};
+
+TEST_F(Volume, EveryFolderOnTheWayCounts) {
+  // The volume itself is closed to all, which does not matter: the way begins at the share.
+  mkdir("/volume1/photo/a", 0755);
+  mkdir("/volume1/photo/a/b", 0750);
+  std::ofstream("/volume1/photo/a/b/c.jpg") << "x";
+  chmod("/volume1/photo/a/b/c.jpg", 0644);
+  ASSERT_EQ(chown("/volume1/photo/a/b", 0, 60101), 0);
+  EXPECT_EQ(Bits("alice", "/volume1/photo/a/b/c.jpg"), 4);
+  EXPECT_EQ(Bits("bob", "/volume1/photo/a/b/c.jpg"), 0);
+  EXPECT_EQ(Bits("bob", "/volume1/photo/a/b"), 0);
+  EXPECT_EQ(Bits("bob", "/volume1/photo//a/./"), 5);
+  EXPECT_EQ(Bits("carol", "/volume1/photo/a/b/c.jpg"), 7);  // an administrator
+  chmod("/volume1/photo", 0700);
+  EXPECT_EQ(Bits("alice", "/volume1/photo/a/b/c.jpg"), 0);
+  EXPECT_EQ(Bits("alice", "/volume1/photo"), 0);
+}
+
+TEST_F(Volume, NothingLeadsOutOfTheShare) {
+  symlink("/etc", "/volume1/photo/out");
+  symlink("/etc/passwd", "/volume1/photo/file");
+  EXPECT_EQ(Bits("alice", "/volume1/photo/file"), 0);
+  EXPECT_EQ(Bits("alice", "/volume1/photo/out/passwd"), 0);
+  EXPECT_EQ(Bits("alice", "/volume1/photo/../../etc/passwd"), -ENOENT);
+  EXPECT_EQ(Bits("alice", "/etc/passwd"), -ENOENT);
+  EXPECT_EQ(Bits("alice", "/volume1"), -ENOENT);
+  EXPECT_EQ(Bits("alice", "/volume1/unknown/x"), -ENOENT);
+  EXPECT_EQ(Bits("alice", "/volume1/gone"), -ENOENT);
+  EXPECT_EQ(Bits("alice", "/volume1/photo/none"), -ENOENT);
+  EXPECT_EQ(Bits("nobody at all", "/volume1/photo"), -ENOENT);
+}
+
+TEST_F(Volume, WhatTheCallerCannotReachHasNoBits) {
+  mkdir("/volume1/photo/bobs", 0700);
+  mkdir("/volume1/photo/bobs/deep", 0755);
+  ASSERT_EQ(chown("/volume1/photo/bobs", 60002, 60002), 0);
+  chmod("/volume1", 0755);
+  EXPECT_EQ(Bits("bob", "/volume1/photo/bobs/deep"), 5);
+  EXPECT_EQ(StatusOfChild([] {
+              maru::ShareTable::Current();
+              ASSERT_TRUE(ResetCredentialsByName("alice", true));
+              EXPECT_EQ(Bits("bob", "/volume1/photo/bobs/deep"), 0);
+              EXPECT_EQ(Bits("alice", "/volume1/photo"), 5);
+              unsigned int bits = 0;
+              EXPECT_EQ(MARUACLPermGet("/volume1/photo/bobs/deep", &bits), -1);
+              EXPECT_EQ(errno, EACCES);
+              EXPECT_EQ(MARUACLPermGet("/volume1/photo/bobs", &bits), 0);
+              EXPECT_EQ(bits, 0u);
+              EXPECT_EQ(MARUACLPermGet("/volume1/photo", &bits), 0);
+              EXPECT_EQ(bits, 5u);
+            }),
+            0);
+}
+
+}  // namespace
