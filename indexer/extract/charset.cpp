@@ -1,0 +1,251 @@
+#include "indexer/extract/charset.h"
+
+#include <iconv.h>
+#include <uchardet/uchardet.h>
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <map>
+#include <memory>
+
+namespace maru::extract {
+namespace {
+
+/// Bytes that statistics look at.
+constexpr std::size_t kGuessBytes = 64u << 10;
+constexpr std::string_view kReplacement = "\xEF\xBF\xBD";
+
+/// Every charset that is converted from: the name it is known by, and the converter's name where a
+/// larger charset holds it.
+struct CharsetRow {
+  const char* name;
+  const char* converter;
+};
+constexpr std::array kCharsets = {
+    CharsetRow{"UTF-16LE", "UTF-16LE"},
+    CharsetRow{"UTF-16BE", "UTF-16BE"},
+    CharsetRow{"UTF-32LE", "UTF-32LE"},
+    CharsetRow{"UTF-32BE", "UTF-32BE"},
+    CharsetRow{"WINDOWS-1252", "WINDOWS-1252"},
+    CharsetRow{"ISO-8859-1", "WINDOWS-1252"},
+    CharsetRow{"LATIN1", "WINDOWS-1252"},
+    CharsetRow{"ISO-8859-2", "ISO-8859-2"},
+    CharsetRow{"ISO-8859-3", "ISO-8859-3"},
+    CharsetRow{"ISO-8859-4", "ISO-8859-4"},
+    CharsetRow{"ISO-8859-5", "ISO-8859-5"},
+    CharsetRow{"ISO-8859-6", "ISO-8859-6"},
+    CharsetRow{"ISO-8859-7", "ISO-8859-7"},
+    CharsetRow{"ISO-8859-8", "ISO-8859-8"},
+    CharsetRow{"ISO-8859-9", "WINDOWS-1254"},
+    CharsetRow{"ISO-8859-10", "ISO-8859-10"},
+    CharsetRow{"ISO-8859-11", "CP874"},
+    CharsetRow{"ISO-8859-13", "ISO-8859-13"},
+    CharsetRow{"ISO-8859-15", "ISO-8859-15"},
+    CharsetRow{"ISO-8859-16", "ISO-8859-16"},
+    CharsetRow{"TIS-620", "CP874"},
+    CharsetRow{"WINDOWS-1250", "WINDOWS-1250"},
+    CharsetRow{"WINDOWS-1251", "WINDOWS-1251"},
+    CharsetRow{"WINDOWS-1253", "WINDOWS-1253"},
+    CharsetRow{"WINDOWS-1254", "WINDOWS-1254"},
+    CharsetRow{"WINDOWS-1255", "WINDOWS-1255"},
+    CharsetRow{"WINDOWS-1256", "WINDOWS-1256"},
+    CharsetRow{"WINDOWS-1257", "WINDOWS-1257"},
+    CharsetRow{"WINDOWS-1258", "WINDOWS-1258"},
+    CharsetRow{"KOI8-R", "KOI8-R"},
+    CharsetRow{"KOI8-U", "KOI8-U"},
+    CharsetRow{"IBM852", "IBM852"},
+    CharsetRow{"IBM855", "IBM855"},
+    CharsetRow{"IBM862", "IBM862"},
+    CharsetRow{"IBM865", "IBM865"},
+    CharsetRow{"IBM866", "IBM866"},
+    CharsetRow{"MAC-CYRILLIC", "MAC-CYRILLIC"},
+    CharsetRow{"MAC-CENTRALEUROPE", "MAC-CENTRALEUROPE"},
+    CharsetRow{"VISCII", "VISCII"},
+    CharsetRow{"SHIFT_JIS", "CP932"},
+    CharsetRow{"EUC-JP", "EUC-JP"},
+    CharsetRow{"ISO-2022-JP", "ISO-2022-JP"},
+    CharsetRow{"EUC-KR", "UHC"},
+    CharsetRow{"UHC", "UHC"},
+    CharsetRow{"ISO-2022-KR", "ISO-2022-KR"},
+    CharsetRow{"BIG5", "BIG5-HKSCS"},
+    CharsetRow{"EUC-TW", "EUC-TW"},
+    CharsetRow{"GB18030", "GB18030"},
+    CharsetRow{"GB2312", "GB18030"},
+    CharsetRow{"GBK", "GB18030"},
+};
+
+struct Mark {
+  std::string_view bytes;
+  const char* charset;  // null: UTF-8
+};
+/// Longer ones before those they begin with.
+constexpr std::array kMarks = {
+    Mark{{"\xEF\xBB\xBF", 3}, nullptr},    Mark{{"\xFF\xFE\0\0", 4}, "UTF-32LE"},
+    Mark{{"\0\0\xFE\xFF", 4}, "UTF-32BE"}, Mark{{"\xFF\xFE", 2}, "UTF-16LE"},
+    Mark{{"\xFE\xFF", 2}, "UTF-16BE"},
+};
+
+const Mark* FindMark(std::string_view bytes) {
+  for (const Mark& mark : kMarks) {
+    if (bytes.starts_with(mark.bytes)) return &mark;
+  }
+  return nullptr;
+}
+
+bool IsWide(std::string_view bytes) {
+  const Mark* mark = FindMark(bytes);
+  return mark && mark->charset;
+}
+
+bool SameName(std::string_view a, std::string_view b) {
+  const auto upper = [](char c) { return c >= 'a' && c <= 'z' ? c - 'a' + 'A' : c; };
+  return std::equal(a.begin(), a.end(), b.begin(), b.end(),
+                    [&](char x, char y) { return upper(x) == upper(y); });
+}
+
+const char* ConverterOf(std::string_view charset) {
+  for (const CharsetRow& row : kCharsets) {
+    if (SameName(row.name, charset)) return row.converter;
+  }
+  return nullptr;
+}
+
+/// The open converter, or null when this machine has none. They stay open for good.
+iconv_t* Converter(const std::string& name) {
+  static std::map<std::string, iconv_t> open;
+  auto place = open.find(name);
+  if (place == open.end()) {
+    place = open.emplace(name, iconv_open("UTF-8", name.c_str())).first;
+  }
+  return place->second == reinterpret_cast<iconv_t>(-1) ? nullptr : &place->second;
+}
+
+std::string Guess(std::string_view bytes) {
+  const auto first = std::find_if(bytes.begin(), bytes.end(),
+                                  [](char c) { return static_cast<unsigned char>(c) >= 0x80; });
+  const std::string_view sample =
+      bytes.substr(static_cast<std::size_t>(first - bytes.begin())).substr(0, kGuessBytes);
+  const std::unique_ptr<uchardet, void (*)(uchardet_t)> detector(uchardet_new(), uchardet_delete);
+  if (uchardet_handle_data(detector.get(), sample.data(), sample.size()) != 0) return {};
+  uchardet_data_end(detector.get());
+  return uchardet_get_charset(detector.get());
+}
+
+std::string Convert(iconv_t converter, std::string_view bytes) {
+  iconv(converter, nullptr, nullptr, nullptr, nullptr);
+  std::string text;
+  std::array<char, 16384> buffer;
+  char* in = const_cast<char*>(bytes.data());
+  std::size_t in_left = bytes.size();
+  while (in_left > 0) {
+    char* out = buffer.data();
+    std::size_t out_left = buffer.size();
+    const std::size_t done = iconv(converter, &in, &in_left, &out, &out_left);
+    text.append(buffer.data(), buffer.size() - out_left);
+    if (done != static_cast<std::size_t>(-1) || errno == E2BIG) continue;
+    if (errno == EINVAL) break;
+    text += kReplacement;
+    ++in;
+    --in_left;
+  }
+  return text;
+}
+
+/// Valid UTF-8 with each run of other bytes replaced.
+std::string Repair(std::string_view bytes) {
+  std::string text;
+  bool replaced = false;
+  while (!bytes.empty()) {
+    const std::size_t good = Utf8Length(bytes);
+    text += bytes.substr(0, good);
+    bytes.remove_prefix(good);
+    if (good > 0) replaced = false;
+    if (bytes.empty()) break;
+    if (!replaced) text += kReplacement;
+    replaced = true;
+    bytes.remove_prefix(1);
+  }
+  return text;
+}
+
+constexpr std::size_t kCutOff = 5;
+
+/// Length of the character that begins here; 0 when there is none, kCutOff when `bytes` end before
+/// it does.
+std::size_t CharacterLength(std::string_view bytes) {
+  const auto byte = [&](std::size_t i) { return static_cast<unsigned char>(bytes[i]); };
+  const unsigned first = byte(0);
+  if (first < 0x80) return 1;
+  if (first < 0xC2 || first > 0xF4) return 0;
+  const std::size_t length = first >= 0xF0 ? 4 : first >= 0xE0 ? 3 : 2;
+  for (std::size_t i = 1; i < std::min(length, bytes.size()); ++i) {
+    // Neither longer than need be, nor surrogates, nor beyond the last code point.
+    const unsigned low = i > 1 ? 0x80 : first == 0xE0 ? 0xA0 : first == 0xF0 ? 0x90 : 0x80;
+    const unsigned high = i > 1 ? 0xBF : first == 0xED ? 0x9F : first == 0xF4 ? 0x8F : 0xBF;
+    if (byte(i) < low || byte(i) > high) return 0;
+  }
+  return bytes.size() < length ? kCutOff : length;
+}
+
+}  // namespace
+
+bool IsBinary(std::string_view head) {
+  if (IsWide(head)) return false;
+  std::size_t controls = 0;
+  for (const char c : head) {
+    const auto byte = static_cast<unsigned char>(c);
+    if (byte == 0) return true;
+    const bool usual = (byte >= '\b' && byte <= '\r') || byte == 0x1b;
+    if ((byte < 0x20 && !usual) || byte == 0x7f) ++controls;
+  }
+  return controls > head.size() / 32;
+}
+
+std::string_view TextPart(std::string_view bytes) {
+  return IsWide(bytes) ? bytes : bytes.substr(0, bytes.find('\0'));
+}
+
+std::size_t Utf8Length(std::string_view bytes) {
+  std::size_t at = 0;
+  while (at < bytes.size()) {
+    const std::size_t length = CharacterLength(bytes.substr(at));
+    if (length == 0 || length == kCutOff) break;
+    at += length;
+  }
+  return at;
+}
+
+bool IsUtf8(std::string_view bytes) {
+  const std::size_t good = Utf8Length(bytes);
+  return good == bytes.size() || CharacterLength(bytes.substr(good)) == kCutOff;
+}
+
+void CutUtf8(std::string& text, std::size_t limit) {
+  if (text.size() <= limit) return;
+  while (limit > 0 && (static_cast<unsigned char>(text[limit]) & 0xC0) == 0x80) --limit;
+  text.resize(limit);
+}
+
+void LoadCharsets() {
+  for (const CharsetRow& row : kCharsets) {
+    if (iconv_t* converter = Converter(row.converter)) Convert(*converter, "a");
+  }
+}
+
+std::string ToUtf8(std::string_view bytes, std::string_view declared) {
+  const Mark* mark = FindMark(bytes);
+  if (mark) bytes.remove_prefix(mark->bytes.size());
+  const bool wide = mark && mark->charset;
+  if (!wide && IsUtf8(bytes)) return std::string(bytes.substr(0, Utf8Length(bytes)));
+  const char* name = wide ? mark->charset : mark ? nullptr : ConverterOf(declared);
+  if (!name && !mark && !SameName(declared, "UTF-8")) {
+    const std::string guess = Guess(bytes);
+    if (!SameName(guess, "UTF-8")) name = ConverterOf(guess);
+    if (!name && !SameName(guess, "UTF-8")) name = "WINDOWS-1252";
+  }
+  iconv_t* converter = name ? Converter(name) : nullptr;
+  return converter ? Convert(*converter, bytes) : Repair(bytes);
+}
+
+}  // namespace maru::extract

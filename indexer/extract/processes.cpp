@@ -1,0 +1,121 @@
+#include "indexer/extract/processes.h"
+
+#include <sys/socket.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstring>
+#include <system_error>
+
+#include "indexer/extract/charset.h"
+#include "indexer/extract/wire.h"
+#include "indexer/extract/worker.h"
+#include "platform/log.h"
+
+namespace maru::extract {
+namespace {
+
+[[noreturn]] void ThrowSystemError(const char* doing) {
+  throw std::system_error(errno, std::generic_category(), doing);
+}
+
+bool Receive(int socket, std::string& into, std::size_t size, Deadline deadline) {
+  // Grows with what really comes: the announced size is the other side's claim.
+  constexpr std::size_t kStep = 1u << 20;
+  into.clear();
+  while (into.size() < size) {
+    const std::size_t before = into.size();
+    into.resize(std::min(size, before + kStep));
+    if (!ReceiveAll(socket, into.data() + before, into.size() - before, nullptr, deadline)) {
+      return false;
+    }
+  }
+  return true;
+}
+
+/// What came from the other side is bytes to be checked, like any file.
+std::string Clean(std::string text, std::size_t limit) {
+  if (!IsUtf8(text)) text = ToUtf8(text, "UTF-8");
+  CutUtf8(text, limit);
+  return text;
+}
+
+std::vector<std::string> Lines(const std::string& text) {
+  std::vector<std::string> lines;
+  for (std::size_t at = 0; at < text.size();) {
+    const std::size_t end = std::min(text.find('\n', at), text.size());
+    lines.push_back(Clean(text.substr(at, end - at), kMaxReplyHead));
+    at = end + 1;
+  }
+  return lines;
+}
+
+}  // namespace
+
+Processes::Processes(unsigned slots, std::span<const Extractor> table,
+                     std::chrono::milliseconds timeout)
+    : timeout_(timeout) {
+  int ends[2];
+  if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends) != 0) {
+    ThrowSystemError("cannot make a socket pair");
+  }
+  forker_ = UniqueFd(ends[0]);
+  UniqueFd theirs(ends[1]);
+  forker_pid_ = fork();
+  if (forker_pid_ < 0) ThrowSystemError("cannot fork");
+  if (forker_pid_ == 0) RunForker(ends[1], slots, table);
+  for (unsigned slot = 0; slot < slots; ++slot) workers_.push_back(NewWorker(slot));
+}
+
+Processes::~Processes() {
+  forker_ = UniqueFd();
+  while (waitpid(forker_pid_, nullptr, 0) < 0 && errno == EINTR) continue;
+}
+
+UniqueFd Processes::NewWorker(unsigned slot) {
+  const std::lock_guard lock(forker_mutex_);
+  std::uint32_t number = slot;
+  UniqueFd worker;
+  if (!SendAll(forker_.Get(), &number, sizeof number, -1, kForever) ||
+      !ReceiveAll(forker_.Get(), &number, sizeof number, &worker, kForever) || !worker) {
+    MARU_LOG("No process to extract text with");
+    return UniqueFd();
+  }
+  return worker;
+}
+
+std::optional<Extracted> Processes::Extract(unsigned slot, std::size_t row, int file,
+                                            std::size_t max_text) {
+  UniqueFd& worker = workers_[slot];
+  if (!worker) worker = NewWorker(slot);
+  if (!worker) return std::nullopt;
+  return Ask(worker, row, file, max_text);
+}
+
+std::optional<Extracted> Processes::Ask(UniqueFd& worker, std::size_t row, int file,
+                                        std::size_t max_text) {
+  const Deadline deadline = std::chrono::steady_clock::now() + timeout_;
+  const Request request{static_cast<std::uint32_t>(row), max_text};
+  Reply reply{};
+  Extracted extracted;
+  std::string authors;
+  const int socket = worker.Get();
+  const bool answered = SendAll(socket, &request, sizeof request, file, deadline) &&
+                        ReceiveAll(socket, &reply, sizeof reply, nullptr, deadline);
+  if (answered && reply.good == 0) return std::nullopt;
+  if (answered && reply.title <= kMaxReplyHead && reply.authors <= kMaxReplyHead &&
+      reply.text <= max_text && Receive(socket, extracted.title, reply.title, deadline) &&
+      Receive(socket, authors, reply.authors, deadline) &&
+      Receive(socket, extracted.text, reply.text, deadline)) {
+    extracted.title = Clean(std::move(extracted.title), kMaxReplyHead);
+    extracted.authors = Lines(authors);
+    extracted.text = Clean(std::move(extracted.text), max_text);
+    return extracted;
+  }
+  MARU_LOG("A process that extracts text failed and is replaced");
+  worker = UniqueFd();
+  return std::nullopt;
+}
+
+}  // namespace maru::extract

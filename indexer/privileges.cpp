@@ -1,0 +1,84 @@
+#include "indexer/privileges.h"
+
+#include <cap-ng.h>
+#include <sys/prctl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstring>
+#include <memory>
+#include <stdexcept>
+#include <string>
+
+#include "platform/account.h"
+#include "platform/config.h"
+
+namespace maru::indexer {
+namespace {
+
+struct Account {
+  uid_t uid;
+  gid_t gid;
+};
+
+Account ServiceAccount() {
+  const std::string& name = Config::Get().service_account;
+  MARUUSER* found = nullptr;
+  if (MARUUserGet(name.c_str(), &found) != 0) {
+    throw std::runtime_error("There is no account " + name + " (setting service_account)");
+  }
+  const std::unique_ptr<MARUUSER, void (*)(MARUUSER*)> user(found, MARUUserFree);
+  return {user->nUid, user->nGid};
+}
+
+/// Others may pass through, to ask whether a share has an index, but not look around.
+constexpr mode_t kFolderMode = 0711;
+
+void MakeFolder(const std::string& path, const Account* owner) {
+  const bool made = mkdir(path.c_str(), kFolderMode) == 0;
+  if (!made && errno != EEXIST) {
+    throw std::runtime_error("Cannot make " + path + ": " + std::strerror(errno));
+  }
+  const bool good = !made || (chmod(path.c_str(), kFolderMode) == 0 &&
+                              (!owner || chown(path.c_str(), owner->uid, owner->gid) == 0));
+  if (!good) throw std::runtime_error("Cannot set up " + path + ": " + std::strerror(errno));
+}
+
+void MakeFolders(const Account* owner) {
+  MakeFolder(Config::Get().state_dir, owner);
+  MakeFolder(Config::Get().state_dir + "/index", owner);
+}
+
+void Become(const Account& account) {
+  capng_clear(CAPNG_SELECT_BOTH);
+  capng_update(CAPNG_ADD, static_cast<capng_type_t>(CAPNG_EFFECTIVE | CAPNG_PERMITTED),
+               CAP_DAC_READ_SEARCH);
+  const auto flags = static_cast<capng_flags_t>(CAPNG_DROP_SUPP_GRP | CAPNG_CLEAR_BOUNDING);
+  if (capng_change_id(static_cast<int>(account.uid), static_cast<int>(account.gid), flags) != 0) {
+    throw std::runtime_error("Cannot become the service account");
+  }
+}
+
+bool ReadsEverything() {
+  return capng_get_caps_process() == 0 &&
+         capng_have_capability(CAPNG_EFFECTIVE, CAP_DAC_READ_SEARCH) == 1;
+}
+
+}  // namespace
+
+Sight SettleIdentity() {
+  if (geteuid() == 0) {
+    const Account account = ServiceAccount();
+    MakeFolders(&account);
+    Become(account);
+  } else {
+    MakeFolders(nullptr);
+  }
+  if (prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) != 0) {
+    throw std::runtime_error("Cannot give up new privileges");
+  }
+  return ReadsEverything() ? Sight::kAll : Sight::kOwn;
+}
+
+}  // namespace maru::indexer

@@ -1,0 +1,68 @@
+#include "indexer/service.h"
+
+#include <signal.h>
+#include <time.h>
+
+#include <algorithm>
+#include <cerrno>
+
+#include "indexer/shares.h"
+#include "platform/log.h"
+#include "platform/share_table.h"
+
+namespace maru::indexer {
+namespace {
+
+/// Between two looks at the settings and the shares' folders.
+constexpr timespec kLook{10, 0};
+
+sigset_t Signals() {
+  sigset_t signals;
+  sigemptyset(&signals);
+  for (const int signal : {SIGTERM, SIGINT, SIGHUP}) sigaddset(&signals, signal);
+  return signals;
+}
+
+bool Contains(const std::vector<std::string>& names, const std::string& name) {
+  return std::find(names.begin(), names.end(), name) != names.end();
+}
+
+}  // namespace
+
+void Service::Reconcile() {
+  const std::shared_ptr<const ShareTable> table = ShareTable::Current();
+  const Targets targets = FindTargets(*table);
+  std::erase_if(followers_, [&](const std::unique_ptr<Follower>& follower) {
+    return std::find(targets.present.begin(), targets.present.end(), follower->Share()) ==
+           targets.present.end();
+  });
+  std::vector<std::string> used;
+  for (const auto& follower : followers_) used.push_back(follower->Share().index_folder);
+  RemoveForeignIndices(*table, used);
+  for (const Target& target : targets.present) {
+    if (Contains(used, target.index_folder)) continue;
+    followers_.push_back(std::make_unique<Follower>(target, workers_, turn_, settings_));
+  }
+  for (const std::string& share : targets.missing) {
+    errno = 0;
+    if (!Contains(missing_, share)) MARU_LOG("Share %s: its folder is not there", share.c_str());
+  }
+  missing_ = targets.missing;
+}
+
+void Service::CrawlSoon() {
+  for (const auto& follower : followers_) follower->CrawlSoon();
+}
+
+void Serve(Workers& workers, const Follower::Settings& settings) {
+  const sigset_t signals = Signals();
+  Service service(workers, settings);
+  while (true) {
+    service.Reconcile();
+    const int signal = sigtimedwait(&signals, nullptr, &kLook);
+    if (signal == SIGTERM || signal == SIGINT) return;
+    if (signal == SIGHUP) service.CrawlSoon();
+  }
+}
+
+}  // namespace maru::indexer
