@@ -57,11 +57,13 @@ std::string FolderOf(const std::string& path) {
   return slash == 0 ? "/" : path.substr(0, slash);
 }
 
-bool MayWrite(const Identity& who, const std::string& folder) {
+/// By the kernel's rules, which know no service.
+bool MayWrite(Identity who, const std::string& folder) {
+  who.unrestricted = who.uid == 0;
   FileRights rights;
   if (!ReadFileRights(AT_FDCWD, (folder + "/.").c_str(), rights)) return false;
   constexpr int kWanted = kACLWrite | kACLExecute;
-  return who.uid == 0 || (RightsOf(who, rights) & kWanted) == kWanted;
+  return (RightsOf(who, rights) & kWanted) == kWanted;
 }
 
 }  // namespace
@@ -70,12 +72,12 @@ Listener::Listener(const std::string& path, const Identity& owner) : place_(path
   RefuseWhenServed(path);
   const std::string folder = FolderOf(path);
   if (geteuid() != 0 || MayWrite(owner, folder)) {
-    Bind();
+    Bind(owner);
     return;
   }
   MakeFolder(folder + "/maruelasticd", owner);
   place_ = folder + "/maruelasticd/socket";
-  Bind();
+  Bind(owner);
   Link(path);
 }
 
@@ -89,13 +91,15 @@ void Listener::MakeFolder(const std::string& folder, const Identity& owner) {
   }
 }
 
-void Listener::Bind() {
+void Listener::Bind(const Identity& owner) {
   const std::string fresh = place_ + ".new";
   const sockaddr_un address = AddressOf(fresh);
   socket_ = NewSocket();
   unlink(fresh.c_str());
   if (bind(socket_.Get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0 ||
-      chmod(fresh.c_str(), 0666) != 0 || listen(socket_.Get(), kBacklog) != 0) {
+      chmod(fresh.c_str(), 0666) != 0 ||
+      (geteuid() == 0 && lchown(fresh.c_str(), owner.uid, static_cast<gid_t>(-1)) != 0) ||
+      listen(socket_.Get(), kBacklog) != 0) {
     throw Failed("Cannot listen on " + fresh);
   }
   struct stat status;

@@ -9,9 +9,10 @@
 
 namespace maru::daemon {
 
-/// The daemon's listening socket. Where the identity that the daemon will have cannot write in the
-/// socket's folder (/run is root's), the socket lies in a folder of its own beside it,
-/// "maruelasticd", and the public path is a link there: so it can take its socket away again.
+/// The daemon's listening socket, a file of the identity that the daemon will have. Where that one
+/// cannot write in the socket's folder (/run is root's), the socket lies in a folder of its own
+/// beside it, "maruelasticd", and the public path is a link there: so the daemon can take its
+/// socket away again.
 class Listener {
  public:
   /// Makes the socket, open to everybody. What a daemon that is gone left behind is replaced in one
@@ -26,7 +27,7 @@ class Listener {
 
  private:
   void MakeFolder(const std::string& folder, const Identity& owner);
-  void Bind();
+  void Bind(const Identity& owner);
   void Link(const std::string& path);
 
   /// Where the socket itself lies.
