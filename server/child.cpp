@@ -1,0 +1,145 @@
+#include "server/child.h"
+
+#include <errno.h>
+#include <fcntl.h>
+#include <signal.h>
+#include <sys/prctl.h>
+#include <sys/resource.h>
+#include <unistd.h>
+
+#include <exception>
+
+#include "common/error.h"
+#include "platform/json.h"
+#include "platform/log.h"
+#include "platform/share_table.h"
+#include "server/account.h"
+#include "server/answer.h"
+#include "server/frames.h"
+#include "server/names.h"
+
+namespace maru::server {
+namespace {
+
+#ifndef __SANITIZE_ADDRESS__
+constexpr rlim_t kMaxMemory = rlim_t{2} << 30;
+#endif
+
+void LimitMemory() {
+#ifndef __SANITIZE_ADDRESS__
+  const rlimit limit{kMaxMemory, kMaxMemory};
+  setrlimit(RLIMIT_AS, &limit);
+#endif
+}
+
+/// False when the front went away before the body was whole.
+bool ReadBody(int socket, std::size_t size, Packet& packet, std::string& body) {
+  while (body.size() < size) {
+    if (ReceivePacket(socket, packet, Wait::kYes) != ReceiveResult::kPacket) return false;
+    body += packet.View();
+  }
+  return body.size() == size;
+}
+
+/// Absent parameters are an empty object; false when the body is anything but one JSON object.
+bool ParseParams(const std::string& body, Json::Value& params) {
+  params = Json::objectValue;
+  if (body.empty()) return true;
+  return json::FromString(RestoreBytes(body), params) && params.isObject();
+}
+
+Answer AnswerOf(const MARU::APIResponse& response) {
+  if (!response.IsSet()) return Failure(maruseeker::kErrorUnknown, Json::Value());
+  return response.IsSuccess() ? Success(response.Data())
+                              : Failure(response.ErrorCode(), response.Data());
+}
+
+Answer RunMethod(const Plugin::Method& method, MARU::APIRequest& request) {
+  MARU::APIResponse response;
+  try {
+    if (method.check(&request, &response)) method.entry(&request, &response);
+  } catch (const std::exception& exception) {
+    MARU_LOG("An exception left the plug-in: %s", exception.what());
+    return Failure(maruseeker::kErrorUnknown, Json::Value());
+  } catch (...) {
+    MARU_LOG("An exception left the plug-in");
+    return Failure(maruseeker::kErrorUnknown, Json::Value());
+  }
+  Answer answer = AnswerOf(response);
+  answer.body = HideBytes(std::move(answer.body));
+  if (answer.body.size() <= kMaxAnswer) return answer;
+  MARU_LOG("An answer of %zu bytes is too long", answer.body.size());
+  return Failure(maruseeker::kErrorUnknown, Json::Value());
+}
+
+Answer WhoAnswer(const MARU::APIRequest& request) {
+  Json::Value who;
+  who["user"] = request.GetLoginUserName();
+  who["uid"] = request.GetLoginUID();
+  who["is_admin"] = request.IsAdmin();
+  return Success(who);
+}
+
+Answer CallAnswer(const Task& task, int socket, Packet& packet, const Plugin& plugin,
+                  MARU::APIRequest::Login login) {
+  std::string body;
+  if (!ReadBody(socket, task.body_size, packet, body)) _exit(0);
+  const Plugin::Method method = plugin.Find(task.name);
+  if (!method.entry) return Refusal(404);
+  Json::Value params;
+  if (!ParseParams(body, params)) return Refusal(400);
+  MARU::APIRequest request(std::move(login), std::move(params));
+  return RunMethod(method, request);
+}
+
+int Serve(const Task& task, int socket, Packet& packet, const Plugin& plugin) {
+  const auto account = FindAccount(task.user);
+  if (!account || account->uid != task.uid || account->stamp != task.stamp) {
+    SendAnswer(socket, Refusal(401), Wait::kYes);
+    return kExitSessionOver;
+  }
+  const MARU::APIRequest::Login login{task.uid, task.user, task.session_id,
+                                      IsAdministrator(task.user)};
+  errno = 0;
+  const Answer answer = task.kind == AskKind::kWho
+                            ? WhoAnswer(MARU::APIRequest(login, Json::Value()))
+                            : CallAnswer(task, socket, packet, plugin, login);
+  SendAnswer(socket, answer, Wait::kYes);
+  return 0;
+}
+
+}  // namespace
+
+Descriptor KeepOnly(Descriptor kept) {
+  constexpr int kFirst = STDERR_FILENO + 1;
+  sigset_t none;
+  sigemptyset(&none);
+  sigprocmask(SIG_SETMASK, &none, nullptr);
+  ReopenLog();
+  const int fd = kept.Release();
+  if (fd != kFirst) dup3(fd, kFirst, O_CLOEXEC);
+  close_range(kFirst + 1, ~0u, 0);
+  return Descriptor(kFirst);
+}
+
+void RunRequestChild(Descriptor tasks, const Plugin& plugin) {
+  tasks = KeepOnly(std::move(tasks));
+  prctl(PR_SET_NAME, "maruweb-request");
+  LimitMemory();
+  ShareTable::Freeze();
+  Packet packet;
+  if (ReceivePacket(tasks.Get(), packet, Wait::kYes) != ReceiveResult::kPacket) _exit(0);
+  const auto task = UnpackTask(packet.View());
+  const Descriptor socket = std::move(packet.passed);
+  tasks.Close();
+  if (!task || !socket) _exit(1);
+  int status = 1;
+  try {
+    status = Serve(*task, socket.Get(), packet, plugin);
+  } catch (const std::exception& exception) {
+    MARU_LOG("Failed to serve a request: %s", exception.what());
+  }
+  _exit(status);
+}
+
+}  // namespace maru::server

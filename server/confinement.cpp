@@ -1,0 +1,83 @@
+#include "server/confinement.h"
+
+#include <cap-ng.h>
+#include <dirent.h>
+#include <errno.h>
+#include <fcntl.h>
+#include <grp.h>
+#include <pwd.h>
+#include <sched.h>
+#include <sys/mount.h>
+#include <sys/prctl.h>
+#include <sys/stat.h>
+#include <time.h>
+#include <unistd.h>
+
+#include <memory>
+#include <stdexcept>
+#include <system_error>
+
+namespace maru::server {
+namespace {
+
+constexpr time_t kOldSeconds = 24 * 3600;
+
+void Demand(bool good, const char* what) {
+  if (!good) throw std::system_error(errno, std::generic_category(), what);
+}
+
+}  // namespace
+
+void MakePrivateMounts() {
+  constexpr unsigned long kFlags = MS_NOSUID | MS_NODEV | MS_NOEXEC;
+  Demand(unshare(CLONE_NEWNS) == 0, "unshare");
+  Demand(mount(nullptr, "/", nullptr, MS_REC | MS_SLAVE, nullptr) == 0, "mount /");
+  Demand(mount("proc", "/proc", "proc", kFlags, nullptr) == 0, "mount /proc");
+  Demand(mount("tmpfs", "/tmp", "tmpfs", kFlags, "mode=1777,size=64m,nr_inodes=65536") == 0,
+         "mount /tmp");
+}
+
+void SweepPrivateTmp() {
+  const std::unique_ptr<DIR, int (*)(DIR*)> folder(opendir("/tmp"), closedir);
+  if (!folder) return;
+  const time_t now = time(nullptr);
+  while (const dirent* entry = readdir(folder.get())) {
+    struct stat status;
+    if (fstatat(dirfd(folder.get()), entry->d_name, &status, AT_SYMLINK_NOFOLLOW) == 0 &&
+        S_ISREG(status.st_mode) && now - status.st_mtime > kOldSeconds)
+      unlinkat(dirfd(folder.get()), entry->d_name, 0);
+  }
+  errno = 0;
+}
+
+void KeepHostCapabilities() {
+  capng_clear(CAPNG_SELECT_BOTH);
+  Demand(capng_updatev(
+             CAPNG_ADD,
+             static_cast<capng_type_t>(CAPNG_EFFECTIVE | CAPNG_PERMITTED | CAPNG_BOUNDING_SET),
+             CAP_SETUID, CAP_SETGID, CAP_DAC_READ_SEARCH, CAP_KILL, CAP_CHOWN, -1) == 0,
+         "capng_updatev");
+  // The bounding set goes while setpcap is still there to cut it.
+  Demand(capng_apply(CAPNG_SELECT_BOTH) == 0, "capng_apply");
+  Demand(prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) == 0, "no_new_privs");
+}
+
+void BecomeWebAccount(const std::string& account) {
+  const passwd* entry = getpwnam(account.c_str());
+  if (!entry || entry->pw_uid == 0)
+    throw std::runtime_error("there is no account " + account + " for the web server's front");
+  const uid_t uid = entry->pw_uid;
+  const gid_t gid = entry->pw_gid;
+  capng_clear(CAPNG_SELECT_BOTH);
+  Demand(capng_apply(CAPNG_SELECT_BOUNDS) == 0, "capng_apply");
+  Demand(setgroups(0, nullptr) == 0, "setgroups");
+  Demand(setresgid(gid, gid, gid) == 0, "setresgid");
+  Demand(setresuid(uid, uid, uid) == 0, "setresuid");
+  Demand(capng_apply(CAPNG_SELECT_CAPS) == 0, "capng_apply");
+  Demand(prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) == 0, "no_new_privs");
+  errno = 0;
+  if (setresuid(0, 0, 0) == 0) throw std::runtime_error("the front can become root again");
+  errno = 0;
+}
+
+}  // namespace maru::server

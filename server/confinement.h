@@ -1,0 +1,25 @@
+#pragma once
+
+#include <string>
+
+/// What the front and the host give up before they meet a request. Each function throws
+/// std::system_error when the kernel refuses; the process must then not go on.
+namespace maru::server {
+
+/// The host's own view of the file system: what is mounted on the machine and by the supervisor
+/// still appears in it, with a /proc of its PID namespace and an empty /tmp that nobody else sees.
+void MakePrivateMounts();
+
+/// Removes files in /tmp that nobody has written for a day: the notes of queries that were killed.
+/// Only after MakePrivateMounts.
+void SweepPrivateTmp();
+
+/// Root without any power but to become users, read their files, end their processes and give files
+/// away; also for everything this process will ever start.
+void KeepHostCapabilities();
+
+/// Turns into the account for good: no root, no groups but its own, no capabilities, none to gain
+/// by running programs.
+void BecomeWebAccount(const std::string& account);
+
+}  // namespace maru::server

@@ -1,0 +1,273 @@
+#include "server/host.h"
+
+#include <errno.h>
+#include <signal.h>
+#include <sodium.h>
+#include <sys/prctl.h>
+#include <sys/signalfd.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <exception>
+
+#include "platform/log.h"
+#include "platform/share_table.h"
+#include "server/account.h"
+#include "server/answer.h"
+#include "server/children.h"
+#include "server/confinement.h"
+#include "server/frames.h"
+#include "server/limits.h"
+#include "server/signals.h"
+#include "server/signin.h"
+
+namespace maru::server {
+namespace {
+
+constexpr unsigned kMaxPerSession = 64;
+constexpr int kTickMilliseconds = 2000;
+constexpr Seconds kSweepEvery = 600;
+constexpr Seconds kGrace = 2;
+
+// Keys beyond every process id.
+constexpr Poller::Key kControl = Poller::Key{1} << 32;
+constexpr Poller::Key kLifeline = kControl + 1;
+constexpr Poller::Key kSignals = kControl + 2;
+
+class Host {
+ public:
+  Host(const Config& config, Descriptor control, Descriptor lifeline)
+      : control_(std::move(control)),
+        lifeline_(std::move(lifeline)),
+        signals_(OpenSignals({SIGCHLD, SIGTERM, SIGHUP})),
+        plugin_(config.plugin),
+        sessions_(Seconds{60} * config.session_minutes),
+        children_(poller_, plugin_),
+        shares_(ShareTable::Current()) {
+    poller_.Add(control_.Get(), kControl, EPOLLIN);
+    poller_.Add(lifeline_.Get(), kLifeline, EPOLLIN);
+    poller_.Add(signals_.Get(), kSignals, EPOLLIN);
+  }
+
+  int Run();
+
+ private:
+  void Handle(const epoll_event& event);
+  void Tick();
+  void LookAtShares();
+  void TakeSignals();
+  void ReapAll();
+  void TakeAsks();
+  void Take(Ask ask, Descriptor request);
+  void TakeSignIn(Ask& ask, Descriptor request);
+  void FinishSignIn(SignIns::Outcome outcome);
+  void TakeCall(const Ask& ask, Session& session, Descriptor request);
+  Answer Status() const;
+
+  Descriptor control_, lifeline_, signals_;
+  Plugin plugin_;
+  Poller poller_;
+  TokenSeal seal_;
+  SessionTable sessions_;
+  SignInLimits limits_;
+  SignIns sign_ins_;
+  Children children_;
+  std::shared_ptr<const ShareTable> shares_;
+  Packet packet_;
+  Seconds next_tick_ = 0;
+  Seconds next_sweep_ = 0;
+  Seconds end_ = 0;
+  bool over_ = false;
+};
+
+void Reply(const Descriptor& request, const Answer& answer) {
+  SendAnswer(request.Get(), answer, Wait::kNo);
+}
+
+int Host::Run() {
+  while (children_.WantsMore(Now())) children_.ForkAhead(Now());
+  const char ready = '1';
+  if (write(lifeline_.Get(), &ready, 1) != 1) return 1;
+  while (!over_) {
+    // Children are forked ahead only when no request waits.
+    const bool fork_ahead = !end_ && children_.WantsMore(Now());
+    const auto events = poller_.Wait(fork_ahead ? 0 : kTickMilliseconds);
+    for (const epoll_event& event : events) Handle(event);
+    if (events.empty() && fork_ahead) children_.ForkAhead(Now());
+    if (Now() >= next_tick_) Tick();
+  }
+  return 0;
+}
+
+void Host::Handle(const epoll_event& event) {
+  switch (event.data.u64) {
+    case kControl:
+      TakeAsks();
+      break;
+    case kLifeline:
+      over_ = true;
+      break;
+    case kSignals:
+      TakeSignals();
+      break;
+    default:
+      children_.HangUp(static_cast<pid_t>(event.data.u64));
+  }
+}
+
+void Host::Tick() {
+  const Seconds now = Now();
+  next_tick_ = now + 1;
+  if (end_ && now >= end_) over_ = true;
+  children_.EndOverdue(now);
+  sign_ins_.EndOverdue(now);
+  sessions_.Expire(now);
+  LookAtShares();
+  if (now < next_sweep_) return;
+  next_sweep_ = now + kSweepEvery;
+  SweepPrivateTmp();
+}
+
+void Host::LookAtShares() {
+  auto newest = ShareTable::Current();
+  errno = 0;
+  if (newest == shares_) return;
+  shares_ = std::move(newest);
+  children_.Renew();
+}
+
+void Host::TakeSignals() {
+  while (const int signal = NextSignal(signals_)) {
+    if (signal == SIGCHLD) ReapAll();
+    if (signal == SIGHUP) LookAtShares();
+    if (signal != SIGTERM || end_) continue;
+    end_ = Now() + kGrace;
+    children_.Renew();
+    ReapAll();
+  }
+}
+
+void Host::ReapAll() {
+  int status = 0;
+  pid_t pid;
+  while ((pid = waitpid(-1, &status, WNOHANG)) > 0) {
+    if (auto outcome = sign_ins_.Reaped(pid)) FinishSignIn(std::move(*outcome));
+    const auto finished = children_.Reaped(pid, status, Now());
+    if (!finished) continue;
+    if (Session* session = sessions_.Find(finished->session_id)) --session->running;
+    if (finished->session_over) sessions_.End(finished->session_id);
+  }
+  // When ending: nothing is left, also none of the children's own children.
+  if (end_ && pid < 0) over_ = true;
+  errno = 0;
+}
+
+void Host::TakeAsks() {
+  for (;;) {
+    switch (ReceivePacket(control_.Get(), packet_, Wait::kNo)) {
+      case ReceiveResult::kNothing:
+        return;
+      case ReceiveResult::kEnd:
+        over_ = true;
+        return;
+      case ReceiveResult::kPacket:
+        break;
+    }
+    auto ask = UnpackAsk(packet_.View());
+    packet_.Wipe();
+    if (!ask || !packet_.passed) {
+      MARU_LOG("The front sent a malformed packet");
+      continue;
+    }
+    try {
+      Take(std::move(*ask), std::move(packet_.passed));
+    } catch (const std::exception& exception) {
+      MARU_LOG("Failed to take a request: %s", exception.what());
+    }
+  }
+}
+
+void Host::Take(Ask ask, Descriptor request) {
+  if (end_) return Reply(request, Refusal(503));
+  if (ask.kind == AskKind::kStatus) return Reply(request, Status());
+  if (ask.kind == AskKind::kSignIn) return TakeSignIn(ask, std::move(request));
+  const auto claims = seal_.Open(ask.token);
+  Session* session = claims ? sessions_.Use(*claims, Now()) : nullptr;
+  if (!session) return Reply(request, Refusal(401));
+  if (ask.kind != AskKind::kSignOut) return TakeCall(ask, *session, std::move(request));
+  sessions_.End(claims->session_id);
+  Answer answer = Success(Json::Value());
+  answer.cookie = "";
+  Reply(request, answer);
+}
+
+void Host::TakeCall(const Ask& ask, Session& session, Descriptor request) {
+  if (session.running >= kMaxPerSession) return Reply(request, Refusal(429));
+  const Task task{ask.kind,    ask.name,     ask.body_size, session.id,
+                  session.uid, session.user, session.stamp};
+  if (children_.Hand(task, request, Now()) == Children::Start::kDone)
+    ++session.running;
+  else
+    Reply(request, Refusal(503));
+}
+
+void Host::TakeSignIn(Ask& ask, Descriptor request) {
+  if (!limits_.Admit(ask.user, ask.source, Now())) {
+    MARU_LOG("Too many failed attempts to sign in from %s", ask.source.c_str());
+    Reply(request, Refusal(429));
+  } else if (!sign_ins_.Begin(ask, request, Now())) {
+    limits_.Succeeded(ask.user, ask.source);
+    Reply(request, Refusal(503));
+  }
+  sodium_memzero(ask.password.data(), ask.password.size());
+}
+
+void Host::FinishSignIn(SignIns::Outcome outcome) {
+  if (!outcome.account) {
+    MARU_LOG("An attempt to sign in from %s failed", outcome.source.c_str());
+    return Reply(outcome.request, Refusal(401));
+  }
+  limits_.Succeeded(outcome.user, outcome.source);
+  const Account& account = *outcome.account;
+  const Session& session = sessions_.Begin(account.name, account.uid, account.stamp, Now());
+  Json::Value data;
+  data["user"] = account.name;
+  data["uid"] = account.uid;
+  data["is_admin"] = outcome.is_admin;
+  data["token"] = seal_.Seal({session.id, session.user, session.uid, session.expires});
+  Answer answer = Success(data);
+  answer.cookie = data["token"].asString();
+  Reply(outcome.request, answer);
+}
+
+Answer Host::Status() const {
+  Json::Value numbers;
+  numbers["children_busy"] = Json::UInt64{children_.Busy()};
+  numbers["children_idle"] = Json::UInt64{children_.Idle()};
+  numbers["children_forked"] = Json::UInt64{children_.Forked()};
+  numbers["sign_ins"] = Json::UInt64{sign_ins_.Count()};
+  numbers["sessions"] = Json::UInt64{sessions_.Count()};
+  return Success(numbers);
+}
+
+}  // namespace
+
+int RunHost(const Config& config, Descriptor control, Descriptor lifeline) {
+  try {
+    prctl(PR_SET_NAME, "maruweb-host");
+    MakePrivateMounts();
+    umask(077);
+    KeepHostCapabilities();
+    // Loads the name service's modules once, for all children.
+    FindAccount("root");
+    IsAdministrator("root");
+    errno = 0;
+    return Host(config, std::move(control), std::move(lifeline)).Run();
+  } catch (const std::exception& exception) {
+    MARU_LOG("The host cannot go on: %s", exception.what());
+    return 1;
+  }
+}
+
+}  // namespace maru::server

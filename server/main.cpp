@@ -1,0 +1,31 @@
+#include <CLI/CLI.hpp>
+#include <cstdio>
+#include <exception>
+#include <string>
+
+#include "platform/config.h"
+#include "platform/log.h"
+#include "server/supervisor.h"
+
+int main(int argc, char** argv) {
+  std::string path;
+  bool foreground = false;
+  CLI::App app("MaruSeeker's web server.", "maruwebd");
+  app.add_option("--config", path, "Configuration file")
+      ->check(CLI::ExistingFile)
+      ->type_name("FILE");
+  app.add_flag("--foreground", foreground, "Copy the log to standard error");
+  app.set_version_flag("--version", "maruwebd " MARU_VERSION);
+  CLI11_PARSE(app, argc, argv);
+  maru::OpenLog("maruwebd", foreground);
+  try {
+    maru::Config config = path.empty() ? maru::Config::Get() : maru::Config::Load(path);
+    if (config.plugin.empty()) config.plugin = MARU_PLUGIN;
+    if (config.page_dir.empty()) config.page_dir = MARU_PAGE_DIR;
+    return maru::server::RunSupervisor(config);
+  } catch (const std::exception& exception) {
+    MARU_LOG("Cannot start: %s", exception.what());
+    if (!foreground) fprintf(stderr, "maruwebd: %s\n", exception.what());
+    return 1;
+  }
+}

@@ -1,0 +1,76 @@
+#include "server/mounts.h"
+
+#include <errno.h>
+#include <sched.h>
+#include <sys/mount.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <set>
+#include <system_error>
+
+#include "platform/log.h"
+
+namespace maru::server {
+namespace {
+
+bool IsMountable(const ShareSettings& share) {
+  return share.available && !share.path.empty() && share.path[0] == '/' && !share.name.empty() &&
+         share.name[0] != '.' && share.name.find('/') == std::string::npos;
+}
+
+}  // namespace
+
+ShareMounts::ShareMounts() {
+  const auto demand = [](int result, const char* what) {
+    if (result < 0) throw std::system_error(errno, std::generic_category(), what);
+  };
+  demand(unshare(CLONE_NEWNS), "unshare");
+  demand(mount(nullptr, "/", nullptr, MS_REC | MS_SLAVE, nullptr), "mount /");
+  if (mkdir(kVolume, 0755) < 0 && errno != EEXIST) demand(-1, kVolume);
+  demand(mount("tmpfs", kVolume, "tmpfs", MS_NOSUID | MS_NODEV | MS_NOEXEC,
+               "mode=755,size=1m,nr_inodes=16384"),
+         kVolume);
+  demand(mount(nullptr, kVolume, nullptr, MS_SHARED, nullptr), kVolume);
+  errno = 0;
+}
+
+void ShareMounts::Apply(const ShareTable& table) {
+  std::set<std::string> wanted;
+  for (const ShareSettings& share : table.Shares())
+    if (IsMountable(share)) wanted.insert(share.name);
+  for (auto it = mounted_.begin(); it != mounted_.end();) {
+    const std::string name = (it++)->first;
+    if (!wanted.contains(name)) Unmount(name);
+  }
+  for (const ShareSettings& share : table.Shares())
+    if (wanted.contains(share.name)) Mount(share);
+}
+
+void ShareMounts::Mount(const ShareSettings& share) {
+  const auto found = mounted_.find(share.name);
+  const bool failed_before = found != mounted_.end() && found->second.empty();
+  if (found != mounted_.end() && !failed_before) {
+    if (found->second == share.path) return;
+    Unmount(share.name);
+  }
+  const std::string target = share.VolumePath();
+  const bool good =
+      (mkdir(target.c_str(), 0755) == 0 || errno == EEXIST) &&
+      mount(share.path.c_str(), target.c_str(), nullptr, MS_BIND | MS_REC, nullptr) == 0;
+  if (!good && !failed_before)
+    MARU_LOG("Share %s cannot be mounted from %s", share.name.c_str(), share.path.c_str());
+  if (good) errno = 0;
+  mounted_[share.name] = good ? share.path : std::string();
+}
+
+void ShareMounts::Unmount(const std::string& name) {
+  const std::string target = std::string(kVolume) + "/" + name;
+  if (!mounted_[name].empty() && umount2(target.c_str(), MNT_DETACH | UMOUNT_NOFOLLOW) < 0)
+    MARU_LOG("Share %s cannot be unmounted", name.c_str());
+  rmdir(target.c_str());
+  errno = 0;
+  mounted_.erase(name);
+}
+
+}  // namespace maru::server

@@ -1,0 +1,90 @@
+#include "server/names.h"
+
+#include <algorithm>
+#include <charconv>
+#include <cstdint>
+#include <cstdio>
+#include <optional>
+
+namespace maru::server {
+namespace {
+
+/// Of an escape \uXXXX.
+constexpr std::size_t kEscapeLength = 6;
+
+/// The length of the UTF-8 character at `at` (RFC 3629: no surrogates, nothing overlong), or 0.
+std::size_t CharacterLength(const std::string& text, std::size_t at) {
+  if (static_cast<std::uint8_t>(text[at]) < 0x80) return 1;
+  const auto byte = [&](std::size_t i) -> std::uint8_t {
+    return at + i < text.size() ? static_cast<std::uint8_t>(text[at + i]) : 0;
+  };
+  const auto follows = [&](std::size_t i) { return (byte(i) & 0xc0) == 0x80; };
+  const std::uint8_t first = byte(0), second = byte(1);
+  if (first < 0xc2 || first > 0xf4 || !follows(1)) return 0;
+  if (first < 0xe0) return 2;
+  if (first < 0xf0) {
+    if ((first == 0xe0 && second < 0xa0) || (first == 0xed && second >= 0xa0)) return 0;
+    return follows(2) ? 3 : 0;
+  }
+  if ((first == 0xf0 && second < 0x90) || (first == 0xf4 && second >= 0x90)) return 0;
+  return follows(2) && follows(3) ? 4 : 0;
+}
+
+/// The unit of the escape \uXXXX at `at`, or nothing when there is no such escape.
+std::optional<unsigned> EscapedUnit(const std::string& text, std::size_t at) {
+  unsigned unit = 0;
+  if (text.compare(at, 2, "\\u") != 0 || at + kEscapeLength > text.size()) return std::nullopt;
+  const char* end = text.data() + at + kEscapeLength;
+  if (std::from_chars(text.data() + at + 2, end, unit, 16).ptr != end) return std::nullopt;
+  return unit;
+}
+
+bool IsWithin(std::optional<unsigned> unit, unsigned first, unsigned last) {
+  return unit && *unit >= first && *unit <= last;
+}
+
+}  // namespace
+
+std::string HideBytes(std::string text) {
+  std::string result;
+  std::size_t run = 0;  // the start of what is good and not yet in the result
+  for (std::size_t at = 0; at < text.size();) {
+    const std::size_t length = CharacterLength(text, at);
+    if (length > 0) {
+      at += length;
+      continue;
+    }
+    char escaped[kEscapeLength + 1];
+    snprintf(escaped, sizeof(escaped), "\\udc%02x", static_cast<std::uint8_t>(text[at]));
+    result.append(text, run, at - run).append(escaped);
+    run = ++at;
+  }
+  if (run == 0) return text;
+  return result.append(text, run);
+}
+
+std::string RestoreBytes(const std::string& text) {
+  std::string result;
+  result.reserve(text.size());
+  std::size_t at = 0;
+  while (at < text.size()) {
+    const std::size_t escape = std::min(text.find('\\', at), text.size());
+    result.append(text, at, escape - at);
+    at = escape;
+    if (at == text.size()) break;
+    const auto unit = EscapedUnit(text, at);
+    if (IsWithin(unit, 0xdc80, 0xdcff)) {
+      result += static_cast<char>(*unit & 0xff);
+      at += kEscapeLength;
+      continue;
+    }
+    const bool pair = IsWithin(unit, 0xd800, 0xdbff) &&
+                      IsWithin(EscapedUnit(text, at + kEscapeLength), 0xdc00, 0xdfff);
+    const std::size_t length = pair ? 2 * kEscapeLength : unit ? kEscapeLength : 2;
+    result.append(text, at, length);
+    at += length;
+  }
+  return result;
+}
+
+}  // namespace maru::server

@@ -1,0 +1,14 @@
+#pragma once
+
+#include "platform/config.h"
+
+namespace maru::server {
+
+/// The web server as a whole: opens the listening socket, mounts the shares in a namespace of its
+/// own, starts the front and the host and stays with them. Ends, with everything it started, on
+/// SIGTERM and SIGINT (returns 0), and when one of the two ends by itself (logs that and returns
+/// 1). SIGHUP: looks at the shares at once and passes it on. Needs root. Throws std::runtime_error
+/// when it cannot start.
+int RunSupervisor(const Config& config);
+
+}  // namespace maru::server
