@@ -43,7 +43,7 @@ Catalog::Catalog(const std::string& index_folder, Counts& counts, FolderListener
     : writer_(index_folder),
       counts_(counts),
       listener_(listener),
-      last_commit_(std::chrono::steady_clock::now()),
+      last_commit_(std::chrono::steady_clock::now() - kCommitGap),
       is_fresh_(!writer_.HasRoot()) {}
 
 Catalog::~Catalog() {

@@ -2,7 +2,6 @@
 
 #include <fcntl.h>
 #include <signal.h>
-#include <sys/file.h>
 #include <sys/resource.h>
 
 #include <algorithm>
@@ -38,7 +37,7 @@ struct Options {
   bool quiet = false;
   bool foreground = false;
   std::vector<std::string> shares;
-  std::string config = Config::kDefaultPath;
+  std::string config;
   int crawl_hours = 24;
 };
 
@@ -55,7 +54,7 @@ void Describe(CLI::App& app, Options& options) {
   app.add_option("--crawl-hours", options.crawl_hours, "Hours between two comparing crawls")
       ->check(CLI::Range(1, 24 * 30))
       ->capture_default_str();
-  app.add_option("--config", options.config, "Configuration file")->capture_default_str();
+  app.add_option("--config", options.config, "Configuration file");
 }
 
 void BlockSignals(sigset_t& signals) {
@@ -77,7 +76,9 @@ UniqueFd LockState() {
   const std::string path = IndexHome() + "/.lock";
   UniqueFd lock(open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600));
   if (!lock) throw std::runtime_error("Cannot open " + path + ": " + std::strerror(errno));
-  if (flock(lock.Get(), LOCK_EX | LOCK_NB) != 0) {
+  struct flock whole {};
+  whole.l_type = F_WRLCK;
+  if (fcntl(lock.Get(), F_OFD_SETLK, &whole) != 0) {
     throw std::runtime_error("Another maruindexd is at work here (" + path + ")");
   }
   return lock;
@@ -122,7 +123,7 @@ int RunOnce(const Options& options, Workers& workers, const sigset_t& signals) {
 }
 
 int Run(const Options& options) {
-  Config::Load(options.config);
+  if (!options.config.empty()) Config::Load(options.config);
   OpenLog("maruindexd", options.foreground || options.once);
   const Sight sight = SettleIdentity();
   sigset_t signals;
