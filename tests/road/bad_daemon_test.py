@@ -69,7 +69,8 @@ class BadDaemonTest(road.RoadTest):
 
     def test_an_answer_that_fails_half_way_keeps_its_hits(self):
         hit = {"MARUMDPath": "/volume1/docs/welcome.txt", "MARUMDOwnerUserID": "0"}
-        behaviour = fake_daemon.replies({"total": 3}, hit, {"success": False, "error": {"code": 1, "msg": "x"}})
+        failure = {"success": False, "error": {"code": 1, "msg": "x"}}
+        behaviour = fake_daemon.replies({"total": 3}, hit, failure)
         with fake_daemon.FakeDaemon(behaviour):
             status, answer = self.search()
         self.assertEqual((200, 3, 1), (status, answer["data"]["total"], len(answer["data"]["hits"])))
@@ -92,26 +93,30 @@ class BadDaemonTest(road.RoadTest):
 
     def test_one_that_never_answers_blocks_nobody(self):
         """The time-out is a minute: all kinds of silence are waited for at once."""
-        results = {}
+        results = []
 
-        def ask(name):
-            path, request = METHODS[name]
-            results[name] = self.services.http("POST", path, request, self.token)
+        def ask(path, request):
+            results.append(self.services.http("POST", path, request, self.token))
 
-        for behaviour in (fake_daemon.silence, fake_daemon.stalled_message):
-            with fake_daemon.FakeDaemon(behaviour) as daemon:
-                threads = [threading.Thread(target=ask, args=(name,)) for name in METHODS]
-                for thread in threads:
-                    thread.start()
-                road.wait_until(lambda: len(daemon.requests) == len(METHODS), "all requests")
-                # Meanwhile others are served.
-                self.assertEqual(200, self.services.http("GET", "/session", token=self.token)[0])
-                self.assertEqual(200, self.services.http("GET", "/healthz")[0])
-                for thread in threads:
-                    thread.join()
-            for name, (status, answer) in results.items():
-                self.assertEqual((502, 121), (status, answer["error"]["code"]), name)
-            results.clear()
+        def behave(connection, request, ended):
+            is_search = request["command"] == "search"
+            stalls = not is_search or request["data"]["pre_query"]["keyword"] == "stall"
+            (fake_daemon.stalled_message if stalls else fake_daemon.silence)(connection, request, ended)
+
+        calls = [*METHODS.values(), (road.SEARCH_PATH, road.search_request("stall"))]
+        with fake_daemon.FakeDaemon(behave) as daemon:
+            threads = [threading.Thread(target=ask, args=call) for call in calls]
+            for thread in threads:
+                thread.start()
+            road.wait_until(lambda: len(daemon.requests) == len(calls), "all requests")
+            # Meanwhile others are served.
+            self.assertEqual(200, self.services.http("GET", "/session", token=self.token)[0])
+            self.assertEqual(200, self.services.http("GET", "/healthz")[0])
+            for thread in threads:
+                thread.join()
+        for status, answer in results:
+            self.assertEqual((502, 121), (status, answer["error"]["code"]))
+        self.assertEqual(len(calls), len(results))
         self.assert_next_works()
 
 

@@ -1,6 +1,7 @@
 #!/usr/bin/python3
 """Bursts of queries, of which the newest wins, and the history, which no answer waits for."""
 
+import contextlib
 import pathlib
 import pwd
 import sqlite3
@@ -12,6 +13,7 @@ import road
 
 BURST = 20
 ALICE = 60001
+HISTORY = road.STATE / "history.db"
 
 
 def processes_of(uid):
@@ -115,34 +117,25 @@ class HistoryTest(road.RoadTest):
         services.start_web()
         cls.token = services.sign_in("alice")
         road.search(services, cls.token, "first keyword")
-        road.wait_until(cls.databases, "the history's database")
+        road.wait_until(HISTORY.exists, "the history's database")
 
     @staticmethod
-    def databases():
-        """Files in the state folder that hold the history's table."""
-        found = []
-        for path in road.STATE.rglob("*"):
-            if path.is_file() and path.open("rb").read(16).startswith(b"SQLite format 3"):
-                with sqlite3.connect(f"file:{path}?mode=ro", uri=True) as database:
-                    if "search_history" in str(database.execute("SELECT name FROM sqlite_master").fetchall()):
-                        found.append(path)
-        return found
-
-    def keywords(self, uid=ALICE):
-        with sqlite3.connect(self.databases()[0], timeout=road.PATIENCE) as database:
+    def keywords(uid=ALICE):
+        database = sqlite3.connect(HISTORY, timeout=road.PATIENCE)
+        with contextlib.closing(database):
             rows = database.execute("SELECT keyword FROM search_history WHERE uid = ?"
                                     " ORDER BY create_time, id", (uid,)).fetchall()
         return [row[0] for row in rows]
 
     def test_the_service_writes_it(self):
         road.wait_until(lambda: "first keyword" in self.keywords(), "the keyword in the history")
-        self.assertEqual(pwd.getpwnam("MaruSeeker").pw_uid, self.databases()[0].stat().st_uid)
+        self.assertEqual(pwd.getpwnam("MaruSeeker").pw_uid, HISTORY.stat().st_uid)
         road.search(self.services, self.services.sign_in("bob"), "  of bob  ")
         road.wait_until(lambda: self.keywords(60002) == ["of bob"], "bob's keyword, trimmed")
         self.assertNotIn("of bob", self.keywords())
 
     def test_a_locked_database_delays_no_answer(self):
-        database = sqlite3.connect(self.databases()[0], timeout=road.PATIENCE, isolation_level=None)
+        database = sqlite3.connect(HISTORY, timeout=road.PATIENCE, isolation_level=None)
         database.execute("BEGIN EXCLUSIVE")
         # While the lock is held nothing can be written; the answer comes all the same.
         road.search(self.services, self.token, "while locked")

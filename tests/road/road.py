@@ -161,11 +161,7 @@ class Services:
 
     def http(self, verb, path, body=None, token=None):
         """One request; its HTTP status and its answer, parsed when it is JSON."""
-        connection = self.connect()
-        try:
-            return self.finish(self.begin(connection, verb, path, body, token))
-        finally:
-            connection.close()
+        return self.finish(self.begin(self.connect(), verb, path, body, token))
 
     @staticmethod
     def begin(connection, verb, path, body=None, token=None):
@@ -177,8 +173,9 @@ class Services:
 
     @staticmethod
     def finish(connection):
-        response = connection.getresponse()
-        text = response.read()
+        with contextlib.closing(connection):
+            response = connection.getresponse()
+            text = response.read()
         is_json = "json" in (response.getheader("Content-Type") or "")
         return response.status, json.loads(text) if is_json else text
 
