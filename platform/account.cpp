@@ -1,11 +1,12 @@
 #include "platform/account.h"
 
 #include <errno.h>
-#include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
 
 #include <algorithm>
+#include <new>
+#include <string_view>
 
 #include "platform/config.h"
 #include "platform/guard.h"
@@ -35,6 +36,14 @@ int ToRecord(const std::optional<Account>& account, MARUUSER** user) {
   memcpy(name, account->name.c_str(), size);
   *user = new (memory) MARUUSER{name, account->uid, account->gid, 0};
   return 0;
+}
+
+/// The account's own folder in the folder of all homes; it may be named differently from itself.
+std::string HomeFolder(const Account& account, const std::string& homes) {
+  std::string_view home = account.home;
+  while (home.ends_with('/')) home.remove_suffix(1);
+  if (!home.starts_with(homes + "/")) return account.name;
+  return std::string(home.substr(homes.size() + 1));
 }
 
 }  // namespace
@@ -71,12 +80,7 @@ int MARUServiceHomePathGet(const char* user_name, char* path, std::size_t size) 
     const auto table = maru::ShareTable::Current();
     const maru::ShareSettings* homes = table->Find(kHomes);
     if (!homes || !homes->available) return Fail(kErrNotFound, -1);
-    // The account may name its folder differently from itself.
-    const std::string base = homes->path + "/";
-    const std::string folder = account->home.starts_with(base) && account->home.size() > base.size()
-                                   ? account->home.substr(base.size())
-                                   : account->name;
-    const std::string home = homes->VolumePath() + "/" + folder;
+    const std::string home = homes->VolumePath() + "/" + HomeFolder(*account, homes->path);
     if (home.size() >= size) return Fail(kErrBadParameter, -1);
     memcpy(path, home.c_str(), home.size() + 1);
     return static_cast<int>(home.size());

@@ -29,7 +29,8 @@ void MARUUserFree(MARUUSER* user);
 bool MARUServiceUserHomeIsEnabled(int auth_type, const char* user_name);
 
 /// Writes the user's home folder as a volume path ("/volume1/homes/NAME") and returns its length,
-/// or -1 when the user is unknown, has no home there, or the path does not fit `size` bytes.
+/// or -1 when the user is unknown, there are no homes, or the path does not fit `size` bytes. The
+/// folder itself need not exist yet.
 int MARUServiceHomePathGet(const char* user_name, char* path, std::size_t size);
 
 /// 1 when the user is a member of the administrators' group (setting `admin_group`), by primary or

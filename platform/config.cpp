@@ -117,7 +117,7 @@ Config current;
 
 const Config& LoadLocked(const std::string& path, bool may_be_missing) {
   std::string text;
-  if (!ReadWholeFile(path, kMaxFile, text) && !(may_be_missing && errno == ENOENT)) {
+  if (!ReadWholeFile(path, kMaxFile, text, Link::kFollow) && !(may_be_missing && errno == ENOENT)) {
     throw std::runtime_error(path + ": " + strerror(errno));
   }
   current = Parse(path, text);

@@ -16,6 +16,7 @@
 
 #include "platform/guard.h"
 #include "platform/unique_fd.h"
+#include "platform/whole_file.h"
 
 namespace {
 
@@ -89,8 +90,8 @@ bool Copy(const char* source, const char* destination, bool overwrite) {
     errno = EINVAL;
     return false;
   }
-  std::string temporary = std::string(destination) + ".XXXXXX";
-  const maru::UniqueFd to(mkostemp(temporary.data(), O_CLOEXEC));
+  std::string temporary;
+  const maru::UniqueFd to = maru::NewFileBeside(destination, temporary);
   if (!to) return false;
   if (CopyContent(from.Get(), to.Get()) && CopyStatus(from.Get(), to.Get()) &&
       fsync(to.Get()) == 0 && Rename(temporary.c_str(), destination, overwrite)) {

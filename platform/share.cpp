@@ -2,10 +2,12 @@
 
 #include <errno.h>
 #include <fcntl.h>
+#include <stdlib.h>
 #include <string.h>
 #include <sys/stat.h>
 #include <sys/statvfs.h>
 
+#include <new>
 #include <string>
 
 #include "platform/account.h"
@@ -33,9 +35,14 @@ int AskSettings(const char* operation, const MARUSHARE* share, int* value, Ask a
   });
 }
 
+char* Duplicate(const std::string& text) {
+  char* copy = strdup(text.c_str());
+  if (!copy) throw std::bad_alloc();
+  return copy;
+}
+
 MARUSHARE* NewRecord(const ShareSettings& settings) {
-  return new MARUSHARE{strdup(settings.name.c_str()), strdup(settings.VolumePath().c_str()),
-                       settings.deny};
+  return new MARUSHARE{Duplicate(settings.name), Duplicate(settings.VolumePath()), settings.deny};
 }
 
 bool CopyText(std::string_view text, char* buffer, std::size_t size) {

@@ -45,7 +45,7 @@ Stamp StampOf(const std::string& path) {
 std::string ReadSettings(const Config& config) {
   if (!config.samba_config_canonical) return CanonicalSamba(config.samba_config);
   std::string text;
-  if (!ReadWholeFile(config.samba_config, kMaxFile, text)) {
+  if (!ReadWholeFile(config.samba_config, kMaxFile, text, Link::kFollow)) {
     throw std::runtime_error(config.samba_config + ": " + strerror(errno));
   }
   return text;
@@ -75,15 +75,19 @@ void KeepCopy(const Config& config, const std::string& text) {
 class ShareTableSource {
  public:
   std::shared_ptr<const ShareTable> Current() {
-    const std::lock_guard lock(mutex_);
     const Config& config = Config::Get();
-    if (table_ && frozen_) return table_;
-    const Stamp stamp = StampOf(config.samba_config);
-    const auto now = std::chrono::steady_clock::now();
-    if (table_ && stamp == stamp_ && now < read_again_) return table_;
-    stamp_ = stamp;
-    read_again_ = now + kReadAgain;
+    Stamp stamp;
+    if (auto table = Known(config, stamp)) return table;
+    const std::lock_guard reading(reading_);
+    if (auto table = Known(config, stamp)) return table;
+    {
+      // Other threads go on with the table there is, if any.
+      const std::lock_guard lock(mutex_);
+      stamp_ = stamp;
+      read_again_ = std::chrono::steady_clock::now() + kReadAgain;
+    }
     Read(config);
+    const std::lock_guard lock(mutex_);
     return table_;
   }
 
@@ -93,16 +97,30 @@ class ShareTableSource {
   }
 
  private:
+  /// Null when the settings are to be read; `stamp` is then what they are now.
+  std::shared_ptr<const ShareTable> Known(const Config& config, Stamp& stamp) {
+    const std::lock_guard lock(mutex_);
+    if (table_ && frozen_) return table_;
+    stamp = StampOf(config.samba_config);
+    const bool fresh = stamp == stamp_ && std::chrono::steady_clock::now() < read_again_;
+    return fresh ? table_ : nullptr;
+  }
+
   void Read(const Config& config) {
     try {
       std::string text = ReadSettings(config);
       if (table_ && table_->Error().empty() && text == text_) return;
-      table_ = std::make_shared<ShareTable>(ShareTable::Parse(text));
+      Take(std::make_shared<ShareTable>(ShareTable::Parse(text)));
       text_ = std::move(text);
       KeepCopy(config, text_);
     } catch (const std::exception& error) {
       Stay(config, error.what());
     }
+  }
+
+  void Take(std::shared_ptr<const ShareTable> table) {
+    const std::lock_guard lock(mutex_);
+    table_ = std::move(table);
   }
 
   /// Goes on with the last good table, or its copy, or none.
@@ -112,7 +130,7 @@ class ShareTableSource {
     MARU_LOG("The settings of the shares are not in force: %s", why.c_str());
     auto stale = std::make_shared<ShareTable>(table_ ? *table_ : Copy(config));
     stale->error_ = why;
-    table_ = std::move(stale);
+    Take(std::move(stale));
   }
 
   static ShareTable Copy(const Config& config) {
@@ -127,10 +145,13 @@ class ShareTableSource {
     }
   }
 
+  /// Held by the one thread that reads, which alone changes the table and its text.
+  std::mutex reading_;
+  std::string text_;
+  /// Guards what follows.
   std::mutex mutex_;
   bool frozen_ = false;
   std::shared_ptr<const ShareTable> table_;
-  std::string text_;
   Stamp stamp_;
   std::chrono::steady_clock::time_point read_again_;
 };

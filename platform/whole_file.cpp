@@ -6,8 +6,6 @@
 #include <stdlib.h>
 #include <sys/stat.h>
 
-#include "platform/unique_fd.h"
-
 namespace maru {
 namespace {
 
@@ -29,10 +27,10 @@ mode_t Umask() {
 
 }  // namespace
 
-bool ReadWholeFile(const std::string& path, std::size_t limit, std::string& text) {
+bool ReadWholeFile(const std::string& path, std::size_t limit, std::string& text, Link link) {
   // Without O_NONBLOCK a planted FIFO would hold the process here.
-  const UniqueFd file(
-      open(path.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+  const int no_link = link == Link::kRefuse ? O_NOFOLLOW : 0;
+  const UniqueFd file(open(path.c_str(), O_RDONLY | no_link | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
   if (!file) return false;
   struct stat status;
   if (fstat(file.Get(), &status) != 0) return false;
@@ -60,9 +58,15 @@ bool ReadWholeFile(const std::string& path, std::size_t limit, std::string& text
   return true;
 }
 
+UniqueFd NewFileBeside(const std::string& path, std::string& temporary) {
+  const std::size_t slash = path.rfind('/');
+  temporary = (slash == std::string::npos ? "" : path.substr(0, slash + 1)) + ".maru.XXXXXX";
+  return UniqueFd(mkostemp(temporary.data(), O_CLOEXEC));
+}
+
 bool WriteWholeFile(const std::string& path, std::string_view text, mode_t mode, uid_t owner) {
-  std::string temporary = path + ".XXXXXX";
-  const UniqueFd file(mkostemp(temporary.data(), O_CLOEXEC));
+  std::string temporary;
+  const UniqueFd file = NewFileBeside(path, temporary);
   if (!file) return false;
   const bool written =
       WriteAll(file.Get(), text) && fchmod(file.Get(), mode & ~Umask()) == 0 &&

@@ -5,13 +5,22 @@
 #include <string>
 #include <string_view>
 
+#include "platform/unique_fd.h"
+
 /// Small files, read and written whole. For this room.
 namespace maru {
 
-/// Reads a regular file of at most `limit` bytes without following a symbolic link in the last
-/// component. False with errno (ELOOP: a link, EINVAL: no regular file, EFBIG); `text` is then
-/// unchanged.
-bool ReadWholeFile(const std::string& path, std::size_t limit, std::string& text);
+/// Whether a symbolic link in the last component is followed: only where no user can plant one.
+enum class Link { kRefuse, kFollow };
+
+/// Reads a regular file of at most `limit` bytes. False with errno (ELOOP: a link, EINVAL: no
+/// regular file, EFBIG); `text` is then unchanged.
+bool ReadWholeFile(const std::string& path, std::size_t limit, std::string& text,
+                   Link link = Link::kRefuse);
+
+/// A new empty file of mode 0600 in the folder of `path`, under a short name of its own, to be
+/// renamed to it; `temporary` is its path. False with errno.
+UniqueFd NewFileBeside(const std::string& path, std::string& temporary);
 
 /// Writes a file so that a reader sees the old text or the new one, never a part. The file gets
 /// `mode` less the umask, and `owner` unless that is -1. False with errno; the old file then

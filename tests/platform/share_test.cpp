@@ -180,7 +180,7 @@ TEST_F(Samba, BadSettingsLeaveTheLastGoodOnes) {
 
 TEST_F(Samba, BadSettingsAtTheStartBringTheCopyBack) {
   NEEDS_ACCOUNTS();
-  Write("nothing");
+  Write("[photo\n");
   if (StatusOfChild([] { _exit(ShareTable::Current()->Shares().empty() ? 0 : 1); }) != 0) {
     GTEST_SKIP() << "needs a process that has read no settings yet";
   }
