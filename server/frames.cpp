@@ -63,7 +63,9 @@ ReceiveResult ReceivePacket(int socket, Packet& packet, Wait wait) {
   ssize_t received;
   do {
     received = recvmsg(socket, &message, flags);
-  } while (received < 0 && errno == EINTR);
+    // ECONNRESET comes once, ahead of what the other end has sent, when that end was closed before
+    // it had read everything: a refusal may well wait behind it.
+  } while (received < 0 && (errno == EINTR || errno == ECONNRESET));
   const int error = std::exchange(errno, 0);
   if (received < 0) return error == EAGAIN ? ReceiveResult::kNothing : ReceiveResult::kEnd;
   for (cmsghdr* header = CMSG_FIRSTHDR(&message); header; header = CMSG_NXTHDR(&message, header)) {

@@ -22,7 +22,7 @@ std::array<Key, 3> KeysOf(const std::string& user, const std::string& address) {
 }  // namespace
 
 bool SignInLimits::Admit(const std::string& user, const std::string& address, Seconds now) {
-  if (counters_.size() + 3 > kMaxCounters) Forget(now);
+  if (now >= next_forget_) Forget(now);
   if (counters_.size() + 3 > kMaxCounters) return false;
   const auto keys = KeysOf(user, address);
   for (const auto& [text, limit] : keys) {
@@ -45,6 +45,7 @@ void SignInLimits::Succeeded(const std::string& user, const std::string& address
 }
 
 void SignInLimits::Forget(Seconds now) {
+  next_forget_ = now + kWindow / 10;
   std::erase_if(counters_, [&](const auto& entry) { return now - entry.second.since >= kWindow; });
 }
 

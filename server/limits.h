@@ -37,6 +37,8 @@ class SignInLimits {
   void Forget(Seconds now);
 
   std::unordered_map<std::string, Counter> counters_;
+  /// The counters are looked through now and then only, however many attempts are made.
+  Seconds next_forget_ = 0;
 };
 
 }  // namespace maru::server

@@ -72,13 +72,13 @@ class SessionTable {
   /// Null when it has ended.
   Session* Find(const std::string& id);
   void End(const std::string& id) { sessions_.erase(id); }
-  /// Forgets what has expired.
+  /// Forgets what has expired; to be called now and then.
   void Expire(Seconds now);
   std::size_t Count() const { return sessions_.size(); }
 
   static constexpr Seconds kLifetime = 7 * 24 * 3600;
   static constexpr std::size_t kMaxPerUser = 100;
-  static constexpr std::size_t kMaxTotal = 10'000;
+  static constexpr std::size_t kMaxTotal = 5'000;
 
  private:
   bool IsOver(const Session& session, Seconds now) const;

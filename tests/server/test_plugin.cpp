@@ -73,8 +73,9 @@ void Inspect(APIRequest* request, APIResponse* response) {
   response->SetSuccess(data);
 }
 
-/// Sleeps `ms` milliseconds.
+/// Sleeps `ms` milliseconds as the user.
 void Slow(APIRequest* request, APIResponse* response) {
+  if (!ResetCredentialsByName(request->GetLoginUserName(), true)) return;
   usleep(static_cast<useconds_t>(IntOf(request, "ms")) * 1000);
   response->SetSuccess(IntOf(request, "ms"));
 }
