@@ -47,20 +47,22 @@ void Connection::Discard(const char* bytes, std::size_t count) {
 Connection::Input Connection::Take(std::string& line) {
   for (;;) {
     const std::size_t end = input_.find('\n', searched_);
-    if (end == std::string::npos ? input_.size() > kMaxRequest : end > kMaxRequest) {
-      discarded_ = input_.size();
-      line_too_long_ = end != std::string::npos;
+    const bool whole = end != std::string::npos;
+    if ((whole ? end : input_.size()) - begin_ > kMaxRequest) {
+      discarded_ = input_.size() - begin_;
+      line_too_long_ = whole;
       input_ = {};
     }
     if (line_too_long_ || (discarded_ > 0 && ended_)) return Input::kTooLong;
     if (discarded_ > 0) return Input::kNone;
-    if (end == std::string::npos) break;
-    line = input_.substr(0, end);
-    input_.erase(0, end + 1);
-    searched_ = 0;
-    if (input_.empty()) input_ = {};
+    if (!whole) break;
+    line.assign(input_, begin_, end - begin_);
+    begin_ = searched_ = end + 1;
     if (!IsBlankLine(line)) return Input::kLine;
   }
+  input_.erase(0, begin_);
+  if (input_.empty()) input_ = {};
+  begin_ = 0;
   searched_ = input_.size();
   if (!ended_) return Input::kNone;
   return IsBlankLine(input_) ? Input::kEnd : Input::kUnframed;

@@ -39,7 +39,7 @@ class Connection {
   /// The next line that is not blank, without its line break.
   Input Take(std::string& line);
   /// Whether part of a line has come.
-  bool WithinLine() const { return !input_.empty() || discarded_ > 0; }
+  bool WithinLine() const { return input_.size() > begin_ || discarded_ > 0; }
 
   void SetReply(std::string reply);
   /// Sends what the client takes now. False when the connection is broken.
@@ -59,7 +59,9 @@ class Connection {
   UniqueFd socket_;
   Identity caller_;
   std::string input_;
-  /// No line break before this.
+  /// Lines before this were taken.
+  std::size_t begin_ = 0;
+  /// No line break between there and this.
   std::size_t searched_ = 0;
   std::size_t discarded_ = 0;
   bool line_too_long_ = false;

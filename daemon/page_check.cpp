@@ -69,7 +69,7 @@ class Walk {
     if (!from.passable) return false;
     UniqueFd folder(
         openat(from.folder.Get(), name.c_str(), O_PATH | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
-    const bool passable = folder && Allows(from.folder.Get(), name, kACLExecute);
+    const bool passable = folder && Allows(folder.Get(), "", kACLExecute);
     way_.push_back({name, std::move(folder), passable});
     return passable;
   }

@@ -36,4 +36,9 @@ bool HasHungUp(int socket) {
   return poll(&state, 1, 0) > 0 && (state.revents & (POLLHUP | POLLERR | POLLNVAL)) != 0;
 }
 
+bool HasInput(int socket) {
+  pollfd state{socket, POLLIN, 0};
+  return poll(&state, 1, 0) > 0;
+}
+
 }  // namespace maru::daemon

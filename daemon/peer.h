@@ -13,4 +13,7 @@ bool IdentityOfPeer(int socket, uid_t service, Identity& identity);
 /// Whether the other side is gone altogether. (One that has merely said all it has to say is not.)
 bool HasHungUp(int socket);
 
+/// Whether there is something to be read.
+bool HasInput(int socket);
+
 }  // namespace maru::daemon

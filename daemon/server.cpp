@@ -6,6 +6,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <exception>
 #include <system_error>
 
 #include "common/error.h"
@@ -35,12 +36,12 @@ Server::Server(Core& core, int listening, uid_t service, const Limits& limits)
       limits_(limits),
       poll_(epoll_create1(EPOLL_CLOEXEC)),
       wake_(eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {
-  if (!poll_ || !wake_) {
+  if (!poll_ || !wake_ || !Watch(listening_, EPOLLIN, EPOLL_CTL_ADD) ||
+      !Watch(wake_.Get(), EPOLLIN, EPOLL_CTL_ADD)) {
     throw std::system_error(errno, std::generic_category(), "Cannot wait for connections");
   }
+  finished_.reserve(limits.connections + limits.reserved);
   core_.server_status = [this](Json::Value& status) { AddStatus(status); };
-  Watch(listening_, EPOLLIN, EPOLL_CTL_ADD);
-  Watch(wake_.Get(), EPOLLIN, EPOLL_CTL_ADD);
   const unsigned threads =
       limits.workers ? limits.workers : std::max(4u, 2 * std::thread::hardware_concurrency());
   workers_ = std::make_unique<Workers>(threads);
@@ -58,13 +59,18 @@ void Server::Stop() {
   [[maybe_unused]] const ssize_t written = write(wake_.Get(), &one, sizeof one);
 }
 
-void Server::Watch(int descriptor, unsigned events, int operation) {
+bool Server::Watch(int descriptor, unsigned events, int operation) {
   epoll_event event{};
   event.events = events;
   event.data.fd = descriptor;
-  if (epoll_ctl(poll_.Get(), operation, descriptor, &event) != 0) {
-    throw std::system_error(errno, std::generic_category(), "Cannot watch a connection");
-  }
+  return epoll_ctl(poll_.Get(), operation, descriptor, &event) == 0;
+}
+
+/// Until it can be read or written once.
+void Server::Await(Connection& connection, Connection::State state) {
+  connection.state = state;
+  const unsigned events = state == Connection::State::kReading ? EPOLLIN : EPOLLOUT;
+  if (!Watch(connection.Socket(), events | EPOLLONESHOT, EPOLL_CTL_MOD)) Close(connection);
 }
 
 void Server::Run() {
@@ -85,11 +91,20 @@ void Server::Run() {
 }
 
 void Server::OnEvent(int descriptor) {
-  if (descriptor == listening_) return Accept();
-  if (descriptor == wake_.Get()) return TakeFinished();
-  const auto found = connections_.find(descriptor);
-  if (found == connections_.end()) return;
-  Connection& connection = *found->second;
+  try {
+    if (descriptor == listening_) return Accept();
+    if (descriptor == wake_.Get()) return TakeFinished();
+    const auto found = connections_.find(descriptor);
+    if (found != connections_.end()) OnConnection(*found->second);
+  } catch (const std::exception& error) {
+    MARU_LOG("Connection failed: %s", error.what());
+    const auto found = connections_.find(descriptor);
+    if (found == connections_.end()) return;
+    if (found->second->state != Connection::State::kWorking) Close(*found->second);
+  }
+}
+
+void Server::OnConnection(Connection& connection) {
   if (connection.state == Connection::State::kWriting) return Deliver(connection);
   if (connection.state != Connection::State::kReading) return;
   if (connection.Receive()) {
@@ -119,7 +134,7 @@ void Server::Accept() {
       continue;
     }
     const int descriptor = socket.Get();
-    Watch(descriptor, EPOLLIN | EPOLLONESHOT, EPOLL_CTL_ADD);
+    if (!Watch(descriptor, EPOLLIN | EPOLLONESHOT, EPOLL_CTL_ADD)) continue;
     connections_[descriptor] = std::make_unique<Connection>(std::move(socket), std::move(caller));
     open_ = connections_.size();
   }
@@ -143,6 +158,7 @@ bool Server::GiveWay(const Identity* only) {
   for (const auto& [descriptor, connection] : connections_) {
     if (connection->state != Connection::State::kReading || connection->since > latest) continue;
     if (only && connection->Caller().uid != only->uid) continue;
+    if (HasInput(connection->Socket())) continue;
     if (!longest || connection->since < longest->since) longest = connection.get();
   }
   if (longest) Close(*longest);
@@ -167,13 +183,11 @@ void Server::Proceed(Connection& connection) {
     case Connection::Input::kEnd:
       return Close(connection);
     case Connection::Input::kNone:
-      connection.state = Connection::State::kReading;
-      return Watch(connection.Socket(), EPOLLIN | EPOLLONESHOT, EPOLL_CTL_MOD);
+      return Await(connection, Connection::State::kReading);
   }
 }
 
 void Server::Start(Connection& connection, std::string line) {
-  connection.state = Connection::State::kWorking;
   workers_->Add(connection.Caller().uid, [this, &connection, line = std::move(line)] {
     Carry(connection, line);
     {
@@ -183,10 +197,11 @@ void Server::Start(Connection& connection, std::string line) {
     const std::uint64_t one = 1;
     [[maybe_unused]] const ssize_t written = write(wake_.Get(), &one, sizeof one);
   });
+  connection.state = Connection::State::kWorking;
 }
 
 /// In a worker. What cannot be sent at once is left to the loop.
-void Server::Carry(Connection& connection, const std::string& line) {
+void Server::Carry(Connection& connection, const std::string& line) noexcept {
   const auto deadline = Clock::now() + limits_.answer;
   const Cancelled cancelled = [&] {
     return stopped_ || Clock::now() > deadline || HasHungUp(connection.Socket());
@@ -201,9 +216,14 @@ void Server::Carry(Connection& connection, const std::string& line) {
     }
     reply += LineOf(message);
   };
-  Answer(core_, connection.Caller(), line, output, cancelled);
-  connection.SetReply(std::move(reply));
-  connection.Flush();
+  try {
+    Answer(core_, connection.Caller(), line, output, cancelled);
+    connection.SetReply(std::move(reply));
+    connection.Flush();
+  } catch (const std::exception& error) {
+    MARU_LOG("Request failed: %s", error.what());
+    connection.last = true;
+  }
 }
 
 void Server::TakeFinished() {
@@ -212,7 +232,8 @@ void Server::TakeFinished() {
   std::vector<Connection*> finished;
   {
     const std::lock_guard lock(finished_mutex_);
-    finished.swap(finished_);
+    finished = finished_;
+    finished_.clear();
   }
   for (Connection* connection : finished) Deliver(*connection);
 }
@@ -239,7 +260,7 @@ void Server::Deliver(Connection& connection) {
       return Close(connection);
     }
   }
-  Watch(connection.Socket(), EPOLLOUT | EPOLLONESHOT, EPOLL_CTL_MOD);
+  Await(connection, Connection::State::kWriting);
 }
 
 std::size_t Server::UnreadOf(uid_t user) const {
@@ -263,10 +284,7 @@ void Server::EndOverdue() {
     row = overdue ? connections_.erase(row) : std::next(row);
   }
   open_ = connections_.size();
-  if (!accepting_) {
-    Watch(listening_, EPOLLIN, EPOLL_CTL_MOD);
-    accepting_ = true;
-  }
+  if (!accepting_) accepting_ = Watch(listening_, EPOLLIN, EPOLL_CTL_MOD);
 }
 
 void Server::AddStatus(Json::Value& status) const {

@@ -42,7 +42,8 @@ class Server {
   Server(const Server&) = delete;
   Server& operator=(const Server&) = delete;
 
-  /// Serves until Stop. Throws std::system_error when the loop cannot go on.
+  /// Serves until Stop. A fault on one connection ends that connection. Throws std::system_error
+  /// when the kernel lets it wait no longer.
   void Run();
   /// From any thread or signal handler: Run returns soon, requests under way are given up.
   void Stop();
@@ -51,16 +52,19 @@ class Server {
   using Clock = std::chrono::steady_clock;
   using Connections = std::map<int, std::unique_ptr<Connection>>;
 
-  void Watch(int descriptor, unsigned events, int operation);
+  /// False with errno.
+  bool Watch(int descriptor, unsigned events, int operation);
+  void Await(Connection& connection, Connection::State state);
   void Accept();
   bool MakeRoom(const Identity& caller);
   bool GiveWay(const Identity* only);
   void OnEvent(int descriptor);
+  void OnConnection(Connection& connection);
   void Close(Connection& connection);
   /// What comes next on a connection that has no request under way.
   void Proceed(Connection& connection);
   void Start(Connection& connection, std::string line);
-  void Carry(Connection& connection, const std::string& line);
+  void Carry(Connection& connection, const std::string& line) noexcept;
   void Refuse(Connection& connection, const std::string& why);
   void Deliver(Connection& connection);
   void TakeFinished();
@@ -80,6 +84,7 @@ class Server {
   std::atomic<std::uint64_t> carried_ = 0;
   Connections connections_;
   std::mutex finished_mutex_;
+  /// Has room for all connections, so that reporting never fails.
   std::vector<Connection*> finished_;
   /// Last, so that its threads end before anything they use.
   std::unique_ptr<Workers> workers_;

@@ -176,7 +176,7 @@ TEST_F(ServerTest, FramesLinesHoweverTheyArrive) {
   EXPECT_TRUE(client.Receive()["success"].asBool());
   EXPECT_EQ(client.Receive()["error"]["code"].asInt(), 120);
   EXPECT_TRUE(client.Receive()["success"].asBool());
-  client.Send(std::string(kStatus) + "\n");
+  client.Send(std::string(3u << 20, '\n') + kStatus + "\n");
   client.NoMore();
   EXPECT_TRUE(client.Receive()["success"].asBool()) << "one who has said all still gets the answer";
   EXPECT_TRUE(client.Receive().isNull());
