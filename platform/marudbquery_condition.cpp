@@ -87,6 +87,10 @@ std::string StatementText::Column(const std::string& name) const {
 }
 
 std::string StatementText::Bind(const Value& value) {
+  const auto* text = std::get_if<std::string>(&value);
+  if (text && !session_.IsSQLite() && text->find('\0') != std::string::npos) {
+    throw std::runtime_error("PostgreSQL keeps no NUL in a text");  // it would cut it short
+  }
   values_.push_back(value);
   // SQLite looks names up one by one; thousands of values need nameless places.
   return session_.IsSQLite() ? "?" : ":v" + std::to_string(values_.size());

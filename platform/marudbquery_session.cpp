@@ -40,12 +40,23 @@ void PrepareSQLite(soci::session& database) {
   }
 }
 
+/// Two processes that create a thing at once make one of them fail; the second time it is there.
+void RunTwiceAtMost(soci::session& database, const std::string& statement) {
+  try {
+    database << statement;
+  } catch (const soci::soci_error&) {
+    database << statement;
+  }
+}
+
 void RunSchema(soci::session& database, std::string_view schema) {
   while (!schema.empty()) {
     const std::size_t end = std::min(schema.find(';'), schema.size());
     const std::string statement(schema.substr(0, end));
     schema.remove_prefix(std::min(end + 1, schema.size()));
-    if (statement.find_first_not_of(" \n") != std::string::npos) database << statement;
+    if (statement.find_first_not_of(" \n") != std::string::npos) {
+      RunTwiceAtMost(database, statement);
+    }
   }
 }
 
@@ -101,7 +112,11 @@ soci::session& Session::Open() {
   state_->Forget();
   if (state_->database) return *state_->database;
   auto database = Connect(state_->backend, state_->connection);
-  if (IsSQLite()) PrepareSQLite(*database);
+  if (IsSQLite()) {
+    PrepareSQLite(*database);
+  } else {
+    *database << "SET client_min_messages = warning";  // the rest would go to standard error
+  }
   RunSchema(*database, state_->schema);
   state_->database = std::move(database);
   state_->owner = getpid();
