@@ -1,7 +1,6 @@
 #include "indexer/privileges.h"
 
 #include <cap-ng.h>
-#include <sys/prctl.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -13,6 +12,7 @@
 
 #include "platform/account.h"
 #include "platform/config.h"
+#include "platform/service_identity.h"
 
 namespace maru::indexer {
 namespace {
@@ -50,16 +50,6 @@ void MakeFolders(const Account* owner) {
   MakeFolder(Config::Get().state_dir + "/index", owner);
 }
 
-void Become(const Account& account) {
-  capng_clear(CAPNG_SELECT_BOTH);
-  capng_update(CAPNG_ADD, static_cast<capng_type_t>(CAPNG_EFFECTIVE | CAPNG_PERMITTED),
-               CAP_DAC_READ_SEARCH);
-  const auto flags = static_cast<capng_flags_t>(CAPNG_DROP_SUPP_GRP | CAPNG_CLEAR_BOUNDING);
-  if (capng_change_id(static_cast<int>(account.uid), static_cast<int>(account.gid), flags) != 0) {
-    throw std::runtime_error("Cannot become the service account");
-  }
-}
-
 bool ReadsEverything() {
   return capng_get_caps_process() == 0 &&
          capng_have_capability(CAPNG_EFFECTIVE, CAP_DAC_READ_SEARCH) == 1;
@@ -71,12 +61,10 @@ Sight SettleIdentity() {
   if (geteuid() == 0) {
     const Account account = ServiceAccount();
     MakeFolders(&account);
-    Become(account);
+    BecomeForGood(Config::Get().service_account, Kept::kReadSearch);
   } else {
     MakeFolders(nullptr);
-  }
-  if (prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) != 0) {
-    throw std::runtime_error("Cannot give up new privileges");
+    GiveUpNewPrivileges();
   }
   return ReadsEverything() ? Sight::kAll : Sight::kOwn;
 }

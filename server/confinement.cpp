@@ -4,18 +4,16 @@
 #include <dirent.h>
 #include <errno.h>
 #include <fcntl.h>
-#include <grp.h>
-#include <pwd.h>
 #include <sched.h>
 #include <sys/mount.h>
-#include <sys/prctl.h>
 #include <sys/stat.h>
 #include <time.h>
 #include <unistd.h>
 
 #include <memory>
-#include <stdexcept>
 #include <system_error>
+
+#include "platform/service_identity.h"
 
 namespace maru::server {
 namespace {
@@ -59,25 +57,7 @@ void KeepHostCapabilities() {
          "capng_updatev");
   // The bounding set goes while setpcap is still there to cut it.
   Demand(capng_apply(CAPNG_SELECT_BOTH) == 0, "capng_apply");
-  Demand(prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) == 0, "no_new_privs");
-}
-
-void BecomeWebAccount(const std::string& account) {
-  const passwd* entry = getpwnam(account.c_str());
-  if (!entry || entry->pw_uid == 0)
-    throw std::runtime_error("there is no account " + account + " for the web server's front");
-  const uid_t uid = entry->pw_uid;
-  const gid_t gid = entry->pw_gid;
-  capng_clear(CAPNG_SELECT_BOTH);
-  Demand(capng_apply(CAPNG_SELECT_BOUNDS) == 0, "capng_apply");
-  Demand(setgroups(0, nullptr) == 0, "setgroups");
-  Demand(setresgid(gid, gid, gid) == 0, "setresgid");
-  Demand(setresuid(uid, uid, uid) == 0, "setresuid");
-  Demand(capng_apply(CAPNG_SELECT_CAPS) == 0, "capng_apply");
-  Demand(prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) == 0, "no_new_privs");
-  errno = 0;
-  if (setresuid(0, 0, 0) == 0) throw std::runtime_error("the front can become root again");
-  errno = 0;
+  GiveUpNewPrivileges();
 }
 
 }  // namespace maru::server

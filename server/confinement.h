@@ -1,8 +1,6 @@
 #pragma once
 
-#include <string>
-
-/// What the front and the host give up before they meet a request. Each function throws
+/// What the host gives up before it meets a request. Each function throws
 /// std::system_error when the kernel refuses; the process must then not go on.
 namespace maru::server {
 
@@ -17,9 +15,5 @@ void SweepPrivateTmp();
 /// Root without any power but to become users, read their files, end their processes and give files
 /// away; also for everything this process will ever start.
 void KeepHostCapabilities();
-
-/// Turns into the account for good: no root, no groups but its own, no capabilities, none to gain
-/// by running programs.
-void BecomeWebAccount(const std::string& account);
 
 }  // namespace maru::server

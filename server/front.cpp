@@ -18,7 +18,7 @@
 #include <stdexcept>
 
 #include "platform/log.h"
-#include "server/confinement.h"
+#include "platform/service_identity.h"
 #include "server/connection.h"
 
 namespace maru::server {
@@ -119,7 +119,7 @@ int Serve(const Config& config, Descriptor listener, Descriptor control, Descrip
   Front front(config, std::move(control));
   PrepareTls(front);
   RaiseDescriptorLimit();
-  BecomeWebAccount(config.web_account);
+  BecomeForGood(config.web_account, Kept::kNothing);
   if (sodium_init() < 0) throw std::runtime_error("libsodium cannot start");
   front.pages = Pages::Load(config.page_dir);
 
