@@ -281,7 +281,7 @@ void Crawler::SubmitFile(int place, Folder& folder, const Found& found) {
     if (!job.file) ++counts_.failed;
   }
   job.stamp = found.KeptStamp();
-  while (!lane_.HasRoom(job)) Complete(*lane_.Take(true));
+  while (!lane_.HasRoom()) Complete(*lane_.Take(true));
   job.folder = &catalog_.Open(folder.id);
   lane_.Submit(std::move(job));
 }

@@ -12,8 +12,9 @@ namespace maru::indexer {
 namespace {
 
 constexpr std::size_t kMaxUnderWay = 128;
-/// Bytes of text under way in a lane; prepared, each becomes several.
-constexpr std::size_t kMaxCost = 8u << 20;
+/// Bytes of files under way in a lane, beside one large one. Prepared, each becomes ten or more where
+/// all words differ.
+constexpr std::size_t kMaxCost = 2u << 20;
 constexpr std::size_t kNameCost = 4u << 10;
 
 /// A text that the index refuses costs the file its text only.
@@ -121,9 +122,9 @@ std::size_t Lane::Cost(const Job& job) const {
          static_cast<std::size_t>(std::min<std::uint64_t>(job.document.size, workers_.max_text_));
 }
 
-bool Lane::HasRoom(const Job& job) const {
+bool Lane::HasRoom() const {
   if (under_way_ == 0) return true;
-  return under_way_ < kMaxUnderWay && cost_ + Cost(job) <= kMaxCost;
+  return under_way_ < kMaxUnderWay && cost_ < kMaxCost;
 }
 
 void Lane::Submit(Job job) {

@@ -82,7 +82,7 @@ class Lane {
   Lane& operator=(const Lane&) = delete;
 
   /// Whether one more job fits.
-  bool HasRoom(const Job& job) const;
+  bool HasRoom() const;
   void Submit(Job job);
   /// A finished one, in no order; with `wait` it waits for one while any is under way.
   std::optional<Result> Take(bool wait);
