@@ -108,6 +108,17 @@ int Serve(const Task& task, int socket, Packet& packet, const Plugin& plugin) {
   return 0;
 }
 
+/// Goes the road of a request once, off any request's time: most of what a fresh process spends on
+/// its first request is the kernel's copying of the pages it touches.
+void WarmUp() {
+  FindAccount("root");
+  IsAdministrator("root");
+  Json::Value params;
+  ParseParams(R"({"warm": ["up", 1, {}]})", params);
+  Success(params);
+  errno = 0;
+}
+
 }  // namespace
 
 Descriptor KeepOnly(Descriptor kept) {
@@ -127,6 +138,7 @@ void RunRequestChild(Descriptor tasks, const Plugin& plugin) {
   prctl(PR_SET_NAME, "maruweb-request");
   LimitMemory();
   ShareTable::Freeze();
+  WarmUp();
   Packet packet;
   if (ReceivePacket(tasks.Get(), packet, Wait::kYes) != ReceiveResult::kPacket) _exit(0);
   const auto task = UnpackTask(packet.View());

@@ -21,6 +21,8 @@ class Children {
 
   /// Whether a child is to be forked ahead, now that there is nothing else to do.
   bool WantsMore(Seconds now) const { return idle_.size() < kAhead && now >= not_before_; }
+  /// Whether the next requests may find no child ready.
+  bool RunsShort() const { return idle_.size() <= kShort; }
   void ForkAhead(Seconds now);
   /// Lets the idle children go, since the shares have changed.
   void Renew() { idle_.clear(); }
@@ -47,7 +49,8 @@ class Children {
   std::size_t Busy() const { return busy_.size(); }
   std::uint64_t Forked() const { return forked_; }
 
-  static constexpr std::size_t kAhead = 4;
+  static constexpr std::size_t kAhead = 8;
+  static constexpr std::size_t kShort = 2;
   static constexpr std::size_t kMaxBusy = 256;
   static constexpr Seconds kMaxSeconds = 300;
 

@@ -27,6 +27,9 @@ namespace {
 
 constexpr unsigned kMaxPerSession = 64;
 constexpr int kTickMilliseconds = 2000;
+/// Forking takes a core for a while, which a request under way may need: children are forked ahead
+/// when nothing has happened for so long, or when they run short.
+constexpr int kQuietMilliseconds = 2;
 constexpr Seconds kSweepEvery = 600;
 constexpr Seconds kGrace = 2;
 
@@ -90,9 +93,9 @@ int Host::Run() {
   const char ready = '1';
   if (write(lifeline_.Get(), &ready, 1) != 1) return 1;
   while (!over_) {
-    // Children are forked ahead only when no request waits.
     const bool fork_ahead = !end_ && children_.WantsMore(Now());
-    const auto events = poller_.Wait(fork_ahead ? 0 : kTickMilliseconds);
+    const int quiet = children_.RunsShort() ? 0 : kQuietMilliseconds;
+    const auto events = poller_.Wait(fork_ahead ? quiet : kTickMilliseconds);
     for (const epoll_event& event : events) Handle(event);
     if (events.empty() && fork_ahead) children_.ForkAhead(Now());
     if (Now() >= next_tick_) Tick();
