@@ -40,8 +40,8 @@ NodePointer Join(Kind kind, const NodePointer& a, const NodePointer& b) {
 }
 
 bool IsOperator(std::string_view op) {
-  constexpr std::array<std::string_view, 6> kOperators{"=", "!=", "<", "<=", ">", ">="};
-  return std::find(kOperators.begin(), kOperators.end(), op) != kOperators.end();
+  constexpr std::array<std::string_view, 6> operators{"=", "!=", "<", "<=", ">", ">="};
+  return std::find(operators.begin(), operators.end(), op) != operators.end();
 }
 
 }  // namespace

@@ -51,10 +51,11 @@ class Credentials : public testing::Test {
  protected:
   void SetUp() override {
     NEEDS_ACCOUNTS();
-    ASSERT_EQ(chown(folder_.Write("alices", "").c_str(), 60001, 60001), 0);
-    ASSERT_EQ(chown(folder_.Write("family", "").c_str(), 60002, 60101), 0);
-    chmod((folder_ / "alices").c_str(), 0600);
-    chmod((folder_ / "family").c_str(), 0040);
+    // The mode first: afterwards the file may be out of reach.
+    chmod(folder_.Write("alices", "").c_str(), 0600);
+    chmod(folder_.Write("family", "").c_str(), 0040);
+    ASSERT_EQ(chown((folder_ / "alices").c_str(), 60001, 60001), 0);
+    ASSERT_EQ(chown((folder_ / "family").c_str(), 60002, 60101), 0);
   }
   TempFolder folder_;
 };
@@ -130,6 +131,9 @@ TEST_F(Credentials, ChangeNothingWhenTheyFail) {
 
 /// The way forth breaks off half-way, for want of the right to set groups.
 TEST_F(Credentials, AreNeverHalfSwitched) {
+#ifdef __SANITIZE_THREAD__
+  GTEST_SKIP() << "the sanitizer has a thread of its own, which keeps its rights";
+#endif
   EXPECT_EQ(StatusOfChild([] {
               const Ids before = Now();
               DropAllBut(1u << CAP_SETUID);
