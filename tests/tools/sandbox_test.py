@@ -45,7 +45,7 @@ class SandboxTest(unittest.TestCase):
             self.assertEqual(7, result.returncode)
             self.assertIn("a file\n", result.stdout)
             self.assertIn("path = /mnt/docs-2", result.stdout)
-            self.assertEqual(2, result.stdout.count("Read-only file system"))
+            self.assertEqual(2, result.stdout.count("Read-only file system"), result.stdout)
             self.assertEqual(["a file"], os.listdir(named))
         for trace in ("/volume1", folder + "x", "/etc/new"):
             self.assertFalse(os.path.exists(trace), trace)
