@@ -63,11 +63,11 @@ int Walk(const maru::Identity& who, const std::string& folder, std::string_view 
 
 int MARUACLPermGet(const char* path, unsigned int* bits) {
   if (!path || !bits || faccessat(AT_FDCWD, path, F_OK, AT_EACCESS) != 0) return -1;
+  const maru::KeepErrno keep;
   *bits = 0;
   if (faccessat(AT_FDCWD, path, R_OK, AT_EACCESS) == 0) *bits |= kACLRead;
   if (faccessat(AT_FDCWD, path, W_OK, AT_EACCESS) == 0) *bits |= kACLWrite;
   if (faccessat(AT_FDCWD, path, X_OK, AT_EACCESS) == 0) *bits |= kACLExecute;
-  errno = 0;
   return 0;
 }
 

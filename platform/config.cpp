@@ -8,6 +8,7 @@
 #include <stdexcept>
 #include <string_view>
 
+#include "platform/guard.h"
 #include "platform/text.h"
 #include "platform/whole_file.h"
 
@@ -116,6 +117,7 @@ bool loaded = false;
 Config current;
 
 const Config& LoadLocked(const std::string& path, bool may_be_missing) {
+  const KeepErrno keep;
   std::string text;
   if (!ReadWholeFile(path, kMaxFile, text, Link::kFollow) && !(may_be_missing && errno == ENOENT)) {
     throw std::runtime_error(path + ": " + strerror(errno));

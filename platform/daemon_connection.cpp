@@ -25,6 +25,12 @@ bool Refuse(int error) {
   return false;
 }
 
+/// What was tried on the way to success leaves no trace.
+bool Done(int errno_before) {
+  errno = errno_before;
+  return true;
+}
+
 Clock::time_point After(int milliseconds) {
   return Clock::now() + std::chrono::milliseconds(milliseconds);
 }
@@ -73,6 +79,7 @@ void SockConnection::Disconnect() {
 }
 
 bool SockConnection::Send(const std::string& message) {
+  const int before = errno;
   if (descriptor_ < 0) return Refuse(ENOTCONN);
   if (message.size() > kMaxMessage) return Refuse(EMSGSIZE);
   if (message.find('\n') != std::string::npos) return Refuse(EINVAL);
@@ -88,10 +95,11 @@ bool SockConnection::Send(const std::string& message) {
       return false;
     }
   }
-  return true;
+  return Done(before);
 }
 
 bool SockConnection::Recv(std::string& message) {
+  const int before = errno;
   if (descriptor_ < 0) return Refuse(ENOTCONN);
   const auto deadline = After(kReceiveTimeout);
   for (std::size_t searched = 0;;) {
@@ -100,7 +108,7 @@ bool SockConnection::Recv(std::string& message) {
     if (end != std::string::npos) {
       message.assign(received_, 0, end);
       received_.erase(0, end + 1);
-      return true;
+      return Done(before);
     }
     const std::size_t size = searched = received_.size();
     received_.resize(size + kChunk);
@@ -115,6 +123,7 @@ bool SockConnection::Recv(std::string& message) {
 }
 
 bool DomainSockConnection::Connect() {
+  const int before = errno;
   Disconnect();
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
@@ -126,7 +135,7 @@ bool DomainSockConnection::Connect() {
     return false;
   }
   descriptor_ = socket_file.Release();
-  return true;
+  return Done(before);
 }
 
 }  // namespace marudaemon

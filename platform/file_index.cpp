@@ -1,6 +1,5 @@
 #include "platform/file_index.h"
 
-#include <errno.h>
 #include <string.h>
 #include <sys/stat.h>
 
@@ -39,6 +38,7 @@ bool IsName(const char* name) {
 namespace maruseeker::fileindex {
 
 std::set<std::string> FolderMgr::GetIndexedShares() const {
+  const maru::KeepErrno keep;
   std::set<std::string> names;
   const auto table = maru::ShareTable::Current();
   for (const maru::ShareSettings& share : table->Shares()) {
@@ -47,7 +47,6 @@ std::set<std::string> FolderMgr::GetIndexedShares() const {
       names.insert(share.name);
     }
   }
-  errno = 0;
   return names;
 }
 

@@ -6,6 +6,7 @@
 #include <syslog.h>
 #include <unistd.h>
 
+#include <new>
 #include <string>
 #include <system_error>
 
@@ -45,16 +46,20 @@ std::string Printable(const std::string& text) {
 
 }  // namespace
 
-void LogLine(const char* file, int line, const char* function, const char* format, ...) {
+void LogLine(const char* file, int line, const char* function, const char* format, ...) noexcept {
   const int error = errno;
   va_list arguments;
   va_start(arguments, format);
-  const std::string message = Printable(Format(format, arguments));
+  try {
+    const std::string message = Printable(Format(format, arguments));
+    const std::string cause =
+        error ? " [err: " + std::generic_category().message(error) + "]" : std::string();
+    syslog(LOG_ERR, "%s:%d (%d, %u) (%s) %s%s", file, line, getpid(), geteuid(), function,
+           message.c_str(), cause.c_str());
+  } catch (const std::bad_alloc&) {
+    syslog(LOG_ERR, "%s:%d (%d, %u) (%s) %s", file, line, getpid(), geteuid(), function, format);
+  }
   va_end(arguments);
-  const std::string cause =
-      error ? " [err: " + std::generic_category().message(error) + "]" : std::string();
-  syslog(LOG_ERR, "%s:%d (%d, %u) (%s) %s%s", file, line, getpid(), geteuid(), function,
-         message.c_str(), cause.c_str());
   errno = 0;
 }
 

@@ -11,7 +11,8 @@ namespace maru {
 
 /// Writes one line; called through MARU_LOG only. Control characters in the message are written as
 /// #ooo (octal), so that no text from outside can forge a line or drive a terminal. Thread-safe.
-void LogLine(const char* file, int line, const char* function, const char* format, ...)
+/// Out of memory it writes the bare format.
+void LogLine(const char* file, int line, const char* function, const char* format, ...) noexcept
     __attribute__((format(printf, 4, 5)));
 
 /// Opens the log under the program's name (kept by pointer); `foreground` copies every line to

@@ -69,9 +69,9 @@ class Condition {
 /// SQLite runs in WAL mode with a busy time-out.
 class Session {
  public:
-  /// `connection` as SOCI takes it ("sqlite3://...", "postgresql://..."). `schema` is run when the
-  /// database is opened: statements parted by ";" that are harmless to repeat. Throws
-  /// std::invalid_argument for another kind of database.
+  /// `connection` as SOCI takes it ("sqlite3://...", "postgresql://..."; another fails when
+  /// opened). `schema` is run when the database is opened: statements parted by ";" that are
+  /// harmless to repeat. Throws std::invalid_argument for another kind of database.
   Session(std::string connection, std::string schema);
   ~Session();
   Session(const Session&) = delete;

@@ -4,6 +4,7 @@
 #include <string>
 #include <vector>
 
+#include "platform/guard.h"
 #include "platform/marudbquery.h"
 
 /// What the parts of the query layer share. For this room.
@@ -52,6 +53,7 @@ class StatementText {
 /// The one wall against the database library's exceptions.
 template <class Work>
 bool Walled(std::string& error, Work work) {
+  const maru::KeepErrno keep;
   try {
     error.clear();
     work();

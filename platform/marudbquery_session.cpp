@@ -3,7 +3,6 @@
 
 #include <map>
 #include <set>
-#include <stdexcept>
 #include <string_view>
 
 #include "platform/config.h"
@@ -96,11 +95,10 @@ const std::set<std::string>& Session::State::Columns(soci::session& open,
 
 Session::Session(std::string connection, std::string schema) : state_(new State) {
   const std::size_t end = connection.find("://");
-  state_->backend = connection.substr(0, end);
-  if (end == std::string::npos || (state_->backend != kSQLite && state_->backend != kPostgreSQL)) {
-    throw std::invalid_argument("a database is named by sqlite3:// or postgresql://");
+  if (end != std::string::npos) {
+    state_->backend = connection.substr(0, end);
+    state_->connection = connection.substr(end + 3);
   }
-  state_->connection = connection.substr(end + 3);
   state_->schema = std::move(schema);
 }
 
@@ -111,6 +109,9 @@ Session::~Session() {
 soci::session& Session::Open() {
   state_->Forget();
   if (state_->database) return *state_->database;
+  if (state_->backend != kSQLite && state_->backend != kPostgreSQL) {
+    throw soci::soci_error("a database is named by sqlite3:// or postgresql://");
+  }
   auto database = Connect(state_->backend, state_->connection);
   if (IsSQLite()) {
     PrepareSQLite(*database);

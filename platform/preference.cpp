@@ -7,6 +7,7 @@
 #include <string_view>
 
 #include "platform/config.h"
+#include "platform/guard.h"
 #include "platform/json.h"
 #include "platform/whole_file.h"
 
@@ -39,14 +40,13 @@ const Key& Find(const std::string& name, Json::ValueType type) {
 
 /// What the file holds; an empty object when it cannot be read.
 Json::Value Read(const std::string& path) {
-  const int error = errno;
+  const maru::KeepErrno keep;
   std::string text;
   Json::Value values;
   if (!maru::ReadWholeFile(path, kMaxFile, text) || !maru::json::FromString(text, values) ||
       !values.isObject()) {
     values = Json::Value(Json::objectValue);
   }
-  errno = error;
   return values;
 }
 

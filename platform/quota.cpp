@@ -15,6 +15,7 @@ namespace {
 /// Whether a quota of the file system that holds `file` forbids `bytes` more. False also where
 /// there is no such quota, or the caller may not ask.
 bool OverQuota(int file, int type, unsigned int id, std::uint64_t bytes) {
+  const maru::KeepErrno keep;
   struct dqblk quota {};
   if (syscall(SYS_quotactl_fd, file, QCMD(Q_GETQUOTA, type), id, &quota) != 0) return false;
   const std::uint64_t limit = quota.dqb_bhardlimit * QIF_DQBLKSIZE;
@@ -35,7 +36,6 @@ int MARUQuotaIsEnough(unsigned int uid, const char* path, std::uint64_t bytes, i
       OverQuota(file.Get(), GRPQUOTA, status.st_gid, bytes)) {
     return maru::Fail(kErrOverQuota, 0);
   }
-  errno = 0;
   // In blocks, so that no number of bytes overflows.
   const std::uint64_t blocks = bytes / space.f_frsize + (bytes % space.f_frsize != 0);
   return space.f_bavail >= blocks ? 1 : maru::Fail(kErrNoSpace, 0);

@@ -8,7 +8,7 @@
 #include <stdexcept>
 
 #include "platform/config.h"
-#include "platform/log.h"
+#include "platform/guard.h"
 #include "platform/name_service.h"
 #include "platform/samba.h"
 #include "platform/share_table.h"
@@ -75,6 +75,7 @@ void KeepCopy(const Config& config, const std::string& text) {
 class ShareTableSource {
  public:
   std::shared_ptr<const ShareTable> Current() {
+    const KeepErrno keep;
     const Config& config = Config::Get();
     Stamp stamp;
     if (auto table = Known(config, stamp)) return table;

@@ -6,10 +6,13 @@
 #include <gtest/gtest.h>
 #include <linux/capability.h>
 #include <sys/prctl.h>
+#include <sys/socket.h>
+#include <sys/un.h>
 
 #include <algorithm>
 #include <array>
 
+#include "platform/log.h"
 #include "platform/process.h"
 #include "tests/platform/support.h"
 
@@ -201,6 +204,41 @@ TEST(Fork, KeepsNothingOfTheParentOpen) {
   EXPECT_EQ(status, 0);
   close(ends[0]);
   close(ends[1]);
+}
+
+/// The system log of the sandbox, played by the test.
+TEST(Fork, TheChildLogsWhereItsParentDid) {
+  NEEDS_ACCOUNTS();
+  const int log = socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0);
+  const sockaddr_un address{AF_UNIX, "/dev/log"};
+  if (bind(log, reinterpret_cast<const sockaddr*>(&address), sizeof(address)) != 0) {
+    close(log);
+    GTEST_SKIP() << "there is a system log already";
+  }
+  maru::OpenLog("tested", false);
+  MARU_LOG("parent");
+  const pid_t child = MLIBCProcForkEx(1);
+  if (child == 0) {
+    // They take the number that the parent's log had, and must not get its lines.
+    int pair[2];
+    char byte;
+    const bool made = socketpair(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0, pair) == 0;
+    MARU_LOG("child");
+    _exit(made && recv(pair[0], &byte, 1, MSG_DONTWAIT) == -1 &&
+                  recv(pair[1], &byte, 1, MSG_DONTWAIT) == -1
+              ? 0
+              : 1);
+  }
+  int status = -1;
+  waitpid(child, &status, 0);
+  EXPECT_EQ(status, 0);
+  for (const char* expected : {"parent", "child"}) {
+    char line[512] = "";
+    EXPECT_GT(recv(log, line, sizeof(line) - 1, MSG_DONTWAIT), 0);
+    EXPECT_THAT(line, testing::AllOf(testing::HasSubstr("tested["), testing::EndsWith(expected)));
+  }
+  unlink("/dev/log");
+  close(log);
 }
 
 }  // namespace

@@ -250,7 +250,8 @@ TEST_F(Database, AnUnusableOneIsAnErrorNotACrash) {
   EXPECT_NE(error_with(nowhere), "");
   Session server("postgresql://host=" + (folder_ / "none") + " dbname=x", kSchema);
   EXPECT_THAT(error_with(server), HasSubstr("connection to server"));
-  EXPECT_THROW(Session("mysql://x", ""), std::invalid_argument);
+  Session unknown("mysql://x", kSchema);
+  EXPECT_THAT(error_with(unknown), HasSubstr("sqlite3://"));
 }
 
 TEST_F(Database, TheHistoryHasItsTable) {
