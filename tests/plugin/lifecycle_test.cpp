@@ -126,6 +126,9 @@ TEST_F(Lifecycle, WorkAfterTheAnswer) {
 }
 
 TEST_F(Lifecycle, CancelledThreadIsNoFailure) {
+#ifdef __SANITIZE_ADDRESS__
+  GTEST_SKIP() << "the sanitizers take the reference that stands for the unwinding for a null one";
+#endif
   ProbeAPI::execute_ = [] {
     pthread_cancel(pthread_self());
     pthread_testcancel();
