@@ -2,8 +2,7 @@
 
 #include <errno.h>
 #include <fcntl.h>
-#include <linux/fs.h>
-#include <linux/stat.h>
+#include <linux/limits.h>
 #include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
@@ -91,7 +90,7 @@ bool Copy(const char* source, const char* destination, bool overwrite) {
     return false;
   }
   std::string temporary;
-  const maru::UniqueFd to = maru::NewFileBeside(destination, temporary);
+  const maru::UniqueFd to = maru::NewFileBeside(destination, 0600, temporary);
   if (!to) return false;
   if (CopyContent(from.Get(), to.Get()) && CopyStatus(from.Get(), to.Get()) &&
       fsync(to.Get()) == 0 && Rename(temporary.c_str(), destination, overwrite)) {

@@ -6,8 +6,7 @@
 /// caller has one thread.
 int MLIBCProcForkEx(int close_descriptors);
 
-/// The code of the last platform call of this thread that failed. 0x2400: no space left; 0x2900:
-/// over quota; others are named in process.cpp.
+/// The code of the last platform call of this thread that failed: one of those below.
 int MLIBCErrGet();
 void MLIBCErrSet(int code);
 

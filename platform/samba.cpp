@@ -143,6 +143,10 @@ class Testparm {
 }  // namespace
 
 std::string CanonicalSamba(const std::string& path) {
+  // testparm itself does not say why it cannot read a file.
+  if (!UniqueFd(open(path.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC))) {
+    throw std::runtime_error(path + ": " + strerror(errno));
+  }
   return Testparm(path).Result();
 }
 

@@ -19,12 +19,6 @@ bool WriteAll(int descriptor, std::string_view text) {
   return true;
 }
 
-mode_t Umask() {
-  const mode_t mask = umask(077);
-  umask(mask);
-  return mask;
-}
-
 }  // namespace
 
 bool ReadWholeFile(const std::string& path, std::size_t limit, std::string& text, Link link) {
@@ -58,18 +52,24 @@ bool ReadWholeFile(const std::string& path, std::size_t limit, std::string& text
   return true;
 }
 
-UniqueFd NewFileBeside(const std::string& path, std::string& temporary) {
+UniqueFd NewFileBeside(const std::string& path, mode_t mode, std::string& temporary) {
   const std::size_t slash = path.rfind('/');
-  temporary = (slash == std::string::npos ? "" : path.substr(0, slash + 1)) + ".maru.XXXXXX";
-  return UniqueFd(mkostemp(temporary.data(), O_CLOEXEC));
+  const std::string folder = slash == std::string::npos ? "" : path.substr(0, slash + 1);
+  UniqueFd file;
+  do {
+    temporary = folder + ".maru." + std::to_string(arc4random());
+    // The kernel applies the umask, which only a process of one thread could ask for.
+    file = UniqueFd(open(temporary.c_str(), O_RDWR | O_CREAT | O_EXCL | O_CLOEXEC, mode));
+  } while (!file && errno == EEXIST);
+  return file;
 }
 
 bool WriteWholeFile(const std::string& path, std::string_view text, mode_t mode, uid_t owner) {
   std::string temporary;
-  const UniqueFd file = NewFileBeside(path, temporary);
+  const UniqueFd file = NewFileBeside(path, mode, temporary);
   if (!file) return false;
   const bool written =
-      WriteAll(file.Get(), text) && fchmod(file.Get(), mode & ~Umask()) == 0 &&
+      WriteAll(file.Get(), text) &&
       (owner == static_cast<uid_t>(-1) || fchown(file.Get(), owner, static_cast<gid_t>(-1)) == 0) &&
       rename(temporary.c_str(), path.c_str()) == 0;
   if (written) return true;

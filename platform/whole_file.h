@@ -18,9 +18,9 @@ enum class Link { kRefuse, kFollow };
 bool ReadWholeFile(const std::string& path, std::size_t limit, std::string& text,
                    Link link = Link::kRefuse);
 
-/// A new empty file of mode 0600 in the folder of `path`, under a short name of its own, to be
-/// renamed to it; `temporary` is its path. False with errno.
-UniqueFd NewFileBeside(const std::string& path, std::string& temporary);
+/// A new empty file of `mode` less the umask in the folder of `path`, under a short name of its
+/// own, to be renamed to it; `temporary` is its path. False with errno.
+UniqueFd NewFileBeside(const std::string& path, mode_t mode, std::string& temporary);
 
 /// Writes a file so that a reader sees the old text or the new one, never a part. The file gets
 /// `mode` less the umask, and `owner` unless that is -1. False with errno; the old file then
