@@ -13,8 +13,8 @@ namespace maru::daemon {
 /// time: the server's loop, or the worker that carries out its request.
 class Connection {
  public:
-  /// Of one request; far more than any sensible one has.
-  static constexpr std::size_t kMaxRequest = 1u << 20;
+  /// Of one request; far more than any sensible one has, and little enough to hold for everybody.
+  static constexpr std::size_t kMaxRequest = 256u << 10;
   /// Bytes of a longer one that are read and thrown away before it is refused.
   static constexpr std::size_t kMaxDiscarded = 64u << 20;
 

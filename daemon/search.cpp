@@ -166,6 +166,7 @@ Json::Value SearchCommand(const Request& request) {
   for (const index::Hit& hit : page.hits) {
     Json::Value message = HitMessage(wish.scope.places[hit.share], hit, wish.fields);
     if (!wish.highlights.empty()) {
+      if (request.cancelled()) throw index::Cancelled();
       message["highlight"] = FragmentsOf(*reader, hit, wish.query, wish.highlights);
     }
     request.output(message);

@@ -20,6 +20,8 @@ namespace {
 /// A reply may hold this much; a message less.
 constexpr std::size_t kMaxReply = 64u << 20;
 constexpr int kSweepMilliseconds = 500;
+/// New connections taken before others have their turn.
+constexpr int kAcceptsAtOnce = 64;
 /// A connection that has been silent for less is left alone when others need its place.
 constexpr std::chrono::milliseconds kSilence{250};
 
@@ -115,7 +117,7 @@ void Server::OnConnection(Connection& connection) {
 }
 
 void Server::Accept() {
-  for (;;) {
+  for (int i = 0; i < kAcceptsAtOnce; ++i) {
     UniqueFd socket(accept4(listening_, nullptr, nullptr, SOCK_NONBLOCK | SOCK_CLOEXEC));
     if (!socket) {
       if (errno == EAGAIN || errno == EINTR || errno == ECONNABORTED) return;

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cmath>
 #include <ctime>
+#include <set>
 
 #include "common/error.h"
 #include "platform/log.h"
@@ -25,6 +26,12 @@ constexpr const char* kSchema =
 
 std::string_view FolderOf(std::string_view path) {
   return path.substr(0, path.rfind('/') == std::string_view::npos ? 0 : path.rfind('/'));
+}
+
+double Boost(double own, double others) {
+  others = std::max(others, 0.0);
+  return UsageStore::kOwnBoost * own / (1 + own) +
+         UsageStore::kOthersBoost * others / (kOthersHalf + others);
 }
 
 maruseeker::Error StoreFailed(const char* why) {
@@ -139,37 +146,44 @@ void UsageStore::Record(uid_t uid, const std::string& index_id, index::DocumentI
   if (!stored) throw StoreFailed(why.c_str());
 }
 
+const UsageStore::Files& UsageStore::FilesOf(std::int64_t owner) const {
+  static const Files none;
+  const auto found = files_.find(owner);
+  return found == files_.end() ? none : found->second;
+}
+
 std::vector<OpenedFile> UsageStore::Strongest(uid_t uid,
                                               const std::vector<std::string>& index_ids) const {
+  const std::set<std::string_view> wanted(index_ids.begin(), index_ids.end());
+  struct Candidate {
+    double boost;
+    const Files::value_type* file;
+  };
+  std::vector<Candidate> candidates;
   const std::lock_guard lock(mutex_);
   const std::int64_t now = clock_();
-  static const Files none;
-  const auto find = [&](std::int64_t owner) -> const Files& {
-    const auto found = files_.find(owner);
-    return found == files_.end() ? none : found->second;
-  };
-  const Files& own = find(uid);
-  std::map<Key, OpenedFile> boosts;
-  const auto consider = [&](const Key& key, const Row& row, double boost) {
-    if (std::find(index_ids.begin(), index_ids.end(), key.first) == index_ids.end()) return;
-    OpenedFile& file = boosts[key];
-    file = {key.first, key.second, row.path, file.boost + boost};
-  };
-  for (const auto& [key, row] : own) {
-    const double weight = Faded(row, now);
-    consider(key, row, kOwnBoost * weight / (1 + weight));
+  const Files& own = FilesOf(uid);
+  const Files& all = FilesOf(kEverybody);
+  for (const auto& file : own) {
+    if (!wanted.contains(file.first.first)) continue;
+    const double weight = Faded(file.second, now);
+    const auto together = all.find(file.first);
+    const double others = together == all.end() ? 0 : Faded(together->second, now) - weight;
+    candidates.push_back({Boost(weight, others), &file});
   }
-  for (const auto& [key, row] : find(kEverybody)) {
-    const auto mine = own.find(key);
-    const double others =
-        std::max(Faded(row, now) - (mine == own.end() ? 0 : Faded(mine->second, now)), 0.0);
-    consider(key, row, kOthersBoost * others / (kOthersHalf + others));
+  for (const auto& file : all) {
+    if (!wanted.contains(file.first.first) || own.contains(file.first)) continue;
+    candidates.push_back({Boost(0, Faded(file.second, now)), &file});
   }
+  const std::size_t count = std::min(candidates.size(), kMaxStrongest);
+  std::partial_sort(candidates.begin(), candidates.begin() + static_cast<std::ptrdiff_t>(count),
+                    candidates.end(),
+                    [](const auto& a, const auto& b) { return a.boost > b.boost; });
   std::vector<OpenedFile> strongest;
-  for (auto& [key, file] : boosts) strongest.push_back(std::move(file));
-  std::sort(strongest.begin(), strongest.end(),
-            [](const OpenedFile& a, const OpenedFile& b) { return a.boost > b.boost; });
-  if (strongest.size() > kMaxStrongest) strongest.resize(kMaxStrongest);
+  for (std::size_t i = 0; i < count; ++i) {
+    const auto& [key, row] = *candidates[i].file;
+    strongest.push_back({key.first, key.second, row.path, candidates[i].boost});
+  }
   return strongest;
 }
 

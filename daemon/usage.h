@@ -42,10 +42,10 @@ class UsageStore {
   static constexpr std::int64_t kHalfLife = 30 * 24 * 3600;
   /// Files remembered per user, of all users together, and users.
   static constexpr std::size_t kMaxFiles = 200;
-  static constexpr std::size_t kMaxShared = 2'000;
+  static constexpr std::size_t kMaxShared = 1'000;
   static constexpr std::size_t kMaxUsers = 5'000;
   /// Files that one search asks for.
-  static constexpr std::size_t kMaxStrongest = 64;
+  static constexpr std::size_t kMaxStrongest = 32;
   /// The boost of a file opened by many, and of one opened much by the user himself.
   static constexpr double kOthersBoost = 0.15;
   static constexpr double kOwnBoost = 1.0;
@@ -84,6 +84,7 @@ class UsageStore {
   void ForgetOldestUser();
   void StoreRow(std::int64_t owner, const Key& key, const Row& row);
   void DeleteRow(std::int64_t owner, const Key& key);
+  const Files& FilesOf(std::int64_t owner) const;
   double Faded(const Row& row, std::int64_t now) const;
 
   Clock clock_;

@@ -1,6 +1,8 @@
 #include "daemon/usage.h"
 
+#include <signal.h>
 #include <sys/stat.h>
+#include <sys/wait.h>
 
 #include "common/error.h"
 #include "tests/daemon/fixture.h"
@@ -58,6 +60,20 @@ TEST_F(UsageTest, SurvivesRestartsAndStaysBounded) {
   EXPECT_EQ(usage->Size(), 2 * UsageStore::kMaxFiles + 20);
   EXPECT_DOUBLE_EQ(BoostOf(*usage, 1, 220), boost);
   EXPECT_LE(usage->Strongest(1, {"i"}).size(), UsageStore::kMaxStrongest);
+}
+
+TEST_F(UsageTest, SurvivesAKill) {
+  const pid_t child = fork();
+  if (child == 0) {
+    Open()->Record(1, "i", 7, "/a");
+    auto usage = Open();
+    usage->Record(1, "i", 7, "/a");
+    kill(getpid(), SIGKILL);
+  }
+  waitpid(child, nullptr, 0);
+  const auto usage = Open();
+  EXPECT_EQ(usage->Size(), 2u);
+  EXPECT_GT(BoostOf(*usage, 1, 7), 0.6) << "two openings";
 }
 
 TEST_F(UsageTest, ADamagedDatabaseIsLeftAloneAndSearchesGoOn) {
