@@ -69,11 +69,14 @@ class PamTransaction {
     if (handle_) pam_end(handle_, result_);
   }
 
-  bool Run(const std::string& source) {
+  bool Authenticate(const std::string& source) {
     return Step(result_) && Step(pam_set_item(handle_, PAM_RHOST, source.c_str())) &&
            Step(pam_set_item(handle_, PAM_TTY, "maruweb")) &&
-           Step(pam_authenticate(handle_, PAM_SILENT | PAM_DISALLOW_NULL_AUTHTOK)) &&
-           Step(pam_acct_mgmt(handle_, PAM_SILENT | PAM_DISALLOW_NULL_AUTHTOK));
+           Step(pam_authenticate(handle_, PAM_SILENT | PAM_DISALLOW_NULL_AUTHTOK));
+  }
+
+  bool Admit() {
+    return Step(result_) && Step(pam_acct_mgmt(handle_, PAM_SILENT | PAM_DISALLOW_NULL_AUTHTOK));
   }
 
   /// The user's name as PAM's modules left it.
@@ -110,10 +113,14 @@ bool IsAdministrator(const std::string& name) {
   return MLIBGroupIsAdminGroupMem(name.c_str(), 0) == 1;
 }
 
+bool IsAdmitted(const std::string& name) {
+  return PamTransaction(name, "").Admit();
+}
+
 std::optional<Account> SignIn(const std::string& user, const std::string& password,
                               const std::string& source) {
   PamTransaction pam(user, password);
-  if (!pam.Run(source)) return std::nullopt;
+  if (!pam.Authenticate(source) || !pam.Admit()) return std::nullopt;
   return FindAccount(pam.User());
 }
 

@@ -24,6 +24,9 @@ std::optional<Account> FindAccount(const std::string& name);
 /// Whether `name` is in the administrators' group.
 bool IsAdministrator(const std::string& name);
 
+/// Whether PAM (its account part) still admits the account. May take its time.
+bool IsAdmitted(const std::string& name);
+
 /// Does what PAM service "maruseeker" says: authentication, then the account's own state. `source`
 /// is the client's address, for PAM's log. May take seconds. Nothing when refused.
 std::optional<Account> SignIn(const std::string& user, const std::string& password,

@@ -94,7 +94,8 @@ Answer CallAnswer(const Task& task, int socket, Packet& packet, const Plugin& pl
 
 int Serve(const Task& task, int socket, Packet& packet, const Plugin& plugin) {
   const auto account = FindAccount(task.user);
-  if (!account || account->uid != task.uid || account->stamp != task.stamp) {
+  if (!account || account->uid != task.uid || account->stamp != task.stamp ||
+      (task.ask_pam && !IsAdmitted(task.user))) {
     SendAnswer(socket, Refusal(401), Wait::kYes);
     return kExitSessionOver;
   }

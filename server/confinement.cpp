@@ -13,6 +13,7 @@
 #include <memory>
 #include <system_error>
 
+#include "platform/log.h"
 #include "platform/service_identity.h"
 
 namespace maru::server {
@@ -30,7 +31,8 @@ void MakePrivateMounts() {
   constexpr unsigned long kFlags = MS_NOSUID | MS_NODEV | MS_NOEXEC;
   Demand(unshare(CLONE_NEWNS) == 0, "unshare");
   Demand(mount(nullptr, "/", nullptr, MS_REC | MS_SLAVE, nullptr) == 0, "mount /");
-  Demand(mount("proc", "/proc", "proc", kFlags, nullptr) == 0, "mount /proc");
+  if (mount("proc", "/proc", "proc", kFlags, nullptr) < 0)
+    MARU_LOG("No /proc of its own: the one of the machine stays in sight");
   Demand(mount("tmpfs", "/tmp", "tmpfs", kFlags, "mode=1777,size=64m,nr_inodes=65536") == 0,
          "mount /tmp");
 }

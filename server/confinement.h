@@ -5,7 +5,8 @@
 namespace maru::server {
 
 /// The host's own view of the file system: what is mounted on the machine and by the supervisor
-/// still appears in it, with a /proc of its PID namespace and an empty /tmp that nobody else sees.
+/// still appears in it, with a /proc of its PID namespace (where the
+/// machine permits one) and an empty /tmp that nobody else sees.
 void MakePrivateMounts();
 
 /// Removes files in /tmp that nobody has written for a day: the notes of queries that were killed.

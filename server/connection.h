@@ -210,7 +210,9 @@ class Connection : public AnyConnection, public std::enable_shared_from_this<Con
   /// The client's address: the connection's, or what the proxy says it is.
   std::string SourceOf(const http::request<http::string_body>& request) const {
     if (!front_.config.behind_proxy) return peer_;
-    std::string_view list = Text(request["X-Forwarded-For"]);
+    std::string_view list;
+    const auto [first, last] = request.equal_range("X-Forwarded-For");
+    for (auto field = first; field != last; ++field) list = Text(field->value());
     list.remove_prefix(std::min(list.size(), list.find_last_of(", ") + 1));
     error_code error;
     const auto address = asio::ip::make_address(std::string(list.substr(0, 64)), error);

@@ -31,6 +31,8 @@ constexpr int kTickMilliseconds = 2000;
 /// when nothing has happened for so long, or when they run short.
 constexpr int kQuietMilliseconds = 2;
 constexpr Seconds kSweepEvery = 600;
+/// How long what PAM said of an account holds.
+constexpr Seconds kAdmittedFor = 300;
 constexpr Seconds kGrace = 2;
 
 // Keys beyond every process id.
@@ -207,12 +209,13 @@ void Host::Take(Ask ask, Descriptor request) {
 
 void Host::TakeCall(const Ask& ask, Session& session, Descriptor request) {
   if (session.running >= kMaxPerSession) return Reply(request, Refusal(429));
+  const Seconds now = Now();
   const Task task{ask.kind,    ask.name,     ask.body_size, session.id,
-                  session.uid, session.user, session.stamp};
-  if (children_.Hand(task, request, Now()) == Children::Start::kDone)
-    ++session.running;
-  else
-    Reply(request, Refusal(503));
+                  session.uid, session.user, session.stamp, now - session.admitted >= kAdmittedFor};
+  if (children_.Hand(task, request, now) != Children::Start::kDone)
+    return Reply(request, Refusal(503));
+  ++session.running;
+  if (task.ask_pam) session.admitted = now;
 }
 
 void Host::TakeSignIn(Ask& ask, Descriptor request) {

@@ -55,14 +55,14 @@ std::optional<Ask> UnpackAsk(std::string_view packet) {
 std::string Pack(const Task& task) {
   return PackFields({Letter(task.kind), task.name.api, std::to_string(task.name.version),
                      task.name.method, std::to_string(task.body_size), task.session_id,
-                     std::to_string(task.uid), task.user, task.stamp});
+                     std::to_string(task.uid), task.user, task.stamp, task.ask_pam ? "1" : "0"});
 }
 
 std::optional<Task> UnpackTask(std::string_view packet) {
-  const auto fields = UnpackFields<9>(packet);
+  const auto fields = UnpackFields<10>(packet);
   if (!fields) return std::nullopt;
-  const auto& [kind_text, api, version, method, size_text, session_id, uid_text, user, stamp] =
-      *fields;
+  const auto& [kind_text, api, version, method, size_text, session_id, uid_text, user, stamp,
+               ask_pam] = *fields;
   const auto kind = ParseKind(kind_text);
   const auto size = ParseNumber(size_text, kMaxBody);
   const auto uid = ParseNumber(uid_text, std::numeric_limits<uid_t>::max());
@@ -74,6 +74,7 @@ std::optional<Task> UnpackTask(std::string_view packet) {
   task.uid = static_cast<uid_t>(*uid);
   task.user = user;
   task.stamp = stamp;
+  task.ask_pam = ask_pam == "1";
   return task;
 }
 

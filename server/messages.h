@@ -53,6 +53,8 @@ struct Task {
   std::string user;
   /// What StampOf the account was when the session began (server/account.h).
   std::string stamp;
+  /// PAM is to be asked whether the account is still admitted.
+  bool ask_pam = false;
 };
 
 std::string Pack(const Task& task);

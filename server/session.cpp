@@ -97,7 +97,8 @@ std::optional<Claims> TokenSeal::Open(std::string_view token) const {
 const Session& SessionTable::Begin(const std::string& user, uid_t uid, const std::string& stamp,
                                    Seconds now) {
   MakeRoom(user);
-  Session session{RandomId(), user, uid, stamp, now + std::max(kLifetime, idle_limit_), now, 0};
+  Session session{RandomId(), user, uid, stamp, now + std::max(kLifetime, idle_limit_),
+                  now,        now,  0};
   const std::string id = session.id;
   return sessions_[id] = std::move(session);
 }

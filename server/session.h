@@ -53,6 +53,8 @@ struct Session {
   std::string stamp;
   Seconds expires = 0;
   Seconds last_used = 0;
+  /// When PAM last admitted the account.
+  Seconds admitted = 0;
   /// Request children at work for it.
   unsigned running = 0;
 };

@@ -1,0 +1,40 @@
+// Accounts, as this machine's name service and PAM see them.
+
+#include <gtest/gtest.h>
+#include <pwd.h>
+#include <unistd.h>
+
+#include "server/account.h"
+
+namespace maru::server {
+namespace {
+
+class AccountTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    if (geteuid() != 0 || !getpwnam("alice") || access("/etc/pam.d/maruseeker", R_OK) != 0)
+      GTEST_SKIP() << "needs the account alice and the PAM service: run it in tools/sandbox";
+  }
+};
+
+TEST_F(AccountTest, IsFoundWithAStampOfItsPassword) {
+  const auto alice = FindAccount("alice");
+  ASSERT_TRUE(alice);
+  EXPECT_EQ(alice->uid, 60001u);
+  EXPECT_FALSE(alice->stamp.empty());
+  EXPECT_EQ(FindAccount("alice")->stamp, alice->stamp);
+  EXPECT_NE(FindAccount("bob")->stamp, alice->stamp);
+  EXPECT_FALSE(FindAccount("nobody-here"));
+  EXPECT_FALSE(FindAccount(""));
+}
+
+TEST_F(AccountTest, PamAdmitsWhomItKnows) {
+  EXPECT_TRUE(IsAdmitted("alice"));
+  EXPECT_FALSE(IsAdmitted("nobody-here"));
+  const auto alice = SignIn("alice", "alice", "::1");
+  ASSERT_TRUE(alice);
+  EXPECT_EQ(alice->name, "alice");
+}
+
+}  // namespace
+}  // namespace maru::server
