@@ -7,12 +7,10 @@
 #include <filesystem>
 #include <fstream>
 
-#include "platform/json.h"
 #include "server/http_head.h"
 #include "server/listener.h"
 #include "server/metrics.h"
 #include "server/names.h"
-#include "server/openapi.h"
 #include "server/pages.h"
 #include "server/routes.h"
 
@@ -208,13 +206,6 @@ TEST(Metrics, CountsAndStaysBounded) {
   EXPECT_THAT(text, HasSubstr("maruweb_request_seconds_bucket{method=\"m0\",le=\"0.025\"} 1\n"));
   EXPECT_THAT(text, HasSubstr("maruweb_request_seconds_bucket{method=\"m0\",le=\"+Inf\"} 2\n"));
   EXPECT_THAT(text, HasSubstr("maruweb_connections 7\n"));
-}
-
-TEST(OpenApi, IsOneJsonDocument) {
-  Json::Value document;
-  std::string error;
-  ASSERT_TRUE(json::FromString(std::string(OpenApiText()), document, &error)) << error;
-  EXPECT_TRUE(document["paths"].isMember(std::string(kSearch)));
 }
 
 TEST(Listener, TakesNoPasswordsInTheClearFromANetwork) {
