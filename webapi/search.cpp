@@ -210,7 +210,7 @@ void SearchAPI::Search() {
   }
   if (!AsBool(js_resp["success"])) {
     const Json::Value error = js_resp.get("error", "Unknown error");
-    MARU_LOG("error: %s", maru::json::ToString(error).c_str());
+    MARU_LOG("error: %.4096s", maru::json::ToString(error).c_str());
   }
   output_ = result;
   if (!query_id_.empty()) unlink(query_info_file.c_str());
