@@ -43,7 +43,9 @@ TEST(Tokenizer, TakesAnyBytes) {
   EXPECT_EQ(WordsOf("a\xff\xfe b\xc3"), (Words{"a", "b"}));
   EXPECT_EQ(WordsOf("\u0301"), Words{}) << "an accent without a letter is no word";
   EXPECT_EQ(WordsOf("\u0301 a"), Words{"a"});
-  const Words words = WordsOf(std::string(100'000, 'x') + " y");
+  std::string endless(100'000, 'x');
+  endless += " y";
+  const Words words = WordsOf(endless);
   ASSERT_EQ(words.size(), 2u);
   EXPECT_EQ(words[0].size(), kMaxWord);
 

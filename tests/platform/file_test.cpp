@@ -74,7 +74,7 @@ TEST(FileCopy, MovesFromOneFileSystemToAnother) {
   // A bind mount within one file system is a mount point too.
   mkdir((folder / "a").c_str(), 0755);
   mkdir((folder / "b").c_str(), 0755);
-  symlink((folder / "a").c_str(), (folder / "link").c_str());
+  EXPECT_EQ(symlink((folder / "a").c_str(), (folder / "link").c_str()), 0);
   EXPECT_EQ(MARUFSDirIsMntPoint((folder / "a").c_str()), 0);
   ASSERT_EQ(mount((folder / "b").c_str(), (folder / "a").c_str(), "", MS_BIND, nullptr), 0);
   EXPECT_EQ(MARUFSDirIsMntPoint((folder / "a").c_str()), 1);

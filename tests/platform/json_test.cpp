@@ -149,7 +149,7 @@ TEST(Json, ReadsRegularFilesOnly) {
     return errno;
   };
   const std::string good = folder.Write("good", "{\"pid\": 1}\n");
-  symlink(good.c_str(), (folder / "link").c_str());
+  EXPECT_EQ(symlink(good.c_str(), (folder / "link").c_str()), 0);
   mkfifo((folder / "fifo").c_str(), 0600);
   EXPECT_EQ(error_of(folder / "none"), ENOENT);
   EXPECT_EQ(error_of(folder / "link"), ELOOP);
@@ -163,7 +163,7 @@ TEST(Json, ReadsRegularFilesOnly) {
 TEST(Json, WritesWholeFilesOrNone) {
   const TempFolder folder;
   const std::string victim = folder.Write("victim", "untouched");
-  symlink(victim.c_str(), (folder / "a").c_str());
+  EXPECT_EQ(symlink(victim.c_str(), (folder / "a").c_str()), 0);
   Json::Value value(Json::arrayValue);
   value.append("x");
   ASSERT_TRUE(json::ToFile(value, folder / "a"));  // the link is replaced, not followed

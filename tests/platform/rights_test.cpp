@@ -163,7 +163,7 @@ TEST(Rights, ReadingThemFollowsNoLink) {
   const TempFolder folder;
   const std::string file = folder.Write("file", "");
   chmod(file.c_str(), 0640);
-  symlink(file.c_str(), (folder / "link").c_str());
+  EXPECT_EQ(symlink(file.c_str(), (folder / "link").c_str()), 0);
   const int directory = open((folder / "").c_str(), O_RDONLY | O_DIRECTORY);
   FileRights rights;
   ASSERT_TRUE(maru::ReadFileRights(directory, "file", rights));
@@ -224,8 +224,8 @@ TEST_F(Volume, EveryFolderOnTheWayCounts) {
 }
 
 TEST_F(Volume, NothingLeadsOutOfTheShare) {
-  symlink("/etc", "/volume1/photo/out");
-  symlink("/etc/passwd", "/volume1/photo/file");
+  EXPECT_EQ(symlink("/etc", "/volume1/photo/out"), 0);
+  EXPECT_EQ(symlink("/etc/passwd", "/volume1/photo/file"), 0);
   EXPECT_EQ(Bits("alice", "/volume1/photo/file"), 0);
   EXPECT_EQ(Bits("alice", "/volume1/photo/out/passwd"), 0);
   EXPECT_EQ(Bits("alice", "/volume1/photo/../../etc/passwd"), -ENOENT);
