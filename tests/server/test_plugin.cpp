@@ -8,6 +8,7 @@
 #include <unistd.h>
 
 #include <filesystem>
+#include <new>
 #include <stdexcept>
 #include <string>
 #include <vector>
@@ -122,6 +123,9 @@ void Huge(APIRequest* request, APIResponse* response) {
 
 /// Takes memory until there is none; at most 8 GiB, should nobody stop it.
 void Hungry(APIRequest*, APIResponse* response) {
+#ifdef __SANITIZE_ADDRESS__
+  throw std::bad_alloc();  // an instrumented program has no limit
+#endif
   std::vector<std::string> all;
   while (all.size() < 128) all.emplace_back(std::size_t{64} << 20, 'x');
   response->SetSuccess(Json::Value());

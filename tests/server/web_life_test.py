@@ -69,7 +69,8 @@ class LifeTest(WebTest):
         self.assertEqual([int(front[key], 16) for key in ("CapPrm", "CapEff", "CapBnd")], [0] * 3)
         self.assertEqual((front["Uid"], front["Groups"].strip()), ("\t".join(["59999"] * 4), ""))
         self.assertEqual((front["NoNewPrivs"], host["NoNewPrivs"]), ("1", "1"))
-        self.assertLess(int(host["VmRSS"].split()[0]), 30_000)
+        if "libasan" not in pathlib.Path("/proc", str(self.part("host")), "maps").read_text():
+            self.assertLess(int(host["VmRSS"].split()[0]), 10_000, "what is forked so often is small")
 
     def test_shares_come_and_go(self):
         new = pathlib.Path("/mnt/new")
