@@ -123,15 +123,15 @@ void WarmUp() {
 }  // namespace
 
 Descriptor KeepOnly(Descriptor kept) {
-  constexpr int kFirst = STDERR_FILENO + 1;
+  constexpr int first = STDERR_FILENO + 1;
   sigset_t none;
   sigemptyset(&none);
   sigprocmask(SIG_SETMASK, &none, nullptr);
   ReopenLog();
   const int fd = kept.Release();
-  if (fd != kFirst) dup3(fd, kFirst, O_CLOEXEC);
-  close_range(kFirst + 1, ~0u, 0);
-  return Descriptor(kFirst);
+  if (fd != first) dup3(fd, first, O_CLOEXEC);
+  close_range(first + 1, ~0u, 0);
+  return Descriptor(first);
 }
 
 void RunRequestChild(Descriptor tasks, const Plugin& plugin) {

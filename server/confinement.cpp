@@ -28,12 +28,12 @@ void Demand(bool good, const char* what) {
 }  // namespace
 
 void MakePrivateMounts() {
-  constexpr unsigned long kFlags = MS_NOSUID | MS_NODEV | MS_NOEXEC;
+  constexpr unsigned long flags = MS_NOSUID | MS_NODEV | MS_NOEXEC;
   Demand(unshare(CLONE_NEWNS) == 0, "unshare");
   Demand(mount(nullptr, "/", nullptr, MS_REC | MS_SLAVE, nullptr) == 0, "mount /");
-  if (mount("proc", "/proc", "proc", kFlags, nullptr) < 0)
+  if (mount("proc", "/proc", "proc", flags, nullptr) < 0)
     MARU_LOG("No /proc of its own: the one of the machine stays in sight");
-  Demand(mount("tmpfs", "/tmp", "tmpfs", kFlags, "mode=1777,size=64m,nr_inodes=65536") == 0,
+  Demand(mount("tmpfs", "/tmp", "tmpfs", flags, "mode=1777,size=64m,nr_inodes=65536") == 0,
          "mount /tmp");
 }
 

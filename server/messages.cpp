@@ -8,8 +8,8 @@ namespace maru::server {
 namespace {
 
 std::optional<AskKind> ParseKind(std::string_view text) {
-  constexpr std::string_view kKinds = "CWIOS";
-  if (text.size() != 1 || kKinds.find(text[0]) == std::string_view::npos) return std::nullopt;
+  constexpr std::string_view kinds = "CWIOS";
+  if (text.size() != 1 || kinds.find(text[0]) == std::string_view::npos) return std::nullopt;
   return static_cast<AskKind>(text[0]);
 }
 
