@@ -39,7 +39,7 @@ class SandboxTest(unittest.TestCase):
             named = pathlib.Path(folder) / "docs"
             named.mkdir()
             (named / "a file").touch()
-            script = (f'ls /mnt/docs-2; touch /mnt/docs-2/new /usr/new; touch /volume1 {folder}x'
+            script = (f'ls /mnt/docs-2; touch /mnt/docs-2/new /usr/new; touch /trace {folder}x'
                       ' /etc/new; testparm -s 2>/dev/null | grep "path = /mnt/docs-2"; exit 7')
             result = run("--folder", str(named), "--", "bash", "-c", script)
             self.assertEqual(7, result.returncode)
@@ -47,7 +47,7 @@ class SandboxTest(unittest.TestCase):
             self.assertIn("path = /mnt/docs-2", result.stdout)
             self.assertEqual(2, result.stdout.count("Read-only file system"), result.stdout)
             self.assertEqual(["a file"], os.listdir(named))
-        for trace in ("/volume1", folder + "x", "/etc/new"):
+        for trace in ("/trace", folder + "x", "/etc/new"):
             self.assertFalse(os.path.exists(trace), trace)
         self.assertEqual(125, run("--folder", "/nowhere", "true").returncode)
         self.assertEqual(125, run("--folder", "/", "true").returncode)
