@@ -44,8 +44,10 @@ DaemonReply Exchange(const Json::Value& request, const ExchangeRules& rules) {
   if (!connection.Recv(text)) return Failure(kErrorDaemonExchange, "Recv from daemon fail");
 
   DaemonReply reply;
-  if (!maru::json::FromString(text, reply.body) || !reply.body.isObject()) return Malformed(text);
-  if (!rules.judge_success || AsBool(maru::json::Member(reply.body, "success"))) return reply;
+  if (!maru::json::FromString(text, reply.body)) return Malformed(text);
+  if (!rules.judge_success) return reply;
+  if (!reply.body.isObject()) return Malformed(text);
+  if (AsBool(maru::json::Member(reply.body, "success"))) return reply;
   const Json::Value& error = maru::json::Member(reply.body, "error");
   const int code = maru::json::IntMember(error, "code");
   if (code == 0) return Malformed(text);

@@ -67,6 +67,7 @@ void IndicateAPI::FindIndice() {
 
 /// The filters pile up: each query carries those of all queries before it, then its own.
 void IndicateAPI::AddQueries(const Json::Value& file_types) {
+  output_ = Json::Value(Json::objectValue);
   Json::Value query;
   Json::Value& filters = query["query"]["filters"] = Json::Value(Json::arrayValue);
   for (const Json::Value& file_type : file_types) {

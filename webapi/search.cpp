@@ -167,7 +167,7 @@ void SearchAPI::RecordHistory() const {
   record.uid = request_->GetLoginUID();
   record.create_time = static_cast<std::int64_t>(time(nullptr));
   db::SearchHistoryTable table;
-  MARU_FAIL_IF(!table.UpdateWithTime(record, max), kErrorHistory, table.GetLastError());
+  if (!table.UpdateWithTime(record, max)) throw Error(kErrorHistory, table.GetLastError());
 }
 
 void SearchAPI::AnswerNothing() {
@@ -194,7 +194,6 @@ void SearchAPI::Search() {
   Json::Value js_resp;
   string str_resp;
   for (std::size_t received = 0;; received += str_resp.size()) {
-    MARU_FAIL_IF(received > kMaxAnswer, kErrorDaemonExchange);
     MARU_FAIL_IF(!conn.Recv(str_resp), kErrorDaemonExchange);
     int total = 0;
     if (!ReadMessage(str_resp, js_resp, total)) {
@@ -205,6 +204,7 @@ void SearchAPI::Search() {
     } else if (js_resp.isMember("success")) {
       break;
     } else {
+      MARU_FAIL_IF(received > kMaxAnswer, kErrorDaemonExchange);
       result["hits"].append(js_resp);
     }
   }
@@ -212,7 +212,7 @@ void SearchAPI::Search() {
     const Json::Value error = js_resp.get("error", "Unknown error");
     MARU_LOG("error: %.4096s", maru::json::ToString(error).c_str());
   }
-  output_ = result;
+  output_ = std::move(result);
   if (!query_id_.empty()) unlink(query_info_file.c_str());
 }
 

@@ -126,7 +126,11 @@ TEST_F(Methods, DaemonThatFails) {
       return ContainsRegex(std::string(method.place) + ":[0-9]+ \\([0-9]+, 60001\\) \\(" +
                            method.function + "\\) " + text);
     };
-    for (const char* bad : {"abc", "[]", "7", "\"text\"", "{} {}", ""}) {
+    // JSON of the wrong kind is nobody's business where nobody looks into the reply.
+    for (const char* odd : {"[]", "7", "\"text\""}) {
+      EXPECT_EQ(AskWith(method, {FakeDaemon::Message(odd)}).code, method.judges ? 121 : 0) << odd;
+    }
+    for (const char* bad : {"abc", "{} {}", ""}) {
       const Answer answer = AskWith(method, {FakeDaemon::Message(bad)});
       EXPECT_EQ(answer.code, 121) << method.name << bad;
       EXPECT_THAT(answer.log, HasSubstr(std::string("Malformed resp from daemon: ") + bad + "\n"));

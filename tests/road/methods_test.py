@@ -170,7 +170,10 @@ class MethodsTest(road.RoadTest):
                         self.assertIsNone(self.data("alice", method, **params), method)
                 with fake_daemon.FakeDaemon(fake_daemon.replies({"success": True})):
                     self.assertIsNone(self.data("alice", method, **params), method)
-                for behaviour in (fake_daemon.garbage, fake_daemon.list_reply, lambda *_: None):
+                with fake_daemon.FakeDaemon(fake_daemon.list_reply):
+                    status, answer = self.call("alice", method, **params)
+                self.assertEqual(502 if method.startswith(judged) else 200, status, (method, answer))
+                for behaviour in (fake_daemon.garbage, lambda *_: None):
                     with fake_daemon.FakeDaemon(behaviour):
                         self.assertEqual((502, 121), self.code("alice", method, **params), method)
         finally:

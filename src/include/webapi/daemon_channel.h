@@ -24,7 +24,7 @@ struct ExchangeRules {
 
 /// A good reply, or a failure that the method logs and throws in its own name.
 struct DaemonReply {
-  /// The reply object, {"success", "data" or "error"}.
+  /// The reply, {"success", "data" or "error"}; where success is not judged, any JSON.
   Json::Value body = Json::Value(Json::objectValue);
   bool failed = false;
   ErrorCode code = {};
@@ -32,9 +32,9 @@ struct DaemonReply {
   std::string failure;
 };
 
-/// Sends {"command", "data"} and receives the one reply. A reply that is no JSON object, or that
-/// reports a failure without saying which, counts as malformed. `errno` is what the connection
-/// left, and 0 where the text was at fault.
+/// Sends {"command", "data"} and receives the one reply. A reply that is no JSON counts as
+/// malformed; where success is judged, so does one that is no object, or that reports a failure
+/// without saying which. `errno` is what the connection left, and 0 where the text was at fault.
 DaemonReply Exchange(const Json::Value& request, const ExchangeRules& rules);
 
 /// Logs a failed exchange in the caller's name and throws its error.
