@@ -1,6 +1,7 @@
 #include "indexer/crawler.h"
 
 #include <fcntl.h>
+#include <malloc.h>
 #include <sys/stat.h>
 
 #include <algorithm>
@@ -22,6 +23,10 @@ using index::Writer;
 /// New folders that wait for word of where they came from; more are taken as new at once.
 constexpr std::size_t kMaxArrivals = 10'000;
 
+/// Bytes read between two times that free memory is given back: what one thread allocates and
+/// another frees leaves holes that would double the process.
+constexpr std::uint64_t kTrimEvery = 16u << 20;
+
 /// The file system says it is not there (any more), or not what it was.
 bool HasVanished(int error) {
   return error == ENOENT || error == ENOTDIR || error == ELOOP || error == ENXIO || error == ESTALE;
@@ -31,7 +36,11 @@ bool SameContent(const index::Stamp& a, const index::Stamp& b) {
   return a.mtime_ns == b.mtime_ns && a.size == b.size && a.inode == b.inode;
 }
 
-/// An empty descriptor with errno 0: it is another file than was seen.
+bool IsOrphan(const Entry& entry) {
+  return entry.name.find('/') != std::string::npos;
+}
+
+/// Fails with ENOENT when it is another file than was seen.
 UniqueFd OpenFile(int place, const Found& found) {
   constexpr int kFlags = O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC;
   UniqueFd file(openat(place, found.name.data(), kFlags));
@@ -66,7 +75,7 @@ bool Crawler::CrawlShare(UniqueFd top, const std::string& share_name) {
   }
   defer_ = catalog_.Root().document != 0;
   if (!RefreshRoot(top.Get(), share_name)) return false;
-  Run(OpenPath(top.Get(), {}), Writer::kRoot);
+  WalkFrom(OpenPath(top.Get(), {}), Writer::kRoot);
   Settle(top.Get());
   catalog_.Commit();
   return true;
@@ -107,11 +116,11 @@ void Crawler::Visit(int folder, DirectoryId id, std::vector<Child>& children) {
   known.Settle();
   std::vector<Difference> differences = Compare(known, listing_.Entries());
   if (!differences.empty()) {
-    Apply(folder, Path(), known, differences);
+    Apply(folder, defer_ ? Path() : std::string(), known, differences);
     known.Settle();
   }
   for (const Entry& entry : known.entries) {
-    if (entry.directory == 0) continue;
+    if (entry.directory == 0 || IsOrphan(entry)) continue;
     children.push_back({entry.name, entry.directory});
     if (listener_) listener_->Placed(entry.directory, id, entry.name);
   }
@@ -185,28 +194,39 @@ void Crawler::CrawlNames(int folder, const std::string& path, DirectoryId id,
 void Crawler::Apply(int place, const std::string& path, Folder& folder,
                     std::vector<Difference>& differences) {
   // What is in the list is dealt with first: later steps move entries about, and may commit.
-  MatchRenames(place, folder, differences);
+  SplitReplaced(folder, differences);
+  MatchRenames(place, path, folder, differences);
   std::erase_if(differences,
                 [&](Difference& difference) { return ApplyInPlace(place, folder, difference); });
   std::erase_if(folder.entries, [](const Entry& entry) { return entry.document == 0; });
+  folder.Settle();
   for (const Difference& difference : differences) {
     if (stop_) return;
-    const Found& found = *difference.found;
-    if (const Entry* entry = folder.Find(found.name);
-        entry && (entry->directory != 0) != found.IsFolder()) {
-      DrainAll();
-      catalog_.RemoveTree(folder, std::string(found.name));
-    }
-    if (found.IsFolder()) {
-      MeetFolder(place, path, folder, found);
+    if (difference.found->IsFolder()) {
+      MeetFolder(place, path, folder, *difference.found);
     } else {
-      SubmitFile(place, folder, found);
+      SubmitFile(place, folder, *difference.found);
     }
   }
 }
 
+/// Another folder under the name of one, or a file, is something new in place of what is gone.
+void Crawler::SplitReplaced(const Folder& folder, std::vector<Difference>& differences) {
+  for (std::size_t i = differences.size(); i > 0; --i) {
+    Difference& difference = differences[i - 1];
+    if (difference.entry == Difference::kNone || !difference.found) continue;
+    const Entry& entry = folder.entries[difference.entry];
+    const Found& found = *difference.found;
+    const bool same_type = (entry.directory != 0) == found.IsFolder();
+    if (same_type && (!found.IsFolder() || entry.stamp.inode == found.stamp.inode)) continue;
+    difference.found = nullptr;
+    differences.push_back({Difference::kNone, &found});
+  }
+}
+
 /// Files and folders that have but another name in the same folder.
-void Crawler::MatchRenames(int place, Folder& folder, std::vector<Difference>& differences) {
+void Crawler::MatchRenames(int place, const std::string& path, Folder& folder,
+                           std::vector<Difference>& differences) {
   std::unordered_map<std::uint64_t, Entry*> gone;
   for (const Difference& difference : differences) {
     if (difference.found) continue;
@@ -231,6 +251,10 @@ void Crawler::MatchRenames(int place, Folder& folder, std::vector<Difference>& d
     gone.erase(place_in_gone);
     entry.document = 0;
     difference.found = nullptr;
+    // A walk comes to it by itself; else nobody looks into it, and what happened there before its
+    // new name was known went unseen.
+    if (found.IsFolder() && !walking_)
+      arrivals_.push_back({path, folder.id, std::string(found.name)});
   }
 }
 
@@ -239,19 +263,29 @@ bool Crawler::ApplyInPlace(int place, Folder& folder, Difference& difference) {
   if (difference.entry == Difference::kNone) return !difference.found;
   Entry& entry = folder.entries[difference.entry];
   if (entry.document == 0) return true;
-  const Found* found = difference.found;
-  if (found && (entry.directory != 0) == found->IsFolder()) {
+  if (const Found* found = difference.found) {
     if (!found->IsFolder() && !SameContent(entry.stamp, found->stamp)) return false;
     Refresh(place, folder, entry, *found);
     return true;
   }
-  if (entry.directory == 0) {
+  if (entry.directory != 0) {
+    Orphaned(folder, entry);
+  } else {
     catalog_.RemoveFile(folder, entry);
-    entry.document = 0;
-  } else if (!found) {
-    orphans_[entry.stamp.inode] = {folder.id, entry.name, entry.directory};
   }
-  return !found;
+  entry.document = 0;
+  return true;
+}
+
+/// Keeps a folder that is gone from its place, under a name that no file can have, until it is
+/// known whether it was moved. A run that ends before leaves it to the next, to which it is gone as
+/// well.
+void Crawler::Orphaned(Folder& folder, const Entry& entry) {
+  Entry orphan = entry;
+  if (!IsOrphan(entry)) orphan.name += '/' + std::to_string(entry.stamp.inode);
+  orphans_[entry.stamp.inode] = {folder.id, orphan.name, entry.directory};
+  folder.added.push_back(std::move(orphan));
+  folder.changed = true;
 }
 
 void Crawler::Refresh(int place, Folder& folder, Entry& entry, const Found& found) {
@@ -290,6 +324,11 @@ void Crawler::Complete(Result result) {
   Folder& folder = *result.folder;
   if (result.failed) ++counts_.failed;
   counts_.bytes += result.bytes_read;
+  read_since_trim_ += result.bytes_read;
+  if (read_since_trim_ >= kTrimEvery) {
+    read_since_trim_ = 0;
+    malloc_trim(0);
+  }
   if (Entry* entry = folder.Find(result.name)) {
     if (entry->directory == 0) {
       catalog_.ReplaceFile(folder, *entry, std::move(result.prepared), result.stamp);
@@ -361,7 +400,15 @@ void Crawler::Arrive(int top, const Arrival& arrival) {
   const DirectoryId id = entry ? entry->directory : 0;
   catalog_.Close(folder);
   UniqueFd inside = OpenFolder(place.Get(), arrival.name.c_str());
-  if (id != 0 && inside) Run(std::move(inside), id);
+  if (id != 0 && inside) WalkFrom(std::move(inside), id);
+}
+
+void Crawler::WalkFrom(UniqueFd folder, DirectoryId id) {
+  // A file that is still under way would be taken for new once more.
+  DrainAll();
+  walking_ = true;
+  Run(std::move(folder), id);
+  walking_ = false;
 }
 
 }  // namespace maru::indexer

@@ -63,13 +63,17 @@ class Crawler : private Walk {
   void Apply(int place, const std::string& path, Folder& folder,
              std::vector<Difference>& differences);
   bool ApplyInPlace(int place, Folder& folder, Difference& difference);
-  void MatchRenames(int place, Folder& folder, std::vector<Difference>& differences);
+  static void SplitReplaced(const Folder& folder, std::vector<Difference>& differences);
+  void MatchRenames(int place, const std::string& path, Folder& folder,
+                    std::vector<Difference>& differences);
+  void Orphaned(Folder& folder, const index::Entry& entry);
   void Refresh(int place, Folder& folder, index::Entry& entry, const Found& found);
   bool Describe(int place, index::DirectoryId parent, const Found& found,
                 index::Document& document) const;
   void SubmitFile(int place, Folder& folder, const Found& found);
   void MeetFolder(int place, const std::string& path, Folder& folder, const Found& found);
   bool Adopt(int place, Folder& folder, const Found& found);
+  void WalkFrom(UniqueFd folder, index::DirectoryId id);
   void Arrive(int top, const Arrival& arrival);
   bool LooksUnmounted(int top);
   void NoteUnreadable(const std::string& folder);
@@ -88,7 +92,9 @@ class Crawler : private Walk {
   std::unordered_map<std::uint64_t, Orphan> orphans_;
   std::vector<Arrival> arrivals_;
   bool defer_ = false;
+  bool walking_ = false;
   bool noted_unreadable_ = false;
+  std::uint64_t read_since_trim_ = 0;
 };
 
 }  // namespace maru::indexer

@@ -25,8 +25,6 @@ using std::chrono::seconds;
 /// While not every folder is watched: crawls this often, or so that they take a fifth of the time.
 constexpr minutes kUnwatchedInterval{15};
 constexpr int kUnwatchedRest = 4;
-/// Between two crawls that lost events ask for.
-constexpr seconds kLostEventsGap{30};
 /// Until an index that could not be opened or written is tried again.
 constexpr seconds kRetry{60};
 /// A crawl that has to wait for another share's.
@@ -58,7 +56,7 @@ Follower::Follower(Target target, Workers& workers, std::mutex& turn, const Sett
       settings_(settings),
       wake_(eventfd(0, EFD_NONBLOCK | EFD_CLOEXEC)),
       next_crawl_(Clock::now()),
-      last_crawl_(Clock::now() - kLostEventsGap),
+      last_crawl_(Clock::now() - settings.lost_events_gap),
       thread_([this] { Run(); }) {}
 
 Follower::~Follower() {
@@ -150,7 +148,7 @@ void Follower::Crawl() {
   const bool follows = compared_ && watcher_.Complete();
   const seconds wait =
       follows ? settings_.crawl_interval : std::min(settings_.crawl_interval, rest);
-  next_crawl_ = lost_ ? last_crawl_ + kLostEventsGap : last_crawl_ + wait;
+  next_crawl_ = lost_ ? last_crawl_ + settings_.lost_events_gap : last_crawl_ + wait;
 }
 
 void Follower::TakeEvents() {
@@ -169,7 +167,7 @@ void Follower::Note(const Watcher::Event& event) {
   }
   if (!lost) return;
   pending_.Clear();
-  CrawlBy(std::max(Clock::now() + Pending::kQuiet, last_crawl_ + kLostEventsGap));
+  CrawlBy(std::max(Clock::now() + Pending::kQuiet, last_crawl_ + settings_.lost_events_gap));
   if (std::exchange(lost_, true)) return;
   errno = 0;
   MARU_LOG("Share %s changes faster than can be followed; a crawl will find the rest",
@@ -195,19 +193,29 @@ void Follower::ApplyPending() {
 }
 
 void Follower::Compare(int top, const std::vector<Pending::Batch>& batches) {
+  std::vector<const Pending::Batch*> elsewhere;
   for (const Pending::Batch& batch : batches) {
     TakeEvents();
-    if (batch.folder == kShareItself) {
-      crawler_->RefreshRoot(top, target_.share);
-      continue;
-    }
-    // Gone from the share meanwhile.
-    if (batch.folder != Writer::kRoot && watcher_.Parent(batch.folder) == 0) continue;
-    const std::string path = watcher_.Path(batch.folder);
-    const UniqueFd folder = OpenPath(top, path);
-    if (folder) crawler_->CrawlNames(folder.Get(), path, batch.folder, batch.names);
+    if (!CompareNames(top, batch)) elsewhere.push_back(&batch);
   }
   crawler_->Settle(top);
+  if (elsewhere.empty()) return;
+  for (const Pending::Batch* batch : elsewhere) CompareNames(top, *batch);
+  crawler_->Settle(top);
+}
+
+/// False when the folder is not where it was last known to be: it was moved, or is gone.
+bool Follower::CompareNames(int top, const Pending::Batch& batch) {
+  if (batch.folder == kShareItself) {
+    crawler_->RefreshRoot(top, target_.share);
+    return true;
+  }
+  if (batch.folder != Writer::kRoot && watcher_.Parent(batch.folder) == 0) return true;
+  const std::string path = watcher_.Path(batch.folder);
+  const UniqueFd folder = OpenPath(top, path);
+  if (!folder || IdOf(folder.Get()).inode != watcher_.Inode(batch.folder)) return false;
+  crawler_->CrawlNames(folder.Get(), path, batch.folder, batch.names);
+  return true;
 }
 
 }  // namespace maru::indexer

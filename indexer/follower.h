@@ -24,6 +24,8 @@ class Follower : private FolderListener {
  public:
   struct Settings {
     std::chrono::seconds crawl_interval{std::chrono::hours(24)};
+    /// Between two crawls that lost events ask for.
+    std::chrono::seconds lost_events_gap{30};
   };
 
   /// `turn`: one share crawls at a time, so that memory stays bounded.
@@ -53,6 +55,7 @@ class Follower : private FolderListener {
   void CrawlBy(Clock::time_point time);
   void ApplyPending();
   void Compare(int top, const std::vector<Pending::Batch>& batches);
+  bool CompareNames(int top, const Pending::Batch& batch);
 
   const Target target_;
   Workers& workers_;

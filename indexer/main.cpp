@@ -138,7 +138,9 @@ int Run(const Options& options) {
   }
   Workers workers(processes, static_cast<std::size_t>(Config::Get().max_text_kib) << 10);
   if (options.once) return RunOnce(options, workers, signals);
-  Serve(workers, {std::chrono::hours(options.crawl_hours)});
+  Follower::Settings settings;
+  settings.crawl_interval = std::chrono::hours(options.crawl_hours);
+  Serve(workers, settings);
   return 0;
 }
 

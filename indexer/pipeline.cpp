@@ -12,8 +12,8 @@ namespace maru::indexer {
 namespace {
 
 constexpr std::size_t kMaxUnderWay = 128;
-/// Bytes of files under way in a lane, beside one large one. Prepared, each becomes ten or more where
-/// all words differ.
+/// Bytes of files under way in a lane, beside one large one. Prepared, each becomes ten or more
+/// where all words differ.
 constexpr std::size_t kMaxCost = 2u << 20;
 constexpr std::size_t kNameCost = 4u << 10;
 

@@ -6,6 +6,7 @@
 #include <cstdio>
 #include <utility>
 
+#include "indexer/listing.h"
 #include "platform/log.h"
 
 namespace maru::indexer {
@@ -39,6 +40,7 @@ void Watcher::Place(DirectoryId id, DirectoryId parent, const std::string& name)
 void Watcher::Watch(int folder, DirectoryId id) {
   if (id >= spots_.size()) spots_.resize(id + 1);
   if (!inotify_ || spots_[id].watch >= 0) return;
+  spots_[id].inode = IdOf(folder).inode;
   char path[32];
   std::snprintf(path, sizeof path, "/proc/self/fd/%d", folder);
   const int watch = inotify_add_watch(inotify_.Get(), path, kWatched);
@@ -85,6 +87,10 @@ std::string Watcher::Path(DirectoryId id) const {
 
 DirectoryId Watcher::Parent(DirectoryId id) const {
   return id < spots_.size() ? spots_[id].parent : 0;
+}
+
+std::uint64_t Watcher::Inode(DirectoryId id) const {
+  return id < spots_.size() ? spots_[id].inode : 0;
 }
 
 std::string Watcher::Name(DirectoryId id) const {

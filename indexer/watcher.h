@@ -33,6 +33,8 @@ class Watcher {
   /// "a/b" below the share's folder, "" for that itself.
   std::string Path(index::DirectoryId id) const;
   index::DirectoryId Parent(index::DirectoryId id) const;
+  /// Of the folder that was watched under this id.
+  std::uint64_t Inode(index::DirectoryId id) const;
   std::string Name(index::DirectoryId id) const;
 
   /// Becomes readable when there are events; -1 when the system gives no watches at all.
@@ -48,6 +50,7 @@ class Watcher {
   struct Spot {
     index::DirectoryId parent = 0;
     int watch = -1;
+    std::uint64_t inode = 0;
     std::string name;
   };
 

@@ -61,10 +61,14 @@ bool FilterSystemCalls() {
 
 }  // namespace
 
+bool DropCapabilities() {
+  capng_clear(CAPNG_SELECT_BOTH);
+  return capng_apply(CAPNG_SELECT_CAPS) == 0;
+}
+
 bool EnterSandbox(std::size_t max_memory) {
   prctl(PR_SET_DUMPABLE, 0);
-  capng_clear(CAPNG_SELECT_BOTH);
-  if (capng_apply(CAPNG_SELECT_CAPS) != 0) return false;
+  if (!DropCapabilities()) return false;
   if (prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) != 0) return false;
   const bool limited = Limit(RLIMIT_NOFILE, kMaxDescriptors) && Limit(RLIMIT_CORE, 0) &&
                        Limit(RLIMIT_FSIZE, 0) && (kSanitized || Limit(RLIMIT_AS, max_memory));

@@ -104,6 +104,7 @@ class Forker {
 
 void RunForker(int socket, unsigned slots, std::span<const Extractor> table) {
   prctl(PR_SET_NAME, "maruforker");
+  if (!DropCapabilities()) _exit(1);
   // The indexer ends by closing the socket; signals from the terminal are its business.
   for (const int ignored : {SIGINT, SIGTERM, SIGHUP, SIGPIPE}) signal(ignored, SIG_IGN);
   for (int descriptor = 3; descriptor < socket; ++descriptor) close(descriptor);
