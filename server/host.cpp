@@ -42,11 +42,11 @@ constexpr Poller::Key kSignals = kControl + 2;
 
 class Host {
  public:
-  Host(const Config& config, Descriptor control, Descriptor lifeline)
+  Host(const Config& config, const Plugin& plugin, Descriptor control, Descriptor lifeline)
       : control_(std::move(control)),
         lifeline_(std::move(lifeline)),
         signals_(OpenSignals({SIGCHLD, SIGTERM, SIGHUP})),
-        plugin_(config.plugin),
+        plugin_(plugin),
         sessions_(Seconds{60} * config.session_minutes),
         children_(poller_, plugin_),
         shares_(ShareTable::Current()) {
@@ -71,7 +71,7 @@ class Host {
   Answer Status() const;
 
   Descriptor control_, lifeline_, signals_;
-  Plugin plugin_;
+  const Plugin& plugin_;
   Poller poller_;
   TokenSeal seal_;
   SessionTable sessions_;
@@ -262,6 +262,8 @@ Answer Host::Status() const {
 int RunHost(const Config& config, Descriptor control, Descriptor lifeline) {
   try {
     prctl(PR_SET_NAME, "maruweb-host");
+    // Before /tmp is hidden: a plug-in being tried may lie there.
+    const Plugin plugin(config.plugin);
     MakePrivateMounts();
     umask(077);
     KeepHostCapabilities();
@@ -269,7 +271,7 @@ int RunHost(const Config& config, Descriptor control, Descriptor lifeline) {
     FindAccount("root");
     IsAdministrator("root");
     errno = 0;
-    return Host(config, std::move(control), std::move(lifeline)).Run();
+    return Host(config, plugin, std::move(control), std::move(lifeline)).Run();
   } catch (const std::exception& exception) {
     MARU_LOG("The host cannot go on: %s", exception.what());
     return 1;
