@@ -11,6 +11,9 @@ using index::Hit;
 
 constexpr std::size_t kMaxFieldNames = 64;
 constexpr std::size_t kMaxFieldName = 64;
+/// Any integer: it is brought within its bounds instead of being refused.
+constexpr std::int64_t kLow = std::numeric_limits<std::int64_t>::min();
+constexpr std::int64_t kHigh = std::numeric_limits<std::int64_t>::max();
 
 std::string KindOf(const Hit& hit) {
   if (hit.record.is_dir) return "folder";
@@ -71,8 +74,6 @@ Json::Value HitMessage(const Place& place, const Hit& hit,
 }
 
 index::FragmentOptions ReadFragmentOptions(const Arguments& arguments) {
-  constexpr std::int64_t kLow = std::numeric_limits<std::int64_t>::min();
-  constexpr std::int64_t kHigh = std::numeric_limits<std::int64_t>::max();
   index::FragmentOptions options;
   options.field = arguments.String("field", kMaxFieldName, std::string(index::kText));
   const Field* field = index::FindField(options.field);

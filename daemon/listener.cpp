@@ -15,6 +15,7 @@ namespace maru::daemon {
 namespace {
 
 constexpr int kBacklog = 512;
+constexpr int kWanted = kACLWrite | kACLExecute;
 
 std::system_error Failed(const std::string& doing) {
   return std::system_error(errno, std::generic_category(), doing);
@@ -62,7 +63,6 @@ bool MayWrite(Identity who, const std::string& folder) {
   who.unrestricted = who.uid == 0;
   FileRights rights;
   if (!ReadFileRights(AT_FDCWD, (folder + "/.").c_str(), rights)) return false;
-  constexpr int kWanted = kACLWrite | kACLExecute;
   return (RightsOf(who, rights) & kWanted) == kWanted;
 }
 
