@@ -39,12 +39,15 @@ void Watcher::Place(DirectoryId id, DirectoryId parent, const std::string& name)
 
 void Watcher::Watch(int folder, DirectoryId id) {
   if (id >= spots_.size()) spots_.resize(id + 1);
-  if (!inotify_ || spots_[id].watch >= 0) return;
-  spots_[id].inode = IdOf(folder).inode;
+  if (!inotify_) return;
   char path[32];
   std::snprintf(path, sizeof path, "/proc/self/fd/%d", folder);
+  // Asked for each time: the watch may be on a folder that is gone and whose inode lives anew.
   const int watch = inotify_add_watch(inotify_.Get(), path, kWatched);
+  spots_[id].inode = IdOf(folder).inode;
   if (watch >= 0) {
+    if (watch == spots_[id].watch) return;
+    Unlink(id);
     spots_[id].watch = watch;
     ids_.emplace(watch, id);
     return;
@@ -58,18 +61,21 @@ void Watcher::Watch(int folder, DirectoryId id) {
   complete_ = false;
 }
 
-void Watcher::Forget(DirectoryId id) {
-  if (id >= spots_.size()) return;
-  const int watch = spots_[id].watch;
-  spots_[id] = {};
-  if (watch < 0) return;
+void Watcher::Unlink(DirectoryId id) {
+  const int watch = std::exchange(spots_[id].watch, -1);
   const auto [first, last] = ids_.equal_range(watch);
   for (auto place = first; place != last; ++place) {
     if (place->second != id) continue;
     ids_.erase(place);
-    break;
+    if (!ids_.contains(watch)) inotify_rm_watch(inotify_.Get(), watch);
+    return;
   }
-  if (!ids_.contains(watch)) inotify_rm_watch(inotify_.Get(), watch);
+}
+
+void Watcher::Forget(DirectoryId id) {
+  if (id >= spots_.size()) return;
+  Unlink(id);
+  spots_[id] = {};
 }
 
 std::string Watcher::Path(DirectoryId id) const {

@@ -26,7 +26,7 @@ class Watcher {
   Watcher();
 
   void Place(index::DirectoryId id, index::DirectoryId parent, const std::string& name);
-  /// Watches an open folder; not twice.
+  /// Watches an open folder, if that is not done already.
   void Watch(int folder, index::DirectoryId id);
   void Forget(index::DirectoryId id);
 
@@ -53,6 +53,8 @@ class Watcher {
     std::uint64_t inode = 0;
     std::string name;
   };
+
+  void Unlink(index::DirectoryId id);
 
   UniqueFd inotify_;
   bool complete_ = true;
