@@ -6,15 +6,16 @@
 namespace maru::index {
 namespace {
 
-/// Size of the documents in a part, as Prepared::Size counts: what a builder holds in memory.
-constexpr std::size_t kPartBytes = 40u << 20;
+/// Size of the documents in a part, as Prepared::Size counts: what a builder holds in memory. Small
+/// parts are built in the processor's caches; what it takes to put more of them together is less.
+constexpr std::size_t kPartBytes = 16u << 20;
 /// Ids set aside for a part.
 constexpr DocumentId kPartIds = 16384;
 /// What may wait for one builder.
 constexpr std::size_t kWaitingBytes = 4u << 20;
 constexpr unsigned kMaxLanes = 8;
 /// Databases merged in one go; each takes half a dozen file descriptors.
-constexpr std::size_t kMergeWidth = 32;
+constexpr std::size_t kMergeWidth = 96;
 
 void MergeInto(const std::vector<std::string>& sources, const std::string& target) {
   Xapian::Database all;

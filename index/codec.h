@@ -36,6 +36,10 @@ class Encoder {
   std::string bytes_;
 };
 
+inline maruseeker::Error Damaged() {
+  return maruseeker::Error(maruseeker::kErrorDaemonExchange, "The index is damaged");
+}
+
 /// Reads what Encoder wrote; anything else throws Error (121). Borrows the bytes.
 class Decoder {
  public:
@@ -61,11 +65,10 @@ class Decoder {
   }
   std::string_view String() { return Bytes(Number()); }
   bool AtEnd() const { return bytes_.empty(); }
+  /// Bytes not read yet.
+  std::size_t Left() const { return bytes_.size(); }
 
  private:
-  static maruseeker::Error Damaged() {
-    return maruseeker::Error(maruseeker::kErrorDaemonExchange, "The index is damaged");
-  }
   std::string_view Bytes(std::uint64_t count) {
     if (count > bytes_.size()) throw Damaged();
     const std::string_view taken = bytes_.substr(0, count);

@@ -4,6 +4,7 @@
 
 #include "index/engine.h"
 #include "index/fields.h"
+#include "index/tokenizer.h"
 
 namespace maru::index {
 namespace {
@@ -30,6 +31,10 @@ const Field& FieldOf(const std::string& name, std::initializer_list<FieldType> t
 
 Xapian::Query Scaled(Xapian::Query query, double weight) {
   return weight == 1 ? query : Xapian::Query(Xapian::Query::OP_SCALE_WEIGHT, query, weight);
+}
+
+bool ArePaired(const std::string& first, const std::string& second) {
+  return IsSpacelessWord(first) && IsSpacelessWord(second);
 }
 
 Xapian::Query AnyOf(const std::vector<Xapian::Query>& queries) {
@@ -117,10 +122,32 @@ Xapian::Query Compiler::CompileWord(const Query& query) {
   return AnyOf(any);
 }
 
+/// The index keeps no positions of the text: it tells which documents have all the words, and the
+/// texts of those tell the rest.
+Xapian::Query Compiler::TextPhrase(const std::vector<std::string>& words) {
+  const std::string_view prefix = FindField(kText)->prefix;
+  std::vector<Xapian::Query> terms;
+  bool all_paired = words.size() > 1;
+  for (std::size_t i = 0; i < words.size(); ++i) {
+    const bool pairs = i > 0 && ArePaired(words[i - 1], words[i]);
+    const bool paired = i + 1 < words.size() && ArePaired(words[i], words[i + 1]);
+    all_paired = all_paired && (i == 0 || pairs);
+    if (pairs) terms.emplace_back(TermOf(prefix, words[i - 1] + words[i]));
+    if (!pairs && !paired) terms.emplace_back(TermOf(prefix, words[i]));
+  }
+  const Xapian::Query all(Xapian::Query::OP_AND, terms.begin(), terms.end());
+  if (words.size() == 1 || (words.size() == 2 && all_paired)) return all;
+  return Xapian::Query(Xapian::Query::OP_FILTER, all, sources_.Phrase(words));
+}
+
 Xapian::Query Compiler::CompilePhrase(const Query& query) {
   std::vector<Xapian::Query> any;
   for (const FieldWeight& where : query.fields) {
     const Field& field = FieldOf(where.field, {FieldType::kText});
+    if (where.field == kText) {
+      any.push_back(Scaled(TextPhrase(query.words), where.weight));
+      continue;
+    }
     std::vector<std::string> terms;
     for (const std::string& word : query.words) terms.push_back(TermOf(field.prefix, word));
     any.push_back(Scaled(Xapian::Query(Xapian::Query::OP_PHRASE, terms.begin(), terms.end(),
@@ -192,7 +219,7 @@ Xapian::Query Compiler::Compile(const Query& query, unsigned depth) {
     case Query::Kind::kRange:
       return CompileRange(query);
     case Query::Kind::kUnder:
-      return folders_(query.text);
+      return sources_.Under(query.text);
     default:
       return CompileParts(query, depth);
   }

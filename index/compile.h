@@ -2,32 +2,30 @@
 
 #include <xapian.h>
 
-#include <functional>
-#include <memory>
 #include <string>
 #include <vector>
 
+#include "index/matcher.h"
 #include "index/query.h"
 
 /// From a query's tree to the engine's, and to the words that are marked in fragments.
 namespace maru::index {
 
-/// Words that count as one in a field: forms of a word, completions of a prefix, or a phrase.
-struct MarkGroup {
-  std::string field;
-  /// Folded words without prefix; of a phrase: in its order.
-  std::vector<std::string> words;
-  bool phrase = false;
+/// Makes the sources of what only the reader knows of documents. Those of Phrase look for the
+/// words, one behind the other, in the stored text of each document that has them all.
+class Sources {
+ public:
+  virtual ~Sources() = default;
+  /// What lies under a full path within the searched shares.
+  virtual Xapian::Query Under(const std::string& full_path) = 0;
+  virtual Xapian::Query Phrase(const std::vector<std::string>& words) = 0;
 };
-
-/// Makes the source that accepts what lies under a full path within the searched shares.
-using FolderSource = std::function<Xapian::Query(const std::string& full_path)>;
 
 /// Throws Error (120) for a tree that is too deep or too large or names a field of another type.
 class Compiler {
  public:
-  Compiler(const Xapian::Database& database, FolderSource folders)
-      : database_(database), folders_(std::move(folders)) {}
+  Compiler(const Xapian::Database& database, Sources& sources)
+      : database_(database), sources_(sources) {}
 
   Xapian::Query Compile(const Query& query);
 
@@ -44,6 +42,7 @@ class Compiler {
   Xapian::Query Compile(const Query& query, unsigned depth);
   Xapian::Query CompileWord(const Query& query);
   Xapian::Query CompilePhrase(const Query& query);
+  Xapian::Query TextPhrase(const std::vector<std::string>& words);
   Xapian::Query CompileValue(const Query& query);
   Xapian::Query CompileRange(const Query& query);
   Xapian::Query CompileParts(const Query& query, unsigned depth);
@@ -53,7 +52,7 @@ class Compiler {
   std::vector<std::string> Forms(const std::string& word, std::string_view field_prefix);
 
   Xapian::Database database_;
-  FolderSource folders_;
+  Sources& sources_;
   unsigned nodes_ = 0;
 };
 

@@ -3,70 +3,55 @@
 #include <utf8proc.h>
 
 #include <algorithm>
-#include <unordered_map>
-
-#include "index/engine.h"
-#include "index/tokenizer.h"
 
 namespace maru::index {
 namespace {
 
-/// Characters of an average word with the blank behind it.
-constexpr std::size_t kWordCharacters = 7;
-/// Positions looked at per group: enough for the best fragments of any text.
-constexpr std::size_t kMaxSpans = 4000;
+/// Chunks of one text that are looked into, and those with matches among them.
+constexpr std::size_t kMaxChunks = 64;
+constexpr std::size_t kMaxMatching = 8;
+/// How far a window's edge moves to fall between words.
+constexpr std::size_t kMaxEdge = 40;
 
-using Positions = std::vector<Xapian::termpos>;
-
-Positions PositionsOf(const Xapian::Database& database, Xapian::docid document,
-                      const std::string& term) {
-  Positions positions;
-  auto position = database.positionlist_begin(document, term);
-  for (; position != database.positionlist_end(document, term); ++position) {
-    if (positions.size() >= kMaxSpans) break;
-    positions.push_back(*position);
-  }
-  return positions;
+bool IsBlank(char c) {
+  return static_cast<unsigned char>(c) <= 0x20 || c == 0x7f;
 }
 
-/// The group's words that the document has: one walk over its list of terms, when there are many.
-std::vector<std::string> TermsInDocument(const Xapian::Database& database, Xapian::docid document,
-                                         std::string_view prefix,
-                                         const std::vector<std::string>& words) {
-  std::vector<std::string> terms;
-  for (const std::string& word : words) terms.push_back(TermOf(prefix, word));
-  constexpr std::size_t kFew = 4;
-  if (terms.size() <= kFew) return terms;
-  std::sort(terms.begin(), terms.end());
-  std::vector<std::string> present;
-  auto here = database.termlist_begin(document);
-  for (const std::string& term : terms) {
-    if (here == database.termlist_end(document)) break;
-    here.skip_to(term);
-    if (here != database.termlist_end(document) && *here == term) present.push_back(term);
-  }
-  return present;
+bool IsInside(char c) {
+  return (static_cast<unsigned char>(c) & 0xc0) == 0x80;
 }
 
-void AddPhraseSpans(const std::vector<Positions>& positions, std::size_t group,
-                    std::vector<Span>& spans) {
-  if (positions.empty()) return;
-  for (const Xapian::termpos first : positions[0]) {
-    bool whole = true;
-    for (std::size_t i = 1; whole && i < positions.size(); ++i) {
-      whole = std::binary_search(positions[i].begin(), positions[i].end(),
-                                 first + static_cast<Xapian::termpos>(i));
-    }
-    if (whole) {
-      spans.push_back({first, first + static_cast<Xapian::termpos>(positions.size() - 1), group});
-    }
-  }
+bool IsWordByte(char c) {
+  const auto byte = static_cast<unsigned char>(c);
+  return byte >= 0x80 || kAsciiFold[byte];
 }
 
-void Sort(std::vector<Span>& spans) {
-  std::sort(spans.begin(), spans.end(), [](const Span& a, const Span& b) {
-    return a.first != b.first ? a.first < b.first : a.last > b.last;
-  });
+/// Whether a reader sees a character begin at `at`: of a run of blanks, one.
+bool Shows(std::string_view text, std::size_t at) {
+  if (IsInside(text[at])) return false;
+  return !IsBlank(text[at]) || at + 1 == text.size() || !IsBlank(text[at + 1]);
+}
+
+bool SplitsWord(std::string_view text, std::size_t at) {
+  return at > 0 && at < text.size() && IsWordByte(text[at - 1]) && IsWordByte(text[at]);
+}
+
+std::size_t Back(std::string_view text, std::size_t at, std::size_t characters) {
+  const std::size_t start = at;
+  while (at > 0 && characters > 0) characters -= Shows(text, --at);
+  std::size_t edge = at;
+  while (edge < start && edge - at < kMaxEdge && SplitsWord(text, edge)) ++edge;
+  return SplitsWord(text, edge) ? at : edge;
+}
+
+std::size_t Forth(std::string_view text, std::size_t at, std::size_t characters) {
+  while (at < text.size() && (characters > 0 || IsInside(text[at]))) {
+    characters -= characters > 0 && Shows(text, at);
+    ++at;
+  }
+  std::size_t edge = at;
+  while (edge - at < kMaxEdge && SplitsWord(text, edge)) ++edge;
+  return SplitsWord(text, edge) ? at : edge;
 }
 
 void AppendEscaped(std::string& html, std::string_view text) {
@@ -116,144 +101,141 @@ void AppendEscaped(std::string& html, std::string_view text) {
   }
 }
 
+/// How many groups a chunk may hold.
+unsigned Promise(const StoredText& text, std::size_t chunk, const std::vector<MarkGroup>& groups,
+                 const std::vector<PhraseFinder>& phrases) {
+  unsigned promise = 0;
+  for (std::size_t i = 0; i < groups.size(); ++i) {
+    if (groups[i].phrase) {
+      promise += phrases[i].MayBegin(text, chunk);
+      continue;
+    }
+    promise +=
+        std::any_of(groups[i].words.begin(), groups[i].words.end(),
+                    [&](const std::string& word) { return text.MayHold(chunk, HashWord(word)); });
+  }
+  return promise;
+}
+
+/// The chunks that promise the most, in that order.
+std::vector<std::size_t> Promising(const StoredText& text, const std::vector<MarkGroup>& groups) {
+  std::vector<std::size_t> chunks;
+  if (text.Chunks() == 1) return {0};
+  std::vector<PhraseFinder> phrases;
+  for (const MarkGroup& group : groups) {
+    phrases.emplace_back(group.phrase ? group.words : std::vector<std::string>{});
+  }
+  std::vector<unsigned> promises;
+  for (std::size_t chunk = 0; chunk < text.Chunks(); ++chunk) {
+    promises.push_back(Promise(text, chunk, groups, phrases));
+    if (promises.back() > 0) chunks.push_back(chunk);
+  }
+  std::stable_sort(chunks.begin(), chunks.end(),
+                   [&](std::size_t a, std::size_t b) { return promises[a] > promises[b]; });
+  if (chunks.size() > kMaxChunks) chunks.resize(kMaxChunks);
+  return chunks;
+}
+
+struct Found {
+  Window window;
+  std::string html;
+};
+
+bool IsBetter(const Window& a, const Window& b) {
+  return a.groups != b.groups ? a.groups > b.groups : a.matches > b.matches;
+}
+
 }  // namespace
 
-std::vector<Span> SpansFromIndex(const Xapian::Database& database, Xapian::docid document,
-                                 std::string_view field_prefix,
-                                 const std::vector<MarkGroup>& groups) {
-  std::vector<Span> spans;
-  for (std::size_t group = 0; group < groups.size(); ++group) {
-    if (groups[group].phrase) {
-      std::vector<Positions> positions;
-      for (const std::string& word : groups[group].words) {
-        positions.push_back(PositionsOf(database, document, TermOf(field_prefix, word)));
-      }
-      AddPhraseSpans(positions, group, spans);
-      continue;
-    }
-    for (const std::string& term :
-         TermsInDocument(database, document, field_prefix, groups[group].words)) {
-      for (const Xapian::termpos position : PositionsOf(database, document, term)) {
-        spans.push_back({position, position, group});
-      }
-    }
-  }
-  Sort(spans);
-  return spans;
-}
-
-std::vector<Span> SpansInText(std::string_view text, const std::vector<MarkGroup>& groups) {
-  std::unordered_map<std::string, Positions> words;
-  Xapian::termpos position = 0;
-  Tokenizer().ForEach(text, [&](const Token& token) {
-    words[std::string(token.word)].push_back(++position);
-    return true;
-  });
-  std::vector<Span> spans;
-  for (std::size_t group = 0; group < groups.size(); ++group) {
-    std::vector<Positions> positions;
-    for (const std::string& word : groups[group].words) {
-      const auto found = words.find(word);
-      positions.push_back(found == words.end() ? Positions{} : found->second);
-    }
-    if (groups[group].phrase) {
-      AddPhraseSpans(positions, group, spans);
-      continue;
-    }
-    for (const Positions& list : positions) {
-      for (const Xapian::termpos at : list) spans.push_back({at, at, group});
-    }
-  }
-  Sort(spans);
-  return spans;
-}
-
-std::vector<Window> BestWindows(const std::vector<Span>& spans, const FragmentOptions& options) {
-  const auto width =
-      static_cast<Xapian::termpos>(std::max<std::size_t>(options.length / kWordCharacters, 4));
-  struct Candidate {
-    std::size_t begin, end;
-    std::size_t groups;
+std::vector<Window> BestWindows(std::string_view text, const std::vector<Match>& matches,
+                                const FragmentOptions& options) {
+  std::vector<Window> candidates;
+  std::vector<unsigned> inside;
+  unsigned different = 0;
+  const auto enter = [&](std::size_t group) {
+    if (inside.size() <= group) inside.resize(group + 1);
+    different += inside[group]++ == 0;
   };
-  std::vector<Candidate> candidates;
-  std::unordered_map<std::size_t, unsigned> inside;
   std::size_t end = 0;
-  for (std::size_t begin = 0; begin < spans.size(); ++begin) {
-    end = std::max(end, begin);
-    while (end < spans.size() && spans[end].last < spans[begin].first + width) {
-      ++inside[spans[end++].group];
+  for (std::size_t begin = 0; begin < matches.size(); ++begin) {
+    while (end < matches.size() &&
+           (end <= begin || matches[end].end <= matches[begin].begin + options.length)) {
+      enter(matches[end++].group);
     }
-    if (end == begin) ++inside[spans[end++].group];
-    candidates.push_back({begin, end, inside.size()});
-    if (--inside[spans[begin].group] == 0) inside.erase(spans[begin].group);
+    candidates.push_back({begin, end, different, static_cast<unsigned>(end - begin)});
+    different -= --inside[matches[begin].group] == 0;
   }
-  std::stable_sort(
-      candidates.begin(), candidates.end(), [](const Candidate& a, const Candidate& b) {
-        return a.groups != b.groups ? a.groups > b.groups : a.end - a.begin > b.end - b.begin;
-      });
+  std::stable_sort(candidates.begin(), candidates.end(), IsBetter);
   std::vector<Window> windows;
-  for (const Candidate& candidate : candidates) {
+  for (const Window& candidate : candidates) {
     if (windows.size() >= options.count) break;
-    const Xapian::termpos first = spans[candidate.begin].first;
-    const Xapian::termpos last = spans[candidate.end - 1].last;
-    const Xapian::termpos covered = last - first + 1;
-    const Xapian::termpos before = covered < width ? (width - covered) / 2 : 0;
-    const Xapian::termpos from = first > before ? first - before : 1;
-    const Window window{from, std::max(last, from + width - 1),
-                        static_cast<unsigned>(candidate.end - candidate.begin)};
+    const std::size_t first = matches[candidate.begin].begin;
+    std::size_t last = 0;
+    for (std::size_t i = candidate.begin; i < candidate.end; ++i) {
+      last = std::max(last, matches[i].end);
+    }
+    const std::size_t covered = std::min(options.length, last - first);
+    Window window = candidate;
+    window.begin = Back(text, first, (options.length - covered) / 2);
+    window.end = Forth(text, last, options.length - covered - (options.length - covered) / 2);
     const bool overlaps = std::any_of(windows.begin(), windows.end(), [&](const Window& other) {
-      return window.first <= other.last && other.first <= window.last;
+      return window.begin < other.end && other.begin < window.end;
     });
     if (!overlaps) windows.push_back(window);
   }
   return windows;
 }
 
-std::string RenderWindow(const TextPiece& piece, const Window& window,
-                         const std::vector<Span>& spans) {
-  const std::string_view text = piece.text;
+std::string RenderWindow(std::string_view text, const Window& window,
+                         const std::vector<Match>& matches) {
   std::string html;
-  Xapian::termpos position = piece.first_position - 1;
-  std::size_t rendered =
-      piece.first_position >= window.first && !piece.more_before ? 0 : text.size();
-  std::size_t begin_of_next = text.size();
-  bool started = rendered == 0;
-  bool marking = false;
-  Xapian::termpos mark_end = 0;
-  auto span =
-      std::lower_bound(spans.begin(), spans.end(), window.first,
-                       [](const Span& a, Xapian::termpos first) { return a.first < first; });
-  Tokenizer().ForEach(text, [&](const Token& token) {
-    ++position;
-    if (position < window.first) return true;
-    if (position > window.last) {
-      begin_of_next = token.begin;
-      return false;
+  std::size_t rendered = window.begin;
+  auto match = std::lower_bound(matches.begin(), matches.end(), window.begin,
+                                [](const Match& a, std::size_t begin) { return a.begin < begin; });
+  for (; match != matches.end() && match->end <= window.end; ++match) {
+    if (match->begin < rendered) continue;
+    AppendEscaped(html, text.substr(rendered, match->begin - rendered));
+    html += "<mark>";
+    AppendEscaped(html, text.substr(match->begin, match->end - match->begin));
+    html += "</mark>";
+    rendered = match->end;
+  }
+  AppendEscaped(html, text.substr(rendered, window.end - rendered));
+  const std::size_t begin = std::min(html.find_first_not_of(' '), html.size());
+  const std::size_t end = html.find_last_not_of(' ') + 1;
+  return begin < end ? html.substr(begin, end - begin) : std::string();
+}
+
+std::vector<Fragment> FragmentsOf(StoredText& text, const std::vector<MarkGroup>& groups,
+                                  const FragmentOptions& options) {
+  const Matcher matcher(groups);
+  std::vector<Found> found;
+  std::string piece;
+  std::size_t matching = 0;
+  for (const std::size_t chunk : Promising(text, groups)) {
+    piece.clear();
+    if (!text.Append(chunk, piece)) continue;
+    std::vector<Match> matches = matcher.MatchesIn(piece);
+    // Only a phrase can begin here and end in the next chunk.
+    if (matches.empty() && chunk + 1 < text.Chunks() && text.Append(chunk + 1, piece)) {
+      matches = matcher.MatchesIn(piece);
     }
-    if (!started) {
-      rendered = token.begin;
-      started = true;
+    for (const Window& window : BestWindows(piece, matches, options)) {
+      found.push_back({window, RenderWindow(piece, window, matches)});
     }
-    while (span != spans.end() && span->first < position) ++span;
-    if (span != spans.end() && span->first == position && !marking) {
-      AppendEscaped(html, text.substr(rendered, token.begin - rendered));
-      rendered = token.begin;
-      html += "<mark>";
-      marking = true;
-      mark_end = span->last;
+    const bool enough = found.size() >= options.count && found[0].window.groups == groups.size();
+    matching += !matches.empty();
+    if (enough || matching == kMaxMatching) break;
+  }
+  std::stable_sort(found.begin(), found.end(),
+                   [](const Found& a, const Found& b) { return IsBetter(a.window, b.window); });
+  std::vector<Fragment> fragments;
+  for (Found& one : found) {
+    if (fragments.size() < options.count && !one.html.empty()) {
+      fragments.push_back({std::move(one.html), one.window.matches});
     }
-    if (marking && position >= mark_end) {
-      AppendEscaped(html, text.substr(rendered, token.end - rendered));
-      rendered = token.end;
-      html += "</mark>";
-      marking = false;
-    }
-    return true;
-  });
-  if (started) AppendEscaped(html, text.substr(rendered, begin_of_next - rendered));
-  if (marking) html += "</mark>";
-  while (html.ends_with(' ')) html.pop_back();
-  return html;
+  }
+  return fragments;
 }
 
 }  // namespace maru::index

@@ -8,48 +8,92 @@ namespace maru::index {
 namespace {
 
 /// Documents between two looks at whether somebody still waits.
-constexpr unsigned kCallsBetweenLooks = 1024;
+constexpr unsigned kPlacesBetweenLooks = 1024;
+constexpr unsigned kTextsBetweenLooks = 32;
 
 }  // namespace
 
-void PlaceSource::init(const Xapian::Database& database) {
+void ChoiceSource::Begin(const Xapian::Database& database, Xapian::doccount estimate) {
   database_ = database;
+  value_begun_ = false;
   documents_ = database.get_doccount();
+  estimate_ = estimate;
   last_ = database.get_lastdocid();
   at_ = 0;
   const auto share = shares_->find(database.get_uuid());
   share_ = share == shares_->end() ? shares_->size() : share->second;
-  judges_ = rule_->Judges(share_);
-  if (judges_) value_ = database_.valuestream_begin(kPlaceSlot);
   set_maxweight(0);
 }
 
-bool PlaceSource::AcceptsHere() {
-  if (++calls_ % kCallsBetweenLooks == 0 && cancelled_ && cancelled_()) throw Cancelled{};
-  if (!judges_) return true;
-  if (value_ == database_.valuestream_end(kPlaceSlot)) return false;
-  value_.skip_to(at_);
-  if (value_ == database_.valuestream_end(kPlaceSlot) || value_.get_docid() != at_) return false;
-  return rule_->Accepts(share_, at_, Place::Decode(*value_));
+std::string ChoiceSource::ValueOf(Xapian::docid document, Xapian::valueno slot) {
+  if (!value_begun_) value_ = database_.valuestream_begin(slot);
+  value_begun_ = true;
+  if (value_ == database_.valuestream_end(slot)) return {};
+  value_.skip_to(document);
+  if (value_ == database_.valuestream_end(slot) || value_.get_docid() != document) return {};
+  return *value_;
 }
 
-void PlaceSource::Rest() {
+bool ChoiceSource::AcceptsHere() {
+  if (++calls_ % calls_between_looks_ == 0 && cancelled_ && cancelled_()) throw Cancelled{};
+  return Accepts(at_);
+}
+
+void ChoiceSource::Rest() {
   while (at_ <= last_ && !AcceptsHere()) ++at_;
 }
 
-void PlaceSource::next(double) {
+void ChoiceSource::next(double) {
   ++at_;
   Rest();
 }
 
-void PlaceSource::skip_to(Xapian::docid document, double) {
+void ChoiceSource::skip_to(Xapian::docid document, double) {
   at_ = std::max(at_, document);
   Rest();
 }
 
-bool PlaceSource::check(Xapian::docid document, double) {
+bool ChoiceSource::check(Xapian::docid document, double) {
   at_ = std::max(at_, document);
   return at_ > last_ || AcceptsHere();
+}
+
+PlaceSource::PlaceSource(std::shared_ptr<const PlaceRule> rule,
+                         std::shared_ptr<const ShareNumbers> shares,
+                         std::function<bool()> cancelled)
+    : ChoiceSource(std::move(shares), std::move(cancelled), kPlacesBetweenLooks),
+      rule_(std::move(rule)) {}
+
+void PlaceSource::init(const Xapian::Database& database) {
+  const Xapian::doccount documents = database.get_doccount();
+  // Before any look into a text.
+  Begin(database, documents > 0 ? documents - 1 : 0);
+  judges_ = rule_->Judges(share_);
+}
+
+bool PlaceSource::Accepts(Xapian::docid document) {
+  if (!judges_) return true;
+  const std::string place = ValueOf(document, kPlaceSlot);
+  return !place.empty() && rule_->Accepts(share_, document, Place::Decode(place));
+}
+
+PhraseSource::PhraseSource(std::vector<std::string> words, Texts texts,
+                           std::shared_ptr<const ShareNumbers> shares,
+                           std::function<bool()> cancelled)
+    : ChoiceSource(std::move(shares), std::move(cancelled), kTextsBetweenLooks),
+      words_(std::move(words)),
+      texts_(std::move(texts)),
+      finder_(words_) {}
+
+void PhraseSource::init(const Xapian::Database& database) {
+  Begin(database, database.get_doccount());
+}
+
+bool PhraseSource::Accepts(Xapian::docid document) {
+  if (share_ >= texts_.size()) return false;
+  const std::string place = ValueOf(document, kTextSlot);
+  return !place.empty() && text_.Open(*texts_[share_], TextPlace::Decode(place)) &&
+         finder_.IsIn(text_);
 }
 
 void BoostSource::init(const Xapian::Database& database) {

@@ -9,6 +9,8 @@
 #include <vector>
 
 #include "index/directories.h"
+#include "index/matcher.h"
+#include "index/texts.h"
 
 /// What the matcher asks about single documents: may these eyes see it, does it lie in that folder,
 /// was it opened before. Consulted in the order of document ids, one share at a time.
@@ -27,40 +29,88 @@ class PlaceRule {
 /// Share numbers by the engine's name of each database.
 using ShareNumbers = std::map<std::string, std::size_t>;
 
-/// A weightless source of all documents that a rule accepts; also where a search finds out that
-/// nobody waits for it any more (throws Cancelled).
-class PlaceSource : public Xapian::PostingSource {
+/// A weightless source of all documents that it accepts; also where a search finds out that nobody
+/// waits for it any more (throws Cancelled).
+class ChoiceSource : public Xapian::PostingSource {
  public:
-  PlaceSource(std::shared_ptr<const PlaceRule> rule, std::shared_ptr<const ShareNumbers> shares,
-              std::function<bool()> cancelled)
-      : rule_(std::move(rule)), shares_(std::move(shares)), cancelled_(std::move(cancelled)) {}
-
   Xapian::doccount get_termfreq_min() const override { return 0; }
-  Xapian::doccount get_termfreq_est() const override { return documents_; }
+  Xapian::doccount get_termfreq_est() const override { return estimate_; }
   Xapian::doccount get_termfreq_max() const override { return documents_; }
   void next(double min_weight) override;
   void skip_to(Xapian::docid document, double min_weight) override;
   bool check(Xapian::docid document, double min_weight) override;
   bool at_end() const override { return at_ > last_; }
   Xapian::docid get_docid() const override { return at_; }
-  PlaceSource* clone() const override { return new PlaceSource(rule_, shares_, cancelled_); }
-  void init(const Xapian::Database& database) override;
+
+ protected:
+  ChoiceSource(std::shared_ptr<const ShareNumbers> shares, std::function<bool()> cancelled,
+               unsigned calls_between_looks)
+      : shares_(std::move(shares)),
+        cancelled_(std::move(cancelled)),
+        calls_between_looks_(calls_between_looks) {}
+
+  /// Called with documents in ascending order.
+  virtual bool Accepts(Xapian::docid document) = 0;
+  /// Begins with a database. The matcher asks the source with the least `estimate` first.
+  void Begin(const Xapian::Database& database, Xapian::doccount estimate);
+  /// The value of a document in a slot: at `value`, which moves there; empty when it has none.
+  std::string ValueOf(Xapian::docid document, Xapian::valueno slot);
+
+  std::shared_ptr<const ShareNumbers> shares_;
+  std::function<bool()> cancelled_;
+  /// Of the database; the number of shares when it is unknown.
+  std::size_t share_ = 0;
 
  private:
   bool AcceptsHere();
   void Rest();
 
-  std::shared_ptr<const PlaceRule> rule_;
-  std::shared_ptr<const ShareNumbers> shares_;
-  std::function<bool()> cancelled_;
+  unsigned calls_between_looks_;
+  unsigned calls_ = 0;
   Xapian::Database database_;
   Xapian::ValueIterator value_;
+  bool value_begun_ = false;
   Xapian::docid at_ = 0;
   Xapian::docid last_ = 0;
   Xapian::doccount documents_ = 0;
-  std::size_t share_ = 0;
+  Xapian::doccount estimate_ = 0;
+};
+
+/// What a rule accepts.
+class PlaceSource : public ChoiceSource {
+ public:
+  PlaceSource(std::shared_ptr<const PlaceRule> rule, std::shared_ptr<const ShareNumbers> shares,
+              std::function<bool()> cancelled);
+  PlaceSource* clone() const override { return new PlaceSource(rule_, shares_, cancelled_); }
+  void init(const Xapian::Database& database) override;
+
+ private:
+  bool Accepts(Xapian::docid document) override;
+
+  std::shared_ptr<const PlaceRule> rule_;
   bool judges_ = true;
-  unsigned calls_ = 0;
+};
+
+/// Documents with a phrase in their stored text; to be asked about those that have its words.
+class PhraseSource : public ChoiceSource {
+ public:
+  /// The stored texts of each share.
+  using Texts = std::vector<TextReader*>;
+
+  PhraseSource(std::vector<std::string> words, Texts texts,
+               std::shared_ptr<const ShareNumbers> shares, std::function<bool()> cancelled);
+  PhraseSource* clone() const override {
+    return new PhraseSource(words_, texts_, shares_, cancelled_);
+  }
+  void init(const Xapian::Database& database) override;
+
+ private:
+  bool Accepts(Xapian::docid document) override;
+
+  std::vector<std::string> words_;
+  Texts texts_;
+  PhraseFinder finder_;
+  StoredText text_;
 };
 
 /// Adds to the weight of single documents.

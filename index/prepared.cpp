@@ -2,6 +2,7 @@
 
 #include "index/engine.h"
 #include "index/fields.h"
+#include "index/term_counts.h"
 #include "index/texts.h"
 #include "index/tokenizer.h"
 
@@ -32,15 +33,25 @@ void AddValue(Xapian::Document& engine, std::string_view field, std::string_view
 }
 
 std::string AddText(Xapian::Document& engine, std::string_view text) {
+  thread_local TermCounts counts;
+  counts.Clear();
   TextPacker packer(text);
-  Xapian::termpos position = 0;
-  std::string term;
+  // A character of a script without spaces that the word before was.
+  std::string before;
   Tokenizer().ForEach(text, [&](const Token& token) {
-    ++position;
-    packer.BeforeWord(position, token.begin);
-    term.assign(token.word);
-    engine.add_posting(term, position);
+    const std::uint64_t hash = HashWord(token.word);
+    packer.AddWord(hash, token.begin);
+    counts.Add(hash, token.word);
+    const bool spaceless = IsSpacelessWord(token.word);
+    if (spaceless && !before.empty()) {
+      before += token.word;
+      counts.Add(HashWord(before), before);
+    }
+    before.assign(spaceless ? token.word : std::string_view());
     return true;
+  });
+  counts.ForEach([&](std::string_view word, std::uint32_t count) {
+    engine.add_term(std::string(word), count);
   });
   return packer.Finish();
 }
@@ -89,8 +100,7 @@ Prepared::Prepared(Document document) : parts_(std::make_unique<Parts>()) {
     }
     parts_->packed_text = AddText(parts_->engine, document.text);
   });
-  // An entry costs the engine a term and a list of positions: about six times the text, by
-  // measurement.
+  // What a document's terms cost the engine while they wait to be written, by measurement.
   parts_->size = 2000 + document.text.size() * 3 + parts_->packed_text.size();
   document.text = {};
   parts_->document = std::move(document);

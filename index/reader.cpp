@@ -130,10 +130,9 @@ bool EngineReader::Sees(std::size_t share, const Xapian::Document& document) con
   return eyes_[share]->Sees(place.parent, place.condition);
 }
 
-Xapian::Query EngineReader::Gated(const Xapian::Query& query,
-                                  const std::function<bool()>& cancelled) {
+Xapian::Query EngineReader::Gated(const Xapian::Query& query) {
   if (blind_) return Xapian::Query::MatchNothing;
-  auto* gate = new PlaceSource(std::make_shared<EyesRule>(eyes_), indices_->Numbers(), cancelled);
+  auto* gate = new PlaceSource(std::make_shared<EyesRule>(eyes_), indices_->Numbers(), cancelled_);
   return Xapian::Query(Xapian::Query::OP_FILTER, query, Xapian::Query(gate->release()));
 }
 
@@ -160,12 +159,16 @@ Xapian::Query EngineReader::Under(const std::string& full_path) {
                        Xapian::Query(source->release()));
 }
 
-Compiler EngineReader::MakeCompiler() {
-  return Compiler(indices_->All(), [this](const std::string& path) { return Under(path); });
+Xapian::Query EngineReader::Phrase(const std::vector<std::string>& words) {
+  PhraseSource::Texts texts;
+  for (std::size_t i = 0; i < indices_->Count(); ++i) texts.push_back(&indices_->Index(i).texts);
+  auto* source = new PhraseSource(words, std::move(texts), indices_->Numbers(), cancelled_);
+  return Xapian::Query(source->release());
 }
 
 Xapian::Enquire EngineReader::Enquire(const Query& query, const SearchOptions& options) {
-  Xapian::Query compiled = MakeCompiler().Compile(query);
+  cancelled_ = options.cancelled;
+  Xapian::Query compiled = Compiler(indices_->All(), *this).Compile(query);
   if (!options.boosts.empty()) {
     auto boosts = std::make_shared<BoostSource::Boosts>(options.boosts);
     for (auto& [place, boost] : *boosts) boost *= kBoostWeight;
@@ -174,7 +177,7 @@ Xapian::Enquire EngineReader::Enquire(const Query& query, const SearchOptions& o
         Xapian::Query(Xapian::Query::OP_AND_MAYBE, compiled, Xapian::Query(source->release()));
   }
   Xapian::Enquire enquire(indices_->All());
-  enquire.set_query(Gated(compiled, options.cancelled));
+  enquire.set_query(Gated(compiled));
   if (options.sort_field.empty()) return enquire;
   const Field* field = FindField(options.sort_field);
   if (!field || field->slot < 0) {
@@ -191,7 +194,7 @@ Hit EngineReader::HitOf(std::size_t share, DocumentId id, const Xapian::Document
   Hit hit;
   hit.share = share;
   hit.document = id;
-  hit.record = StoredRecord::Decode(document.get_value(kRecordSlot)).record;
+  hit.record = DecodeRecord(document.get_value(kRecordSlot));
   hit.owner = table.Condition(place.condition).uid;
   if (place.parent != 0) hit.path = table.PathOf(place.parent) + "/" + hit.record.name;
   return hit;
@@ -251,29 +254,43 @@ std::vector<std::uint64_t> EngineReader::Count(const Query& query,
 
 const std::vector<MarkGroup>& EngineReader::MarksOf(const Query& query) {
   if (!marked_ || !(marked_query_ == query)) {
-    marks_ = MakeCompiler().Marks(query);
+    marks_ = Compiler(indices_->All(), *this).Marks(query);
     marked_query_ = query;
     marked_ = true;
   }
   return marks_;
 }
 
+/// Keeps of each group the words that the document has, and the groups that have some.
+std::vector<MarkGroup> EngineReader::InDocument(std::size_t share, DocumentId document,
+                                                const std::vector<MarkGroup>& groups) const {
+  const std::string prefix(FindField(kText)->prefix);
+  const Xapian::Database& database = indices_->Database(share);
+  std::vector<MarkGroup> present;
+  for (MarkGroup group : groups) {
+    if (!group.phrase && group.words.size() > 1) {
+      std::sort(group.words.begin(), group.words.end());
+      auto here = database.termlist_begin(document);
+      std::erase_if(group.words, [&](const std::string& word) {
+        const std::string term = prefix + word;
+        if (here != database.termlist_end(document)) here.skip_to(term);
+        return here == database.termlist_end(document) || *here != term;
+      });
+    }
+    if (!group.words.empty()) present.push_back(std::move(group));
+  }
+  return present;
+}
+
 std::vector<Fragment> EngineReader::TextFragments(std::size_t share, DocumentId document,
                                                   const std::vector<MarkGroup>& groups,
                                                   const FragmentOptions& options) {
-  const Xapian::Database& database = indices_->Database(share);
-  const std::vector<Span> spans =
-      SpansFromIndex(database, document, FindField(kText)->prefix, groups);
-  std::vector<Fragment> fragments;
-  if (spans.empty()) return fragments;
-  const TextPlace text =
-      StoredRecord::Decode(database.get_document(document).get_value(kRecordSlot)).text;
-  for (const Window& window : BestWindows(spans, options)) {
-    const TextPiece piece = indices_->Index(share).texts.Read(text, window.first, window.last);
-    std::string html = RenderWindow(piece, window, spans);
-    if (!html.empty()) fragments.push_back({std::move(html), window.matches});
-  }
-  return fragments;
+  const auto place =
+      TextPlace::Decode(indices_->Database(share).get_document(document).get_value(kTextSlot));
+  StoredText text;
+  if (groups.empty() || !text.Open(indices_->Index(share).texts, place)) return {};
+  return FragmentsOf(text, text.Chunks() > 1 ? InDocument(share, document, groups) : groups,
+                     options);
 }
 
 std::vector<Fragment> EngineReader::Fragments(std::size_t share, DocumentId document,
@@ -292,10 +309,10 @@ std::vector<Fragment> EngineReader::Fragments(std::size_t share, DocumentId docu
     if (options.field == kAuthors) {
       for (const std::string& author : record.authors) text += (text.empty() ? "" : "; ") + author;
     }
-    const std::vector<Span> spans = SpansInText(text, groups);
-    if (spans.empty()) return {};
-    const Window whole{1, UINT32_MAX, static_cast<unsigned>(spans.size())};
-    return {{RenderWindow({text, 1, false, false}, whole, spans), whole.matches}};
+    const std::vector<Match> matches = Matcher(groups).MatchesIn(text);
+    if (matches.empty()) return {};
+    const Window whole{0, text.size(), 1, static_cast<unsigned>(matches.size())};
+    return {{RenderWindow(text, whole, matches), whole.matches}};
   });
 }
 

@@ -15,7 +15,7 @@
 namespace maru::index {
 
 /// A Reader on handles borrowed from a Library.
-class EngineReader : public Reader {
+class EngineReader : public Reader, private Sources {
  public:
   using GiveBack = std::function<void(std::unique_ptr<OpenIndices>)>;
 
@@ -45,15 +45,18 @@ class EngineReader : public Reader {
   template <class Work>
   auto OnOneState(const char* doing, Work&& work) -> decltype(work());
 
+  Xapian::Query Under(const std::string& full_path) override;
+  Xapian::Query Phrase(const std::vector<std::string>& words) override;
+
   /// The query as these eyes may ask it.
-  Xapian::Query Gated(const Xapian::Query& query, const std::function<bool()>& cancelled);
-  Compiler MakeCompiler();
-  Xapian::Query Under(const std::string& full_path);
+  Xapian::Query Gated(const Xapian::Query& query);
   Xapian::Enquire Enquire(const Query& query, const SearchOptions& options);
   bool Sees(std::size_t share, const Xapian::Document& document) const;
   bool SomeDocumentSeen(const std::string& term) const;
   Hit HitOf(std::size_t share, DocumentId id, const Xapian::Document& document) const;
   const std::vector<MarkGroup>& MarksOf(const Query& query);
+  std::vector<MarkGroup> InDocument(std::size_t share, DocumentId document,
+                                    const std::vector<MarkGroup>& groups) const;
   std::vector<Fragment> TextFragments(std::size_t share, DocumentId document,
                                       const std::vector<MarkGroup>& groups,
                                       const FragmentOptions& options);
@@ -67,6 +70,8 @@ class EngineReader : public Reader {
   Query marked_query_;
   std::vector<MarkGroup> marks_;
   bool marked_ = false;
+  /// Of the search under way.
+  std::function<bool()> cancelled_;
 };
 
 template <class Work>

@@ -21,30 +21,39 @@ Place Place::Decode(std::string_view bytes) {
   return {Fixed32(bytes, 0), Fixed32(bytes, 4), static_cast<std::uint8_t>(bytes[8])};
 }
 
-std::string StoredRecord::Encode() const {
+std::string EncodeRecord(const Record& record) {
   Encoder out;
   out.String(record.name).Number(record.is_dir).Number(record.size).Signed(record.mtime);
-  out.Number(text.segment).Number(text.offset).Number(text.length);
   out.String(record.title).Number(record.authors.size());
   for (const std::string& author : record.authors) out.String(author);
   return out.Take();
 }
 
-StoredRecord StoredRecord::Decode(std::string_view bytes) {
+Record DecodeRecord(std::string_view bytes) {
   Decoder in(bytes);
-  StoredRecord stored;
-  stored.record.name = in.String();
-  stored.record.is_dir = in.Number() != 0;
-  stored.record.size = in.Number();
-  stored.record.mtime = in.Signed();
-  stored.text.segment = in.Number32();
-  stored.text.offset = in.Number();
-  stored.text.length = in.Number();
-  stored.record.title = in.String();
-  for (std::uint64_t left = in.Number(); left > 0; --left) {
-    stored.record.authors.emplace_back(in.String());
-  }
-  return stored;
+  Record record;
+  record.name = in.String();
+  record.is_dir = in.Number() != 0;
+  record.size = in.Number();
+  record.mtime = in.Signed();
+  record.title = in.String();
+  for (std::uint64_t left = in.Number(); left > 0; --left) record.authors.emplace_back(in.String());
+  return record;
+}
+
+std::string TextPlace::Encode() const {
+  if (length == 0) return {};
+  return Encoder().Number(segment).Number(offset).Number(length).Take();
+}
+
+TextPlace TextPlace::Decode(std::string_view bytes) {
+  if (bytes.empty()) return {};
+  Decoder in(bytes);
+  TextPlace place;
+  place.segment = in.Number32();
+  place.offset = in.Number();
+  place.length = in.Number();
+  return place;
 }
 
 std::string EntriesKey(DirectoryId directory) {

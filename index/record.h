@@ -23,20 +23,19 @@ struct Place {
   static Place Decode(std::string_view bytes);
 };
 
-/// Where a document's text lies among the stored texts; length 0: it has none.
+/// What a line of a result needs: value slot 1.
+std::string EncodeRecord(const Record& record);
+Record DecodeRecord(std::string_view bytes);
+
+/// Where a document's text lies among the stored texts: value slot 4 of those that have one.
 struct TextPlace {
   std::uint32_t segment = 0;
   std::uint64_t offset = 0;
   std::uint64_t length = 0;
-};
 
-/// What a line of a result needs: value slot 1.
-struct StoredRecord {
-  Record record;
-  TextPlace text;
-
+  /// Empty for a length of 0.
   std::string Encode() const;
-  static StoredRecord Decode(std::string_view bytes);
+  static TextPlace Decode(std::string_view bytes);
 };
 
 /// Entries of folders, one behind the other, in the metadata of EntriesKey.
@@ -46,5 +45,6 @@ Entry DecodeEntry(Decoder& in);
 
 inline constexpr unsigned kPlaceSlot = 0;
 inline constexpr unsigned kRecordSlot = 1;
+inline constexpr unsigned kTextSlot = 4;
 
 }  // namespace maru::index

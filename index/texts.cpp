@@ -2,9 +2,9 @@
 
 #include <dirent.h>
 #include <fcntl.h>
+#include <lz4.h>
 #include <sys/stat.h>
 #include <unistd.h>
-#include <zstd.h>
 
 #include <algorithm>
 #include <cstring>
@@ -16,56 +16,13 @@ namespace {
 
 constexpr std::uint64_t kSegmentBytes = 256u << 20;
 constexpr std::size_t kBufferBytes = 1u << 20;
-constexpr int kLevel = 3;
-/// A chunk's head is three numbers; this many bytes hold the heads of texts up to about 4 MB.
-constexpr std::size_t kHeadGuess = 4096;
+/// Read at once of a text's beginning: all of most texts, and of longer ones what precedes the
+/// chunks.
+constexpr std::size_t kFrontBytes = 8192;
 constexpr std::uint64_t kMaxRaw = 1u << 20;
 
 maruseeker::Error DiskError(const std::string& what) {
   return maruseeker::Error(maruseeker::kErrorDaemonExchange, what + ": " + std::strerror(errno));
-}
-
-bool ReadAt(int file, std::uint64_t offset, char* into, std::size_t size) {
-  while (size > 0) {
-    const ssize_t got = pread(file, into, size, static_cast<off_t>(offset));
-    if (got < 0 && errno == EINTR) continue;
-    if (got <= 0) return false;
-    into += got;
-    offset += static_cast<std::uint64_t>(got);
-    size -= static_cast<std::size_t>(got);
-  }
-  return true;
-}
-
-struct ZstdContexts {
-  ZSTD_CCtx* packer = ZSTD_createCCtx();
-  ZSTD_DCtx* unpacker = ZSTD_createDCtx();
-  ~ZstdContexts() {
-    ZSTD_freeCCtx(packer);
-    ZSTD_freeDCtx(unpacker);
-  }
-};
-
-ZstdContexts& Contexts() {
-  thread_local ZstdContexts contexts;
-  return contexts;
-}
-
-struct ChunkHead {
-  std::uint32_t first_position;
-  std::uint64_t raw;
-  std::uint64_t packed;
-};
-
-/// A text begins with the length of its heads, then the heads, then the chunks.
-std::vector<ChunkHead> DecodeHeads(std::string_view bytes) {
-  Decoder in(bytes);
-  std::vector<ChunkHead> heads;
-  while (!in.AtEnd()) {
-    ChunkHead head{in.Number32(), in.Number(), in.Number()};
-    heads.push_back(head);
-  }
-  return heads;
 }
 
 }  // namespace
@@ -74,29 +31,31 @@ std::string SegmentPath(const std::string& folder, std::uint32_t segment) {
   return folder + "/texts." + std::to_string(segment);
 }
 
-void TextPacker::Cut(std::uint32_t next_position, std::size_t end) {
-  const std::string_view raw = text_.substr(chunk_begin_, end - chunk_begin_);
-  std::string packed(ZSTD_compressBound(raw.size()), '\0');
-  const std::size_t size = ZSTD_compressCCtx(Contexts().packer, packed.data(), packed.size(),
-                                             raw.data(), raw.size(), kLevel);
-  if (ZSTD_isError(size)) throw maruseeker::Error(maruseeker::kErrorDaemonExchange, "zstd failed");
-  packed.resize(size);
+void TextPacker::Cut(std::size_t end) {
+  // A word may be followed by very long nothing; a chunk is never longer than a reader accepts.
+  const std::string_view raw =
+      text_.substr(chunk_begin_, std::min<std::size_t>(end - chunk_begin_, kMaxRaw));
+  std::string packed(static_cast<std::size_t>(LZ4_compressBound(static_cast<int>(raw.size()))),
+                     '\0');
+  const int size = LZ4_compress_default(raw.data(), packed.data(), static_cast<int>(raw.size()),
+                                        static_cast<int>(packed.size()));
+  if (size <= 0) throw maruseeker::Error(maruseeker::kErrorDaemonExchange, "Cannot pack a text");
+  packed.resize(static_cast<std::size_t>(size));
   packed.shrink_to_fit();
-  chunks_.push_back({chunk_position_, raw.size(), std::move(packed)});
+  chunks_.push_back({raw.size(), signature_.Take(), std::move(packed)});
   chunk_begin_ = end;
-  chunk_position_ = next_position;
 }
 
+/// A text begins with the length of its heads, then the heads, the signatures, the chunks.
 std::string TextPacker::Finish() {
   if (text_.empty()) return {};
-  // A tail without words may be long; a chunk is never longer than a reader accepts.
-  const std::size_t most = chunk_begin_ + kMaxRaw;
-  Cut(UINT32_MAX, std::min(text_.size(), most));
+  Cut(text_.size());
   Encoder heads;
   for (const Chunk& chunk : chunks_) {
-    heads.Number(chunk.first_position).Number(chunk.raw).Number(chunk.packed.size());
+    heads.Number(chunk.raw).Number(chunk.signature.size()).Number(chunk.packed.size());
   }
   std::string result = Encoder().String(heads.Take()).Take();
+  for (const Chunk& chunk : chunks_) result += chunk.signature;
   for (const Chunk& chunk : chunks_) result += chunk.packed;
   return result;
 }
@@ -196,63 +155,96 @@ int TextReader::Segment(std::uint32_t segment) {
   return file;
 }
 
+bool TextReader::ReadAt(std::uint32_t segment, std::uint64_t offset, char* into, std::size_t size) {
+  const int file = Segment(segment);
+  while (size > 0) {
+    const ssize_t got = pread(file, into, size, static_cast<off_t>(offset));
+    if (got < 0 && errno == EINTR) continue;
+    if (got <= 0) return false;
+    into += got;
+    offset += static_cast<std::uint64_t>(got);
+    size -= static_cast<std::size_t>(got);
+  }
+  return true;
+}
+
 std::string TextReader::ReadPacked(const TextPlace& place) {
-  const int file = Segment(place.segment);
   std::string packed(place.length, '\0');
-  if (file < 0 || !ReadAt(file, place.offset, packed.data(), packed.size())) return {};
+  if (!ReadAt(place.segment, place.offset, packed.data(), packed.size())) return {};
   return packed;
 }
 
-TextPiece TextReader::Read(const TextPlace& place, std::uint32_t first, std::uint32_t last) {
-  TextPiece piece;
-  const int file = Segment(place.segment);
-  if (file < 0 || place.length == 0) return piece;
-  std::string start(std::min<std::uint64_t>(place.length, kHeadGuess), '\0');
-  if (!ReadAt(file, place.offset, start.data(), start.size())) return piece;
-  std::uint64_t heads_size = 0;
-  std::size_t heads_at = 0;
-  for (unsigned shift = 0; heads_at < start.size() && shift < 64; shift += 7) {
-    const auto byte = static_cast<unsigned char>(start[heads_at++]);
-    heads_size |= static_cast<std::uint64_t>(byte & 0x7f) << shift;
-    if (byte < 0x80) break;
-  }
-  if (heads_size > place.length - heads_at) return piece;
-  if (heads_at + heads_size > start.size()) {
-    start.resize(heads_at + heads_size);
-    if (!ReadAt(file, place.offset, start.data(), start.size())) return piece;
-  }
-  const std::vector<ChunkHead> heads =
-      DecodeHeads(std::string_view(start).substr(heads_at, heads_size));
+bool StoredText::ReadFront(std::size_t size) {
+  const std::size_t have = front_.size();
+  if (size <= have) return true;
+  if (size > place_.length) return false;
+  front_.resize(size);
+  return reader_->ReadAt(place_.segment, place_.offset + have, front_.data() + have, size - have);
+}
 
-  std::uint64_t offset = heads_at + heads_size;
-  bool any = false;
-  for (std::size_t i = 0; i < heads.size(); ++i) {
-    const bool before = i + 1 < heads.size() && heads[i + 1].first_position <= first;
-    const bool behind = heads[i].first_position > last;
-    if (before) piece.more_before = true;
-    if (behind && any) piece.more_behind = true;
-    if (!before && !(behind && any)) {
-      if (heads[i].raw > kMaxRaw || offset + heads[i].packed > place.length) return {};
-      std::string packed;
-      std::string_view bytes;
-      if (offset + heads[i].packed <= start.size()) {
-        bytes = std::string_view(start).substr(offset, heads[i].packed);
-      } else {
-        packed.resize(heads[i].packed);
-        if (!ReadAt(file, place.offset + offset, packed.data(), packed.size())) return {};
-        bytes = packed;
-      }
-      if (!any) piece.first_position = heads[i].first_position;
-      any = true;
-      const std::size_t at = piece.text.size();
-      piece.text.resize(at + heads[i].raw);
-      const std::size_t size = ZSTD_decompressDCtx(Contexts().unpacker, piece.text.data() + at,
-                                                   heads[i].raw, bytes.data(), bytes.size());
-      if (ZSTD_isError(size) || size != heads[i].raw) return {};
-    }
-    offset += heads[i].packed;
+bool StoredText::Open(TextReader& reader, const TextPlace& place) {
+  reader_ = &reader;
+  place_ = place;
+  chunks_.clear();
+  front_.clear();
+  if (place.length == 0 || !ReadFront(std::min<std::uint64_t>(place.length, kFrontBytes))) {
+    return false;
   }
-  return piece;
+  try {
+    Decoder start(front_);
+    const std::uint64_t heads_size = start.Number();
+    const std::size_t heads_at = front_.size() - start.Left();
+    if (heads_size > place.length || !ReadFront(heads_at + heads_size)) return false;
+    std::uint64_t offset = heads_at + heads_size;
+    for (Decoder in(std::string_view(front_).substr(heads_at, heads_size)); !in.AtEnd();) {
+      Chunk chunk{.raw = in.Number(),
+                  .packed = 0,
+                  .offset = 0,
+                  .signature = in.Number(),
+                  .signature_offset = offset};
+      chunk.packed = in.Number();
+      if (chunk.raw > kMaxRaw || chunk.signature > place.length - offset) throw Damaged();
+      offset += chunk.signature;
+      chunks_.push_back(chunk);
+    }
+    if (!ReadFront(offset)) throw Damaged();
+    for (Chunk& chunk : chunks_) {
+      chunk.offset = offset;
+      if (chunk.packed > std::min(place.length - offset, 2 * kMaxRaw)) throw Damaged();
+      offset += chunk.packed;
+    }
+  } catch (const maruseeker::Error&) {
+    chunks_.clear();
+  }
+  return !chunks_.empty();
+}
+
+bool StoredText::MayHold(std::size_t chunk, std::uint64_t hash) const {
+  return index::MayHold(
+      std::string_view(front_).substr(chunks_[chunk].signature_offset, chunks_[chunk].signature),
+      hash);
+}
+
+bool StoredText::Append(std::size_t index, std::string& text) {
+  const Chunk& chunk = chunks_[index];
+  std::string_view bytes;
+  if (chunk.offset + chunk.packed <= front_.size()) {
+    bytes = std::string_view(front_).substr(chunk.offset, chunk.packed);
+  } else {
+    packed_.resize(chunk.packed);
+    if (!reader_->ReadAt(place_.segment, place_.offset + chunk.offset, packed_.data(),
+                         packed_.size())) {
+      return false;
+    }
+    bytes = packed_;
+  }
+  const std::size_t at = text.size();
+  text.resize(at + chunk.raw);
+  const int size = LZ4_decompress_safe(bytes.data(), text.data() + at,
+                                       static_cast<int>(bytes.size()), static_cast<int>(chunk.raw));
+  if (size >= 0 && static_cast<std::uint64_t>(size) == chunk.raw) return true;
+  text.resize(at);
+  return false;
 }
 
 }  // namespace maru::index

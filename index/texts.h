@@ -9,47 +9,46 @@
 #include <vector>
 
 #include "index/record.h"
+#include "index/signature.h"
 
 /// The stored texts of an index: append-only segment files beside the database. A text is kept in
-/// chunks compressed one by one, so that a fragment costs one or two chunks, however long the text.
+/// chunks compressed one by one, each with a signature of its words, so that a fragment or a phrase
+/// costs a chunk or two, however long the text: what a list of positions would tell is read there.
 namespace maru::index {
 
 /// Bytes of text in a chunk, about: ends at a word's end.
 inline constexpr std::size_t kChunkBytes = 8192;
 
-/// Packs a text while its words are walked through. Not copyable: holds a compressor.
+/// Packs a text while its words are walked through.
 class TextPacker {
  public:
-  explicit TextPacker(std::string_view text) : text_(text) {}
+  explicit TextPacker(std::string_view text) : text_(text), many_(text.size() > kChunkBytes) {}
 
-  /// Call before each word with its position and first byte: chunks begin at words.
-  void BeforeWord(std::uint32_t position, std::size_t begin) {
-    if (begin - chunk_begin_ >= kChunkBytes) Cut(position, begin);
+  /// Call for each word in order, with its hash and its first byte: chunks begin at words.
+  void AddWord(std::uint64_t hash, std::size_t begin) {
+    if (previous_) signature_.Add(HashPair(previous_, hash));
+    if (begin - chunk_begin_ >= kChunkBytes) Cut(begin);
+    if (many_) signature_.Add(hash);
+    previous_ = hash;
   }
   /// The packed text; empty for an empty one.
   std::string Finish();
 
  private:
-  void Cut(std::uint32_t next_position, std::size_t end);
+  void Cut(std::size_t end);
 
   std::string_view text_;
+  /// A text in one chunk needs no signature of its words: the index knows them.
+  bool many_;
   std::size_t chunk_begin_ = 0;
-  std::uint32_t chunk_position_ = 1;
+  std::uint64_t previous_ = 0;
+  SignatureBuilder signature_;
   struct Chunk {
-    std::uint32_t first_position;
     std::size_t raw;
+    std::string signature;
     std::string packed;
   };
   std::vector<Chunk> chunks_;
-};
-
-/// A piece of a text with the position of its first word.
-struct TextPiece {
-  std::string text;
-  std::uint32_t first_position = 1;
-  /// Whether the text goes on before and behind it.
-  bool more_before = false;
-  bool more_behind = false;
 };
 
 /// Appends to the newest segment. One thread; throws Error (121) when the disk refuses.
@@ -81,7 +80,7 @@ class TextWriter {
   std::string buffer_;
 };
 
-/// Reads pieces of stored texts. Thread-safe; keeps the segment files open.
+/// The files of stored texts. Thread-safe; keeps them open.
 class TextReader {
  public:
   explicit TextReader(std::string folder) : folder_(std::move(folder)) {}
@@ -89,11 +88,10 @@ class TextReader {
   TextReader(const TextReader&) = delete;
   TextReader& operator=(const TextReader&) = delete;
 
-  /// The chunks that hold the words from position `first` to `last`. An empty piece when the text
-  /// is gone (the index was rewritten meanwhile) or damaged.
-  TextPiece Read(const TextPlace& place, std::uint32_t first, std::uint32_t last);
   /// The packed text as it lies there; empty when gone.
   std::string ReadPacked(const TextPlace& place);
+  /// Reads bytes at an offset of a segment; false when they are gone.
+  bool ReadAt(std::uint32_t segment, std::uint64_t offset, char* into, std::size_t size);
 
  private:
   int Segment(std::uint32_t segment);
@@ -101,6 +99,37 @@ class TextReader {
   std::string folder_;
   std::mutex mutex_;
   std::map<std::uint32_t, int> files_;
+};
+
+/// A stored text, chunk by chunk. To be used for one text after the other; one thread.
+class StoredText {
+ public:
+  /// False, and no chunks, when the text is gone (the index was rewritten meanwhile) or damaged.
+  bool Open(TextReader& reader, const TextPlace& place);
+
+  std::size_t Chunks() const { return chunks_.size(); }
+  /// Whether a pair of neighbours (HashPair) begins in the chunk, or, in a text of several chunks,
+  /// a word (HashWord) stands there.
+  bool MayHold(std::size_t chunk, std::uint64_t hash) const;
+  /// Appends the chunk's text; false when it is gone or damaged.
+  bool Append(std::size_t chunk, std::string& text);
+
+ private:
+  bool ReadFront(std::size_t size);
+
+  struct Chunk {
+    std::uint64_t raw;
+    std::uint64_t packed;
+    std::uint64_t offset;
+    std::uint64_t signature;
+    std::uint64_t signature_offset;
+  };
+  TextReader* reader_ = nullptr;
+  TextPlace place_;
+  std::vector<Chunk> chunks_;
+  /// The text's first bytes: heads and signatures at least.
+  std::string front_;
+  std::string packed_;
 };
 
 /// The path of a segment's file.

@@ -8,17 +8,6 @@
 namespace maru::index {
 namespace {
 
-constexpr std::array<char, 128> AsciiFolding() {
-  std::array<char, 128> table{};
-  for (char c = '0'; c <= '9'; ++c) table[static_cast<unsigned char>(c)] = c;
-  for (char c = 'a'; c <= 'z'; ++c) {
-    table[static_cast<unsigned char>(c)] = c;
-    table[static_cast<unsigned char>(c - 'a' + 'A')] = c;
-  }
-  return table;
-}
-constexpr std::array<char, 128> kAscii = AsciiFolding();
-
 bool Between(char32_t c, char32_t first, char32_t last) {
   return c >= first && c <= last;
 }
@@ -120,7 +109,7 @@ bool Tokenizer::Next(std::string_view text, std::size_t& at, Token& token) {
   while (at < text.size()) {
     const auto byte = static_cast<unsigned char>(text[at]);
     if (byte < 0x80) {
-      const char folded = kAscii[byte];
+      const char folded = kAsciiFold[byte];
       if (folded && !alone) {
         if (!in_word) begin = at;
         in_word = true;
@@ -156,6 +145,12 @@ bool Tokenizer::Next(std::string_view text, std::size_t& at, Token& token) {
   if (!length) return false;
   token = {std::string_view(word_, length), begin, end};
   return true;
+}
+
+bool IsSpacelessWord(std::string_view word) {
+  char32_t c = 0;
+  return !word.empty() && static_cast<unsigned char>(word[0]) >= 0xe0 && Decode(word, 0, c) &&
+         IsSpaceless(c);
 }
 
 std::vector<std::string> WordsOf(std::string_view text) {

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <array>
 #include <cstdint>
 #include <functional>
 #include <string>
@@ -16,6 +17,17 @@
 namespace maru::index {
 
 inline constexpr std::size_t kMaxWord = 64;
+
+/// What an ASCII character is in a word, folded; 0: not a part of words.
+inline constexpr std::array<char, 128> kAsciiFold = [] {
+  std::array<char, 128> table{};
+  for (char c = '0'; c <= '9'; ++c) table[static_cast<unsigned char>(c)] = c;
+  for (char c = 'a'; c <= 'z'; ++c) {
+    table[static_cast<unsigned char>(c)] = c;
+    table[static_cast<unsigned char>(c - 'a' + 'A')] = c;
+  }
+  return table;
+}();
 
 struct Token {
   /// Folded; valid only during the call that hands it over.
@@ -38,12 +50,18 @@ class Tokenizer {
     }
   }
 
- private:
+  /// The next word at or behind the byte `at`, which moves behind it; false at the end.
   bool Next(std::string_view text, std::size_t& at, Token& token);
+
+ private:
   void Take(char32_t c, std::size_t& length);
 
   char word_[kMaxWord + 32];
 };
+
+/// Whether a word is a character of a script without spaces. Two of them side by side are a term of
+/// their own in the index of a text: the words of those scripts are mostly two or three long.
+bool IsSpacelessWord(std::string_view word);
 
 /// The folded words of a short text.
 std::vector<std::string> WordsOf(std::string_view text);

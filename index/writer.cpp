@@ -90,10 +90,9 @@ struct Writer::State {
     index::Place place{document.parent, table.ConditionOf(document.rights),
                        KindNumber(KindOf(document))};
     engine.add_value(kPlaceSlot, place.Encode());
-    StoredRecord stored{{document.name, document.is_dir, document.size, document.mtime,
-                         document.title, document.authors},
-                        text};
-    engine.add_value(kRecordSlot, stored.Encode());
+    engine.add_value(kRecordSlot, EncodeRecord({document.name, document.is_dir, document.size,
+                                                document.mtime, document.title, document.authors}));
+    engine.add_value(kTextSlot, text.Encode());
     engine.add_value(static_cast<Xapian::valueno>(FindField(kSize)->slot),
                      Xapian::sortable_serialise(static_cast<double>(document.size)));
     engine.add_value(static_cast<Xapian::valueno>(FindField(kModTime)->slot),
@@ -109,10 +108,9 @@ struct Writer::State {
   }
 
   void ForgetText(DocumentId id) {
-    const StoredRecord stored =
-        StoredRecord::Decode(database.get_document(id).get_value(kRecordSlot));
-    std::uint64_t& live = live_texts[stored.text.segment];
-    live -= std::min(live, stored.text.length);
+    const TextPlace text = TextPlace::Decode(database.get_document(id).get_value(kTextSlot));
+    std::uint64_t& live = live_texts[text.segment];
+    live -= std::min(live, text.length);
   }
 
   void SweepTexts();
@@ -150,20 +148,19 @@ void Writer::State::SweepTexts() {
 void Writer::State::CopyTexts(const std::vector<std::uint32_t>& segments) {
   TextReader reader(folder);
   std::vector<DocumentId> documents;
-  for (auto value = database.valuestream_begin(kRecordSlot);
-       value != database.valuestream_end(kRecordSlot); ++value) {
-    const StoredRecord stored = StoredRecord::Decode(*value);
-    if (stored.text.length > 0 &&
-        std::find(segments.begin(), segments.end(), stored.text.segment) != segments.end()) {
+  for (auto value = database.valuestream_begin(kTextSlot);
+       value != database.valuestream_end(kTextSlot); ++value) {
+    const TextPlace text = TextPlace::Decode(*value);
+    if (std::find(segments.begin(), segments.end(), text.segment) != segments.end()) {
       documents.push_back(value.get_docid());
     }
   }
   for (const DocumentId id : documents) {
     Xapian::Document engine = database.get_document(id);
-    StoredRecord stored = StoredRecord::Decode(engine.get_value(kRecordSlot));
-    stored.text = texts.Append(reader.ReadPacked(stored.text));
-    live_texts[stored.text.segment] += stored.text.length;
-    engine.add_value(kRecordSlot, stored.Encode());
+    const TextPlace text =
+        texts.Append(reader.ReadPacked(TextPlace::Decode(engine.get_value(kTextSlot))));
+    live_texts[text.segment] += text.length;
+    engine.add_value(kTextSlot, text.Encode());
     database.replace_document(id, engine);
   }
   for (const std::uint32_t segment : segments) live_texts.erase(segment);
@@ -305,17 +302,17 @@ void Writer::Update(DocumentId id, const Document& document) {
   WithEngine("Cannot write the index", [&] {
     if (state_->bulk) state_->EndBulk();
     Xapian::Document engine = state_->database.get_document(id);
-    const StoredRecord stored = StoredRecord::Decode(engine.get_value(kRecordSlot));
+    const Record stored = DecodeRecord(engine.get_value(kRecordSlot));
     const Place place = Place::Decode(engine.get_value(kPlaceSlot));
     Document complete = document;
-    complete.title = stored.record.title;
-    complete.authors = stored.record.authors;
-    if (stored.record.name != document.name ||
+    complete.title = stored.title;
+    complete.authors = stored.authors;
+    if (stored.name != document.name ||
         state_->table.Condition(place.condition).uid != document.rights.uid) {
       RemoveNameTerms(engine);
       AddNameTerms(engine, complete);
     }
-    state_->Place(engine, complete, stored.text);
+    state_->Place(engine, complete, TextPlace::Decode(engine.get_value(kTextSlot)));
     state_->database.replace_document(id, engine);
     state_->pending += 1000;
   });

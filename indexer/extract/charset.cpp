@@ -6,6 +6,8 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
+#include <cstdint>
+#include <cstring>
 #include <map>
 #include <memory>
 
@@ -207,8 +209,17 @@ std::string_view TextPart(std::string_view bytes) {
 }
 
 std::size_t Utf8Length(std::string_view bytes) {
+  constexpr std::uint64_t kHighBits = 0x8080808080808080u;
   std::size_t at = 0;
   while (at < bytes.size()) {
+    std::uint64_t eight = 0;
+    if (at + sizeof eight <= bytes.size()) {
+      std::memcpy(&eight, bytes.data() + at, sizeof eight);
+      if ((eight & kHighBits) == 0) {
+        at += sizeof eight;
+        continue;
+      }
+    }
     const std::size_t length = CharacterLength(bytes.substr(at));
     if (length == 0 || length == kCutOff) break;
     at += length;

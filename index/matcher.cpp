@@ -1,0 +1,215 @@
+#include "index/matcher.h"
+
+#include <algorithm>
+#include <cstring>
+
+namespace maru::index {
+namespace {
+
+std::uint64_t LengthBit(std::size_t length) {
+  return std::uint64_t{1} << std::min<std::size_t>(length, 63);
+}
+
+char FoldAscii(char c) {
+  const auto byte = static_cast<unsigned char>(c);
+  return byte < 0x80 ? kAsciiFold[byte] : '\0';
+}
+
+bool IsWordByte(char c) {
+  return static_cast<unsigned char>(c) >= 0x80 || FoldAscii(c);
+}
+
+bool IsAscii(std::string_view text) {
+  std::uint64_t all = 0;
+  for (; text.size() >= sizeof all; text.remove_prefix(sizeof all)) {
+    std::uint64_t eight;
+    std::memcpy(&eight, text.data(), sizeof eight);
+    all |= eight;
+  }
+  for (const char c : text) all |= static_cast<unsigned char>(c);
+  return (all & 0x8080808080808080u) == 0;
+}
+
+/// Whether some byte of a block and the one `offset` behind it may be the ends of a word. Without
+/// branches, for the compiler to make it some instructions on whole registers.
+template <std::size_t kBlock>
+bool MayBeginIn(const char* block, std::size_t offset, char first, char last) {
+  unsigned char any = 0;
+  for (std::size_t i = 0; i < kBlock; ++i) {
+    any |= static_cast<unsigned char>((block[i] | 0x20) == first) &
+           static_cast<unsigned char>((block[i + offset] | 0x20) == last);
+  }
+  return any;
+}
+
+/// The end of a phrase whose first word ends at `at`; 0 when it is another text.
+std::size_t EndOfPhrase(std::string_view text, std::size_t at,
+                        const std::vector<std::string>& behind) {
+  Tokenizer tokenizer;
+  Token token;
+  std::size_t end = at;
+  for (const std::string& word : behind) {
+    if (!tokenizer.Next(text, at, token) || token.word != word) return 0;
+    end = token.end;
+  }
+  return end;
+}
+
+}  // namespace
+
+Matcher::Matcher(const std::vector<MarkGroup>& groups) {
+  for (std::size_t group = 0; group < groups.size(); ++group) {
+    const std::vector<std::string>& words = groups[group].words;
+    for (std::size_t i = 0; i < words.size(); ++i) {
+      Wanted wanted{group, {}};
+      if (groups[group].phrase) wanted.behind.assign(words.begin() + 1, words.end());
+      words_[words[i]].push_back(std::move(wanted));
+      if (!words[i].empty()) {
+        lengths_[static_cast<unsigned char>(words[i][0])] |= LengthBit(words[i].size());
+      }
+      if (groups[group].phrase) break;
+    }
+  }
+}
+
+bool Matcher::MayBe(std::string_view word) const {
+  return lengths_[static_cast<unsigned char>(word[0])] & LengthBit(word.size());
+}
+
+template <class Use>
+bool Matcher::Take(std::string_view text, const Token& token, Use& use) const {
+  if (!MayBe(token.word)) return true;
+  const auto found = words_.find(token.word);
+  if (found == words_.end()) return true;
+  for (const Wanted& wanted : found->second) {
+    const std::size_t end =
+        wanted.behind.empty() ? token.end : EndOfPhrase(text, token.end, wanted.behind);
+    if (end && !use(Match{token.begin, end, wanted.group})) return false;
+  }
+  return true;
+}
+
+template <class Use>
+void Matcher::ForEach(std::string_view text, Use&& use) const {
+  Tokenizer tokenizer;
+  Token token;
+  char folded[kMaxWord];
+  std::size_t at = 0;
+  while (at < text.size()) {
+    const std::size_t begin = at;
+    auto byte = static_cast<unsigned char>(text[at]);
+    if (byte < 0x80 && !kAsciiFold[byte]) {
+      ++at;
+      continue;
+    }
+    // Most words are ASCII through and through and none of those looked for: they are passed over
+    // without being folded.
+    const auto first = static_cast<unsigned char>(kAsciiFold[byte & 0x7f]);
+    while (byte < 0x80 && kAsciiFold[byte]) {
+      byte = ++at < text.size() ? static_cast<unsigned char>(text[at]) : ' ';
+    }
+    if (byte >= 0x80) {
+      at = begin;
+      if (!tokenizer.Next(text, at, token)) return;
+      if (!Take(text, token, use)) return;
+      continue;
+    }
+    const std::size_t length = std::min(at - begin, kMaxWord);
+    if (!(lengths_[first] & LengthBit(length))) continue;
+    for (std::size_t i = 0; i < length; ++i) {
+      folded[i] = kAsciiFold[static_cast<unsigned char>(text[begin + i])];
+    }
+    token = {std::string_view(folded, length), begin, at};
+    if (!Take(text, token, use)) return;
+  }
+}
+
+std::vector<Match> Matcher::MatchesIn(std::string_view text) const {
+  std::vector<Match> matches;
+  ForEach(text, [&](const Match& match) {
+    matches.push_back(match);
+    return true;
+  });
+  std::stable_sort(matches.begin(), matches.end(), [](const Match& a, const Match& b) {
+    return a.begin != b.begin ? a.begin < b.begin : a.end > b.end;
+  });
+  return matches;
+}
+
+bool Matcher::AnyIn(std::string_view text) const {
+  bool any = false;
+  ForEach(text, [&](const Match&) { return !(any = true); });
+  return any;
+}
+
+PhraseFinder::PhraseFinder(const std::vector<std::string>& words)
+    : words_(words), matcher_({MarkGroup{{}, words, true}}) {
+  plain_ = !words.empty() && words[0].size() < kMaxWord && IsAscii(words[0]);
+  for (std::size_t i = 1; i < words.size(); ++i) {
+    pairs_.push_back(HashPair(HashWord(words[i - 1]), HashWord(words[i])));
+  }
+}
+
+bool PhraseFinder::MayBegin(const StoredText& text, std::size_t chunk) const {
+  for (std::size_t i = 0; i < pairs_.size(); ++i) {
+    // Each chunk has a word at least: the pair with number i begins at most i chunks further on.
+    const std::size_t end = std::min(text.Chunks(), chunk + i + 1);
+    bool may = false;
+    for (std::size_t at = chunk; !may && at < end; ++at) may = text.MayHold(at, pairs_[i]);
+    if (!may) return false;
+  }
+  return true;
+}
+
+/// Whether the phrase begins at a byte that looks like the first of its first word.
+bool PhraseFinder::IsHere(std::string_view text, std::size_t at) const {
+  const std::string& first = words_[0];
+  if (at > 0 && IsWordByte(text[at - 1])) return false;
+  for (std::size_t i = 0; i < first.size(); ++i) {
+    if (FoldAscii(text[at + i]) != first[i]) return false;
+  }
+  const std::size_t end = at + first.size();
+  if (end < text.size() && IsWordByte(text[end])) return false;
+  return EndOfPhrase(text, end, {words_.begin() + 1, words_.end()}) != 0;
+}
+
+/// Most texts are ASCII, or hold the phrase as it is: blocks of bytes without both ends of the
+/// first word are passed over at once, and only where that does not decide are all words looked at.
+bool PhraseFinder::IsIn(std::string_view text) const {
+  constexpr std::size_t kBlock = 64;
+  if (!plain_) return matcher_.AnyIn(text);
+  const std::size_t width = words_[0].size();
+  const char first = words_[0].front();
+  const char last = words_[0].back();
+  std::size_t at = 0;
+  for (; at + kBlock + width <= text.size(); at += kBlock) {
+    if (!MayBeginIn<kBlock>(text.data() + at, width - 1, first, last)) continue;
+    for (std::size_t i = at; i < at + kBlock; ++i) {
+      if (FoldAscii(text[i]) == first && IsHere(text, i)) return true;
+    }
+  }
+  for (; at + width <= text.size(); ++at) {
+    if (FoldAscii(text[at]) == first && IsHere(text, at)) return true;
+  }
+  return !IsAscii(text) && matcher_.AnyIn(text);
+}
+
+bool PhraseFinder::BeginsIn(StoredText& text, std::size_t chunk) {
+  buffer_.clear();
+  if (!text.Append(chunk, buffer_)) return false;
+  if (IsIn(std::string_view(buffer_))) return true;
+  const std::size_t end = std::min(text.Chunks(), chunk + pairs_.size() + 1);
+  while (++chunk < end && text.Append(chunk, buffer_)) {
+    if (IsIn(std::string_view(buffer_))) return true;
+  }
+  return false;
+}
+
+bool PhraseFinder::IsIn(StoredText& text) {
+  for (std::size_t chunk = 0; chunk < text.Chunks(); ++chunk) {
+    if (MayBegin(text, chunk) && BeginsIn(text, chunk)) return true;
+  }
+  return false;
+}
+
+}  // namespace maru::index

@@ -1,0 +1,79 @@
+#pragma once
+
+#include <array>
+#include <map>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "index/texts.h"
+#include "index/tokenizer.h"
+
+/// Finds a query's words in texts.
+namespace maru::index {
+
+/// Words that count as one in a field: forms of a word, completions of a prefix, or a phrase.
+struct MarkGroup {
+  std::string field;
+  /// Folded words without prefix; of a phrase: in its order.
+  std::vector<std::string> words;
+  bool phrase = false;
+};
+
+/// Bytes [begin, end) of a text that a group matches.
+struct Match {
+  std::size_t begin;
+  std::size_t end;
+  std::size_t group;
+};
+
+/// Goes over a text once, whatever the number of words, and folds only what may be one of them.
+class Matcher {
+ public:
+  explicit Matcher(const std::vector<MarkGroup>& groups);
+
+  /// In order of their begins; at one place the longest first.
+  std::vector<Match> MatchesIn(std::string_view text) const;
+  bool AnyIn(std::string_view text) const;
+
+ private:
+  struct Wanted {
+    std::size_t group;
+    /// What must follow, of a phrase.
+    std::vector<std::string> behind;
+  };
+
+  template <class Use>
+  void ForEach(std::string_view text, Use&& use) const;
+  bool MayBe(std::string_view word) const;
+  template <class Use>
+  bool Take(std::string_view text, const Token& token, Use& use) const;
+
+  std::map<std::string, std::vector<Wanted>, std::less<>> words_;
+  /// By the first byte of the words: which lengths there are, one bit each.
+  std::array<std::uint64_t, 256> lengths_{};
+};
+
+/// A phrase, looked for in stored texts. One thread.
+class PhraseFinder {
+ public:
+  explicit PhraseFinder(const std::vector<std::string>& words);
+
+  bool IsIn(StoredText& text);
+  /// Whether the phrase may begin in the chunk.
+  bool MayBegin(const StoredText& text, std::size_t chunk) const;
+
+ private:
+  bool BeginsIn(StoredText& text, std::size_t chunk);
+  bool IsIn(std::string_view text) const;
+  bool IsHere(std::string_view text, std::size_t at) const;
+
+  std::vector<std::string> words_;
+  /// The first word can be looked for as it is, in both cases of its letters.
+  bool plain_ = false;
+  Matcher matcher_;
+  std::vector<std::uint64_t> pairs_;
+  std::string buffer_;
+};
+
+}  // namespace maru::index
