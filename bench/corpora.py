@@ -1,0 +1,131 @@
+"""The files that are indexed: taken from Debian packages, unpacked into the build folder and never
+installed, so that they are the same on every machine with the same packages."""
+
+import pathlib
+import re
+import shutil
+import subprocess
+import sys
+
+SMALL = ("linux-doc-6.1", "postgresql-doc-15", "python3.11-doc", "git-doc")
+LARGE = "linux-source-6.1"
+COPIES = 16
+# Who may read which part of the corpus for rights: files of carol, a half with bob's group, and one
+# in a hundred for everybody.
+CAROL, WORK, ROOT = 60003, 60102, 0
+LONG_WORD = re.compile(rb"[A-Za-z]{9,}")
+
+
+def say(text):
+    print(f"bench: {text}", file=sys.stderr, flush=True)
+
+
+def unpack(packages, folder):
+    """Downloads packages and unpacks them below the folder."""
+    folder.mkdir(parents=True)
+    subprocess.run(["apt-get", "download", "-q", *packages], cwd=folder, check=True,
+                   stdout=subprocess.DEVNULL)
+    for archive in sorted(folder.glob("*.deb")):
+        subprocess.run(["dpkg-deb", "-x", archive, folder], check=True)
+        archive.unlink()
+
+
+def copy_files(source, target, change=lambda name, data: data, keep=lambda path: True):
+    """Copies the plain files of a folder; `change` may alter what is in them."""
+    count = 0
+    for path in sorted(source.rglob("*")):
+        if path.is_symlink() or not path.is_file() or not keep(path):
+            continue
+        place = target / path.relative_to(source)
+        place.parent.mkdir(parents=True, exist_ok=True)
+        place.write_bytes(change(path.name, path.read_bytes()))
+        count += 1
+    return count
+
+
+def make_small(target, _corpora):
+    packed = target.with_suffix(".packed")
+    shutil.rmtree(packed, ignore_errors=True)
+    unpack(SMALL, packed)
+    copy_files(packed / "usr/share/doc", target, keep=lambda path: path.suffix != ".gz")
+    shutil.rmtree(packed)
+
+
+def make_large(target, _corpora):
+    packed = target.with_suffix(".packed")
+    shutil.rmtree(packed, ignore_errors=True)
+    unpack([LARGE], packed)
+    target.mkdir(parents=True)
+    [archive] = (packed / "usr/src").glob("*.tar.xz")
+    subprocess.run(["tar", "-xJf", archive, "-C", target], check=True)
+    shutil.rmtree(packed)
+
+
+def make_tiny(target, _corpora):
+    """The project's own sources and pages."""
+    top = pathlib.Path(__file__).resolve().parent.parent
+    for room in ("docs", "index", "platform", "daemon", "server"):
+        copy_files(top / room, target / room)
+
+
+def make_rights(target, corpora):
+    copy_files(make("small", corpora), target)
+    for number, path in enumerate(sorted(path for path in target.rglob("*") if path.is_file())):
+        for_all, for_work = number % 100 == 0, number % 2 == 0
+        shutil.chown(path, CAROL, WORK if for_work else ROOT)
+        path.chmod(0o644 if for_all else 0o640)
+
+
+def make_copies(count):
+    """So many copies, in each of which the long words are other words: what grows is the number of
+    files and the vocabulary."""
+    def build(target, corpora):
+        small = make("small", corpora)
+        for number in range(count):
+            letter = bytes([ord("a") + number])
+            copy_files(small, target / f"copy{number}",
+                       lambda name, data, letter=letter: LONG_WORD.sub(rb"\g<0>" + letter, data)
+                       if name.endswith((".html", ".txt")) else data)
+    return build
+
+
+MAKERS = {"small": make_small, "large": make_large, "tiny": make_tiny, "rights": make_rights,
+          "copies1": make_copies(1), "copies4": make_copies(4), "copies16": make_copies(COPIES)}
+
+
+def make(name, corpora):
+    """The folder of a corpus, made unless it is there."""
+    target = corpora / name
+    if not target.is_dir():
+        say(f"making the corpus {name}")
+        half = corpora / (name + ".half")
+        shutil.rmtree(half, ignore_errors=True)
+        MAKERS[name](half, corpora)
+        half.rename(target)
+    return target
+
+
+WORD = re.compile(r"[a-z]{3,14}")
+
+
+def queries(folder, steps=10):
+    """The 30 queries of a corpus, out of its own words: 5 rare, 5 medium and 5 common words, 5 pairs, 4
+    threes, 6 prefixes."""
+    documents = {}
+    paths = sorted(path for path in folder.rglob("*") if path.is_file() and not path.is_symlink())
+    sample = paths[::max(1, min(steps, len(paths) // 200))]
+    for path in sample:
+        for word in set(WORD.findall(path.read_bytes()[:200_000].decode("utf-8", "replace"))):
+            documents[word] = documents.get(word, 0) + 1
+
+    def pick(low, high, count):
+        some = sorted(word for word, number in documents.items()
+                      if low * len(sample) <= number <= high * len(sample) and number > 1)
+        some = some or sorted(documents)
+        return [some[i * (len(some) - 1) // max(count - 1, 1)] for i in range(count)]
+
+    rare, medium, common = pick(0, 0.004, 5), pick(0.01, 0.05, 10), pick(0.15, 0.9, 10)
+    return (rare + medium[:5] + common[:5]
+            + [f"{common[i]} {medium[5 + i]}" for i in range(5)]
+            + [f"{common[i]} {common[5 + i]} {medium[i]}" for i in range(4)]
+            + [f"{medium[i][:2 + i % 4]}*" for i in range(6)])

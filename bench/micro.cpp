@@ -1,0 +1,155 @@
+// The small things that are done millions of times.
+#include <benchmark/benchmark.h>
+
+#include <cstdlib>
+#include <filesystem>
+#include <string>
+
+#include "index/fields.h"
+#include "index/fragments.h"
+#include "index/reader.h"
+#include "index/signature.h"
+#include "index/tokenizer.h"
+#include "index/writer.h"
+#include "platform/json.h"
+
+namespace {
+
+using namespace maru::index;
+using maru::FileRights;
+using maru::Identity;
+
+/// About eight kilobytes of prose-like code, the same each time.
+const std::string& Text() {
+  static const std::string text = [] {
+    std::string made;
+    for (unsigned i = 0; made.size() < 8000; ++i) {
+      made +=
+          "static int harbour_" + std::to_string(i % 37) +
+          "(struct ship *ship, unsigned int berth)\n{\n\treturn ship->berth[berth] ? 0 : -EBUSY; "
+          "/* the tide is out */\n}\n";
+    }
+    return made;
+  }();
+  return text;
+}
+
+void Bytes(benchmark::State& state) {
+  state.SetBytesProcessed(static_cast<std::int64_t>(state.iterations() * Text().size()));
+}
+
+void Tokenize(benchmark::State& state) {
+  for (auto _ : state) {
+    std::uint64_t sum = 0;
+    Tokenizer().ForEach(Text(), [&](const Token& token) {
+      sum += token.word.size();
+      return true;
+    });
+    benchmark::DoNotOptimize(sum);
+  }
+  Bytes(state);
+}
+BENCHMARK(Tokenize);
+
+void PrepareDocument(benchmark::State& state) {
+  for (auto _ : state) {
+    Document document;
+    document.name = "harbour.c";
+    document.text = Text();
+    benchmark::DoNotOptimize(Prepared(std::move(document)).Size());
+  }
+  Bytes(state);
+}
+BENCHMARK(PrepareDocument);
+
+void MatchWords(benchmark::State& state) {
+  const Matcher matcher({{"", {"berth", "berths"}, false}, {"", {"tide", "is", "out"}, true}});
+  for (auto _ : state) benchmark::DoNotOptimize(matcher.MatchesIn(Text()));
+  Bytes(state);
+}
+BENCHMARK(MatchWords);
+
+void BestFragments(benchmark::State& state) {
+  const Matcher matcher({{"", {"berth"}, false}, {"", {"tide"}, false}});
+  const std::vector<Match> matches = matcher.MatchesIn(Text());
+  for (auto _ : state) {
+    for (const Window& window : BestWindows(Text(), matches, {"", 100, 3})) {
+      benchmark::DoNotOptimize(RenderWindow(Text(), window, matches));
+    }
+  }
+}
+BENCHMARK(BestFragments);
+
+void ParseAndWriteJson(benchmark::State& state) {
+  std::string hit = R"({"MARUMDPath":"/volume1/photo/trip/harbour.jpg","MARUMDFSSize":123456,)"
+                    R"("MARUMDFSName":"harbour.jpg","MARUMDIsDir":false,"score":12.5})";
+  std::string text = "[";
+  for (int i = 0; i < 50; ++i) text += (i ? "," : "") + hit;
+  text += "]";
+  for (auto _ : state) {
+    Json::Value value;
+    if (!maru::json::FromString(text, value)) state.SkipWithError("not JSON");
+    benchmark::DoNotOptimize(maru::json::ToString(value));
+  }
+}
+BENCHMARK(ParseAndWriteJson);
+
+/// An index of a few thousand documents in a folder of its own.
+class SmallIndex : public benchmark::Fixture {
+ public:
+  void SetUp(const benchmark::State&) override {
+    char name[] = "/tmp/maru-bench-XXXXXX";
+    root_ = mkdtemp(name);
+    Writer writer(root_ + "/fileindex_bench");
+    const FileRights open{0, 0, 0755, ""};
+    writer.AddDirectory(0, "", open);
+    for (int i = 0; i < 3000; ++i) {
+      Document document;
+      document.name = "harbour" + std::to_string(i) + ".c";
+      document.parent = Writer::kRoot;
+      document.rights = {0, 0, 0644, ""};
+      document.text = Text().substr(static_cast<std::size_t>(i) % 500, 2000);
+      writer.Add(Prepared(std::move(document)));
+    }
+    writer.Commit();
+    library_ = std::make_unique<Library>(root_);
+  }
+  void TearDown(const benchmark::State&) override {
+    library_.reset();
+    std::filesystem::remove_all(root_);
+  }
+
+ protected:
+  void Search(benchmark::State& state, Query::Kind kind, std::vector<std::string> words,
+              const Identity& who) {
+    Query query;
+    query.kind = kind;
+    query.words = std::move(words);
+    query.fields = {{std::string(kText), 1}};
+    SearchOptions options;
+    options.size = 50;
+    for (auto _ : state) {
+      auto reader = library_->Open({"fileindex_bench"});
+      reader->SetEyes(who);
+      const SearchResult result = reader->Search(query, options);
+      if (result.total == 0) state.SkipWithError("nothing found");
+    }
+  }
+
+  std::string root_;
+  std::unique_ptr<Library> library_;
+};
+
+BENCHMARK_F(SmallIndex, SearchWord)(benchmark::State& state) {
+  Search(state, Query::Kind::kWord, {"berth"}, {0, {}, true});
+}
+BENCHMARK_F(SmallIndex, SearchWordAsSomebody)(benchmark::State& state) {
+  Search(state, Query::Kind::kWord, {"berth"}, {1000, {1000}, false});
+}
+BENCHMARK_F(SmallIndex, SearchPhrase)(benchmark::State& state) {
+  Search(state, Query::Kind::kPhrase, {"tide", "is"}, {0, {}, true});
+}
+
+}  // namespace
+
+BENCHMARK_MAIN();
