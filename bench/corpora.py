@@ -105,7 +105,7 @@ def make(name, corpora):
     return target
 
 
-WORD = re.compile(r"[a-z]{3,14}")
+WORD = re.compile(r"\b[a-z]{3,14}\b")
 
 
 def queries(folder, steps=10):

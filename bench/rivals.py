@@ -1,20 +1,26 @@
 """What people would use instead, on the same files and the same words. Each rival is indexed and asked
 as its own documentation shows; one that is not there or fails is reported and left out."""
 
+import concurrent.futures
 import contextlib
 import json
 import os
 import pathlib
 import shutil
+import socket
 import sqlite3
 import statistics
+import struct
 import subprocess
+import sys
 import time
 
 import system
 
 MAX_TEXT = 4 << 20
 HITS = 50
+# Suffixes whose text omindex knows how to find.
+KNOWN_TO_OMEGA = {"html", "htm", "xhtml", "svg", "xml", "txt", "md", "csv", "js", "css", "pl", "pod"}
 
 
 def text_of(path):
@@ -32,16 +38,15 @@ def quietly(*command, **options):
 
 
 class Rival:
-    """`index` builds an index of a folder in `work`, anew; `ask` answers one query, and may return
-    the seconds that the rival itself says it took."""
+    """`index` builds an index of a folder in `work`, anew; `ask` answers one query and returns how many
+    hits it shows."""
 
     name = ""
     packages = ()
 
     def __init__(self, work):
         self.work = work / self.name.replace(" ", "-")
-        shutil.rmtree(self.work, ignore_errors=True)
-        self.work.mkdir(parents=True)
+        self.work.mkdir(parents=True, exist_ok=True)
 
     def index(self, folder):
         raise NotImplementedError
@@ -49,24 +54,35 @@ class Rival:
     def ask(self, words):
         raise NotImplementedError
 
-    def size(self):
-        return system.size_mb(self.work)
+    @contextlib.contextmanager
+    def opened(self):
+        """What must be there while it is asked."""
+        yield
 
     def crawl(self, folder):
         shutil.rmtree(self.work)
         self.work.mkdir()
         result = self.index(folder)
-        result["size"] = self.size()
+        result["size"] = system.disk_mb(self.work)
+        (self.work / "complete").touch()
         return result
 
-    def p50(self, queries, rounds):
+    def is_indexed(self):
+        return (self.work / "complete").exists()
+
+    def search(self, queries, rounds):
+        """p50 and p95 in microseconds; how many hits all queries show."""
         times = []
-        for _ in range(rounds):
-            for words in queries:
+        with self.opened():
+            hits = sum(self.ask(words) for words in queries)
+            for words in queries * rounds:
                 start = time.perf_counter()
-                own = self.ask(words)
-                times.append(own if own is not None else time.perf_counter() - start)
-        return statistics.median(times) * 1e6
+                self.ask(words)
+                times.append((time.perf_counter() - start) * 1e6)
+        if hits == 0:
+            raise RuntimeError("finds nothing")
+        return {"p50": statistics.median(times), "p95": sorted(times)[len(times) * 95 // 100],
+                "hits": hits}
 
 
 class Engine(Rival):
@@ -85,6 +101,16 @@ class Engine(Rival):
         return system.run_json(system.program("maru-bench-engine"), "search", self.work / "db", file,
                                rounds, totals)
 
+    def search(self, queries, rounds):
+        """The best 50; `exact`: with exact totals; `per_second`: with a process for each core."""
+        best, exact = (self.measure(queries, rounds, totals) for totals in ("best", "exact"))
+        cores = os.cpu_count()
+        with concurrent.futures.ThreadPoolExecutor(cores) as pool:
+            all_cores = pool.map(lambda _: self.measure(queries, rounds, "best"), range(cores))
+        return {"p50": best["p50"], "p95": best["p95"], "exact": exact["p50"],
+                "hits": best["shown"] / rounds,
+                "per_second": sum(result["per_second"] for result in all_cores)}
+
 
 class EngineMerged(Engine):
     name = "bare engine, 2 writers"
@@ -92,32 +118,53 @@ class EngineMerged(Engine):
 
 
 class Recoll(Rival):
+    """Asked through its Python module, in process."""
+
     name = "recoll"
-    packages = ("recollcmd",)
+    packages = ("recollcmd", "python3-recoll")
 
     def index(self, folder):
         (self.work / "recoll.conf").write_text(
-            f"topdirs = {folder}\nidxflushmb = 100\nlogfilename = /dev/null\n", encoding="utf-8")
+            f"topdirs = {folder}\nlogfilename = /dev/null\nmaxTermExpand = 1000000\n"
+            "maxXapianClauses = 1000000\n", encoding="utf-8")
         return system.timed(["recollindex", "-c", self.work])
 
+    @contextlib.contextmanager
+    def opened(self):
+        from recoll import recoll
+        self.database = recoll.connect(confdir=str(self.work))
+        yield
+        self.database.close()
+
     def ask(self, words):
-        quietly("recollq", "-c", self.work, "-n", HITS, words)
+        query = self.database.query()
+        query.execute(words, stemming=0)
+        return len([hit.url for hit in query.fetchmany(HITS)])
 
 
 class Omega(Rival):
+    """A CGI program: every query starts it anew."""
+
     name = "omega"
     packages = ("xapian-omega",)
 
     def index(self, folder):
-        return system.timed(["omindex", "--db", self.work / "default", "--url", "/", folder])
+        suffixes = {path.suffix[1:] for path in files_of(folder)} - KNOWN_TO_OMEGA
+        plain = [f"--mime-type={suffix}:text/plain" for suffix in sorted(suffixes)
+                 if suffix not in ("png", "gif", "jpg", "woff", "woff2", "ico")]
+        result = system.timed(["omindex", "--db", self.work / "default", "--url", "/", *plain, folder])
+        (self.work / "hits").write_text("$set{flag_wildcard,1}$hitlist{$field{url} $percentage\n}",
+                                        encoding="utf-8")
+        (self.work / "omega.conf").write_text(
+            f"database_dir {self.work}\ntemplate_dir {self.work}\nlog_dir {self.work}\n"
+            f"cdb_dir {self.work}\n", encoding="utf-8")
+        return result
 
     def ask(self, words):
-        (self.work / "omega.conf").write_text(
-            f"database_dir {self.work}\ntemplate_dir /var/lib/omega/templates\n"
-            f"log_dir {self.work}\ncdb_dir {self.work}\n", encoding="utf-8")
         environment = dict(os.environ, OMEGA_CONFIG_FILE=str(self.work / "omega.conf"))
-        quietly("/usr/lib/cgi-bin/omega/omega", f"P={words}", f"HITSPERPAGE={HITS}",
-                env=environment)
+        answer = quietly("/usr/lib/cgi-bin/omega/omega", f"P={words}", "DEFAULTOP=and", "FMT=hits",
+                         f"HITSPERPAGE={HITS}", env=environment)
+        return answer.count(b"%") or answer.count(b"\n/")
 
 
 class Fts5(Rival):
@@ -126,28 +173,32 @@ class Fts5(Rival):
     name = "SQLite FTS5"
 
     def index(self, folder):
-        before = os.times()
-        start = time.monotonic()
-        with contextlib.closing(sqlite3.connect(self.work / "db")) as database:
-            database.execute("CREATE VIRTUAL TABLE files USING fts5(path, text)")
+        return system.timed([sys.executable, __file__, folder, self.work / "db"])
+
+    @staticmethod
+    def fill(folder, file):
+        with contextlib.closing(sqlite3.connect(file)) as database:
+            database.execute("CREATE VIRTUAL TABLE files USING fts5(path UNINDEXED, text)")
             database.executemany("INSERT INTO files VALUES (?, ?)",
-                                 ((str(path), text_of(path)) for path in files_of(folder)))
+                                 ((os.fsencode(path), text_of(path)) for path in files_of(folder)))
             database.commit()
-        after = os.times()
-        return {"seconds": time.monotonic() - start,
-                "cpu": after.user + after.system - before.user - before.system, "peak": 0}
+
+    @contextlib.contextmanager
+    def opened(self):
+        with contextlib.closing(sqlite3.connect(self.work / "db")) as self.database:
+            yield
 
     def ask(self, words):
-        with contextlib.closing(sqlite3.connect(self.work / "db")) as database:
-            start = time.perf_counter()
-            database.execute("SELECT path FROM files WHERE files MATCH ? ORDER BY rank LIMIT ?",
-                             (words, HITS)).fetchall()
-            return time.perf_counter() - start
+        return len(self.database.execute(
+            "SELECT path FROM files WHERE files MATCH ? ORDER BY rank LIMIT ?",
+            (words, HITS)).fetchall())
 
 
 class Groonga(Rival):
+    """One process that takes one command a line."""
+
     name = "groonga"
-    packages = ("groonga-bin", "groonga-tokenizer-mecab")
+    packages = ("groonga-bin",)
 
     def index(self, folder):
         commands = self.work / "load.grn"
@@ -158,30 +209,44 @@ class Groonga(Rival):
                       " --normalizer NormalizerAuto\n"
                       "column_create Words files COLUMN_INDEX|WITH_POSITION Files text\n"
                       "load --table Files\n[\n")
-            rows = (json.dumps({"path": str(path), "text": text_of(path)}) for path in files_of(folder))
+            rows = (json.dumps({"path": os.fsencode(path).decode("utf-8", "replace"),
+                                "text": text_of(path)}) for path in files_of(folder))
             out.write(",\n".join(rows) + "\n]\n")
         result = system.timed(["groonga", "--file", commands, "-n", self.work / "db"])
         commands.unlink()
         return result
 
+    @contextlib.contextmanager
+    def opened(self):
+        with subprocess.Popen(["groonga", str(self.work / "db")], stdin=subprocess.PIPE,
+                              stdout=subprocess.PIPE) as self.process:
+            yield
+            self.process.stdin.close()
+
     def ask(self, words):
-        condition = " ".join(words.split())
-        answer = quietly("groonga", self.work / "db", "select", "Files", "--match_columns", "text",
-                         "--query", f"'{condition}'", "--output_columns", "path,_score",
-                         "--sort_keys", "-_score", "--limit", HITS)
-        return json.loads(answer)[0][2]
+        self.process.stdin.write(
+            f"select Files --match_columns text --query '{words}' --output_columns path,_score"
+            f" --sort_keys -_score --limit {HITS} --cache no\n".encode())
+        self.process.stdin.flush()
+        (status, *_), *tables = json.loads(self.process.stdout.readline())
+        if status != 0:
+            raise RuntimeError(f"it answers {status}")
+        return len(tables[0][0]) - 2
 
 
 class Sphinx(Rival):
+    """Its daemon, asked in SphinxQL over the protocol of MySQL."""
+
     name = "sphinx"
-    packages = ("sphinxsearch", "mariadb-client-core")
+    packages = ("sphinxsearch",)
     port = 19306
 
-    def configure(self, folder):
+    def index(self, folder):
         rows = self.work / "rows.tsv"
         with open(rows, "w", encoding="utf-8") as out:
             for number, path in enumerate(files_of(folder), 1):
-                out.write(f"{number}\t{path}\t{' '.join(text_of(path).split())}\n")
+                name = os.fsencode(path).decode("utf-8", "replace")
+                out.write(f"{number}\t{name}\t{' '.join(text_of(path).split())}\n")
         (self.work / "sphinx.conf").write_text(f"""
 source files {{
   type = tsvpipe
@@ -201,34 +266,56 @@ indexer {{
 searchd {{
   listen = 127.0.0.1:{self.port}:mysql41
   pid_file = {self.work}/pid
-  log = /dev/null
+  log = {self.work}/log
+  binlog_path =
 }}
 """, encoding="utf-8")
-        return rows
-
-    def index(self, folder):
-        rows = self.configure(folder)
         result = system.timed(["indexer", "--config", self.work / "sphinx.conf", "--all"])
         rows.unlink()
         return result
 
-    def p50(self, queries, rounds):
+    @contextlib.contextmanager
+    def opened(self):
         daemon = subprocess.Popen(["searchd", "--config", str(self.work / "sphinx.conf"),
                                    "--nodetach"], stdout=subprocess.DEVNULL)
         try:
-            system.road.wait_until(lambda: (self.work / "pid").exists(), "searchd")
-            time.sleep(1)
-            return super().p50(queries, rounds)
+            system.road.wait_until(self.connects, "searchd")
+            with self.connection:
+                yield
         finally:
             daemon.terminate()
             daemon.wait()
 
+    def connects(self):
+        with contextlib.suppress(OSError):
+            self.connection = socket.create_connection(("127.0.0.1", self.port))
+            self.stream = self.connection.makefile("rwb")
+            self.receive()
+            self.send(struct.pack("<IIB23x", 0x8200, 1 << 24, 33) + b"bench\0\0", 1)
+            return self.receive()[0] == 0
+        return False
+
+    def send(self, body, number=0):
+        self.stream.write(len(body).to_bytes(3, "little") + bytes([number]) + body)
+        self.stream.flush()
+
+    def receive(self):
+        head = self.stream.read(4)
+        if len(head) < 4:
+            raise OSError("it hung up")
+        return self.stream.read(int.from_bytes(head[:3], "little"))
+
     def ask(self, words):
-        rows = quietly("mariadb", "-h127.0.0.1", f"-P{self.port}", "-N", "-e",
-                       f"SELECT path FROM files WHERE MATCH('{words}') LIMIT {HITS}; SHOW META")
-        times = [line.split("\t")[1] for line in rows.decode().splitlines()
-                 if line.startswith("time\t")]
-        return float(times[0])
+        self.send(b"\3" + f"SELECT path FROM files WHERE MATCH('{words}') LIMIT {HITS}".encode())
+        first = self.receive()
+        if first[0] == 0xff:
+            raise RuntimeError(first[9:].decode(errors="replace"))
+        packets, ends = 0, 0
+        while ends < 2:
+            is_end = self.receive()[0] == 0xfe
+            ends += is_end
+            packets += not is_end
+        return packets - first[0]
 
 
 ALL = (Engine, EngineMerged, Recoll, Omega, Fts5, Groonga, Sphinx)
@@ -240,4 +327,8 @@ def install(rivals):
     for rival in rivals:
         if rival.packages:
             subprocess.run([str(pathlib.Path(__file__).parent.parent / "tools/install-packages"),
-                            *rival.packages], check=False)
+                            *rival.packages], check=False, stdout=sys.stderr)
+
+
+if __name__ == "__main__":
+    Fts5.fill(pathlib.Path(sys.argv[1]), sys.argv[2])

@@ -1,10 +1,13 @@
 #!/usr/bin/python3
 """Inside the sandbox: measures one corpus and writes the figures as JSON.
 
-roads.py OPTIONS-AS-JSON, which bench/run writes: share, roads, rivals, runs, rounds, queries, output.
+roads.py OPTIONS-AS-JSON, which bench/run writes: share, roads, rivals, runs, rounds, queries, work,
+output, may_drop_caches.
 """
 
+import concurrent.futures
 import json
+import os
 import pathlib
 import statistics
 import subprocess
@@ -15,6 +18,10 @@ import time
 import rivals
 import system
 from system import road
+
+
+def say(text):
+    print(f"bench:   {text}", file=sys.stderr, flush=True)
 
 
 def median_of(results):
@@ -50,6 +57,7 @@ class Roads:
         return [road.search_request(words, **more) for words in self.queries]
 
     def crawl(self):
+        """From nothing to the finished index, by turns; then, unchanged, once more."""
         folder = self.system.folder
         ours, theirs = [], {name: [] for name in self.rivals}
         for run in range(self.options["runs"]):
@@ -57,80 +65,40 @@ class Roads:
             ours.append(self.system.crawl())
             for name, rival in self.rivals.items():
                 if run == 0 or theirs[name]:
+                    say(f"crawl: {name}")
                     result = self.tried(name, lambda rival=rival: rival.crawl(folder))
                     theirs[name] += [result] if result else []
-        figures = {"files": system.count_files(folder), "mb": system.size_mb(folder),
-                   "ours": median_of(ours) | {"size": system.size_mb(system.INDEX)},
-                   "rivals": {name: median_of(results) for name, results in theirs.items() if results}}
-        again = [self.system.crawl() for _ in range(3)]
-        figures["again"] = median_of(again)
-        return figures
+        return {"files": system.count_files(folder), "mb": system.size_mb(folder),
+                "ours": median_of(ours) | {"size": system.disk_mb(system.INDEX)},
+                "rivals": {name: median_of(results) for name, results in theirs.items() if results},
+                "again": median_of([self.system.crawl() for _ in range(3)])}
 
     def search(self):
-        rounds, ours = self.options["rounds"], {"alone": [], "loaded": [], "daemon": []}
+        """The same searches of everybody, by turns; of us alone, eight at once, and of the daemon."""
+        rounds, ours = self.options["rounds"], {"alone": [], "loaded": [], "daemon": [], "cpu": []}
         theirs = {name: [] for name in self.rivals}
-        engine = self.rivals.get("bare engine")
+        for name, rival in self.rivals.items():
+            if not rival.is_indexed():
+                say(f"search: {name} indexes first")
+                self.tried(name, lambda rival=rival: rival.crawl(self.system.folder))
         self.system.load(self.bodies(), rounds=2)
-        figures = {}
-        for run in range(self.options["runs"]):
+        for _ in range(self.options["runs"]):
             before = system.cpu_seconds()
             ours["alone"].append(self.system.load(self.bodies(), rounds=rounds))
             after = system.cpu_seconds()
-            figures["cpu"] = {name: (after[name] - before[name]) * 1e6 / rounds / len(self.queries)
-                              for name in after}
+            ours["cpu"].append({group: (after[group] - before[group]) * 1e6 / rounds
+                                / len(self.queries) for group in after})
             ours["loaded"].append(self.system.load(self.bodies(), connections=8, rounds=rounds))
-            ours["daemon"].append(self.daemon_times(rounds))
+            ours["daemon"].append(self.system.daemon_times(self.queries, rounds))
             for name, rival in self.rivals.items():
-                if rival is engine:
-                    result = {kind: rival.measure(self.queries, rounds, kind)
-                              for kind in ("best", "exact")}
-                    both = self.both_cores(rival, rounds)
-                    theirs[name].append({"p50": result["best"]["p50"], "p95": result["best"]["p95"],
-                                         "exact": result["exact"]["p50"], "per_second": both})
-                elif name != "bare engine, 2 writers" and (run == 0 or theirs[name]):
-                    some = self.queries if rounds > 1 else self.queries[:5]
-                    p50 = self.tried(name, lambda rival=rival, some=some: rival.p50(some, 1))
-                    theirs[name] += [{"p50": p50}] if p50 else []
-        figures["still"] = self.still(rounds)
-        figures |= {kind: median_of(results) for kind, results in ours.items()}
-        figures["rivals"] = {name: median_of(results) for name, results in theirs.items() if results}
-        return figures
+                result = self.tried(name, lambda rival=rival: rival.search(self.queries, rounds))
+                theirs[name] += [result] if result else []
+        return {kind: median_of(results) for kind, results in ours.items()} | {
+            "front": self.front(rounds), "child": self.child(rounds),
+            "rivals": {name: median_of(results) for name, results in theirs.items() if results}}
 
-    def both_cores(self, engine, rounds):
-        """Searches per second of the bare engine with a process for each core."""
-        results = []
-        threads = [threading.Thread(target=lambda: results.append(
-            engine.measure(self.queries, rounds, "best"))) for _ in range(2)]
-        for thread in threads:
-            thread.start()
-        for thread in threads:
-            thread.join()
-        return sum(result["per_second"] for result in results)
-
-    def daemon_times(self, rounds, **more):
-        """The same searches asked at the daemon's socket, as the plug-in asks them."""
-        times = []
-        index = ["fileindex_" + self.options["share"]]
-        with road.socket.socket(road.socket.AF_UNIX) as connection:
-            connection.connect(road.SOCKET)
-            stream = connection.makefile("rwb")
-            for _ in range(rounds):
-                for words in self.queries:
-                    request = road.daemon_search(words, index, size=50,
-                                                 filters=[{"name": "permission", "data": "alice"}])
-                    request["data"] |= more
-                    line = json.dumps(request).encode() + b"\n"
-                    start = time.perf_counter()
-                    stream.write(line)
-                    stream.flush()
-                    while b'"success"' not in stream.readline():
-                        pass
-                    times.append((time.perf_counter() - start) * 1e6)
-        times.sort()
-        return {"p50": times[len(times) // 2], "p95": times[len(times) * 95 // 100]}
-
-    def still(self, rounds):
-        """What an answer costs that needs no search: a method that the plug-in refuses at once."""
+    def front(self, rounds):
+        """An answer that the front gives by itself, in microseconds."""
         connection = self.system.services.connect()
         times = []
         for _ in range(30 * rounds):
@@ -140,12 +108,27 @@ class Roads:
             times.append((time.perf_counter() - start) * 1e6)
         return statistics.median(times)
 
+    def child(self, rounds):
+        """An answer for which a child becomes the user and the plug-in refuses the request at once."""
+        body = json.dumps(road.search_request("x", query_id="a/b", query_serial=1))
+        headers = {"Content-Type": "application/json",
+                   "Authorization": "Bearer " + self.system.token("alice")}
+        connection = self.system.services.connect()
+        times = []
+        for _ in range(30 * rounds):
+            start = time.perf_counter()
+            connection.request("POST", road.SEARCH_PATH, body, headers)
+            answer = connection.getresponse().read()
+            times.append((time.perf_counter() - start) * 1e6)
+        assert json.loads(answer)["error"]["code"] == 120, answer
+        return statistics.median(times)
+
     def fragments(self):
         highlight = {"field": "MARUMDTextContent", "frag_length": 100, "num_fragments": 3}
         bodies = self.bodies(highlight=[highlight])
         results = [self.system.load(bodies, rounds=self.options["rounds"])
                    for _ in range(self.options["runs"])]
-        daemon = [self.daemon_times(self.options["rounds"], highlight=[highlight])
+        daemon = [self.system.daemon_times(self.queries, self.options["rounds"], highlight=[highlight])
                   for _ in range(self.options["runs"])]
         return median_of(results) | {"daemon": median_of(daemon)["p50"]}
 
@@ -158,37 +141,39 @@ class Roads:
         return {user: median_of(some) for user, some in results.items()}
 
     def burst(self):
-        """Twenty searches of one id, as somebody types; then the last one alone."""
-        words = self.queries[12]
+        """Twenty searches of one id, as somebody types, against the last of them alone."""
+        words = self.queries[12][:3] + "*"
         token = self.system.token("alice")
 
-        def ask(serial, query_id):
-            request = road.search_request(words[:3] + "*", query_id=query_id, query_serial=serial)
+        def send(serial, query_id):
+            request = road.search_request(words, query_id=query_id, query_serial=serial)
             return self.system.services.begin(self.system.services.connect(), "POST",
                                               road.SEARCH_PATH, request, token)
 
-        def measured(serials, query_id):
-            before = sum(system.cpu_seconds().values())
-            connections = [ask(serial, query_id) for serial in serials]
-            start = time.perf_counter()
-            others = []
-            for connection in connections[:-1]:
-                threads = threading.Thread(target=lambda c=connection: others.append(
-                    (self.system.services.finish(c), time.perf_counter() - start)))
-                threads.start()
-                connection.thread = threads
-            self.system.services.finish(connections[-1])
-            for connection in connections[:-1]:
-                connection.thread.join()
-            time.sleep(0.2)
-            return (sum(system.cpu_seconds().values()) - before,
-                    max((seconds for _, seconds in others), default=0))
+        def ended(connection):
+            self.system.services.finish(connection)
+            return time.perf_counter()
 
-        count = self.options["rounds"]
-        bursts = [measured(range(1, 21), f"burst{i}") for i in range(count)]
-        alone = [measured([1], f"alone{i}") for i in range(count)]
-        return {"cpu": sum(cpu for cpu, _ in bursts) / max(sum(cpu for cpu, _ in alone), 0.001),
-                "stops_ms": statistics.median(seconds for _, seconds in bursts) * 1e3}
+        def one(serials, query_id):
+            """Milliseconds from the newest request until all older ones have ended."""
+            *older, newest = [send(serial, query_id) for serial in serials]
+            start = time.perf_counter()
+            with concurrent.futures.ThreadPoolExecutor(len(older) + 1) as pool:
+                ends = list(pool.map(ended, [newest, *older]))
+            return (max(ends[1:], default=start) - start) * 1e3
+
+        def many(count, serials, name):
+            """The median of `one`, and the CPU seconds of each."""
+            before = sum(system.cpu_seconds().values())
+            times = [one(serials, f"{name}{number}") for number in range(count)]
+            time.sleep(0.2)
+            return statistics.median(times), (sum(system.cpu_seconds().values()) - before) / count
+
+        count = self.options["rounds"] + 2
+        many(count, [1], "warm")
+        _, alone = many(10 * count, [1], "alone")
+        stops, whole = many(count, range(1, 21), "burst")
+        return {"cpu": whole / alone, "stops_ms": stops}
 
     def methods(self):
         """Highlight of one document, counts per type, suggestions."""
@@ -217,15 +202,25 @@ class Roads:
         return {name: statistics.median(some) for name, some in figures.items()}
 
     def cold(self):
-        """From nothing running to the first answer, the files in the page cache."""
-        times = []
-        for _ in range(self.options["runs"]):
+        """Seconds from nothing running to the first answer, with the index in the page cache and,
+        where the machine permits it, without."""
+        def first_answer():
             self.system.stop()
+            if dropped:
+                subprocess.run(["sync"], check=True)
+                pathlib.Path("/proc/sys/vm/drop_caches").write_text("3", encoding="ascii")
             start = time.monotonic()
             self.system.start()
             road.search(self.system.services, self.system.token("alice"), self.queries[10])
-            times.append(time.monotonic() - start)
-        return {"seconds": statistics.median(times)}
+            return time.monotonic() - start
+
+        figures, dropped = {}, False
+        figures["cached"] = statistics.median(first_answer() for _ in range(self.options["runs"]))
+        if self.options["may_drop_caches"] and os.access("/proc/sys/vm/drop_caches", os.W_OK):
+            dropped = True
+            figures["uncached"] = statistics.median(
+                first_answer() for _ in range(self.options["runs"]))
+        return figures
 
     def memory(self):
         self.system.stop()
@@ -237,8 +232,8 @@ class Roads:
             self.bodies(), connections=8, rounds=self.options["rounds"] * 3))
         loader.start()
         while loader.is_alive():
-            for name, used in system.memory_mb().items():
-                most[name] = max(most.get(name, 0), used)
+            for group, used in system.memory_mb().items():
+                most[group] = max(most.get(group, 0), used)
             time.sleep(0.05)
         return {"rest": rest, "load": most}
 
@@ -250,20 +245,17 @@ class Roads:
                                            rounds=rounds * 5)}
 
     def run(self):
-        wanted = self.options["roads"]
+        wanted = list(self.options["roads"])
         if "crawl" in wanted:
+            wanted.remove("crawl")
             self.figures["crawl"] = self.crawl()
         else:
             self.system.crawl()
-            engine = self.rivals.get("bare engine")
-            if engine and "search" in wanted:
-                engine.crawl(self.system.folder)
         self.system.start()
         try:
             for name in wanted:
-                if name != "crawl":
-                    print(f"bench: {self.options['share']}: {name}", file=sys.stderr, flush=True)
-                    self.figures[name] = getattr(self, name)()
+                say(name)
+                self.figures[name] = getattr(self, name)()
         finally:
             self.system.stop()
         self.figures["failed"] = self.failed

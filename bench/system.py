@@ -15,7 +15,9 @@ sys.path.insert(0, str(TOP / "tests/road"))
 
 import road  # noqa: E402  the services, as the road tests start them
 
-OUR_PROGRAMS = ("maruelasticd", "maruwebd", "maruindexd")
+# Groups of processes; maruwebd's are its front, its host and the children that the host has waited for.
+PROGRAMS = {"maruelasticd": "daemon", "maruindexd": "indexer"}
+FRONT_USER = "59999"
 INDEX = road.STATE / "index"
 
 
@@ -45,59 +47,76 @@ def timed(command, **options):
     return {"seconds": seconds, "cpu": cpu, "peak": int(report.stdout.split()[-1]) / 1024}
 
 
-def size_mb(*folders):
+def size_mb(*folders, size=lambda status: status.st_size):
     total = 0
     for folder in folders:
         for parent, _, names in os.walk(folder):
             for name in names:
                 with contextlib.suppress(OSError):
-                    total += os.lstat(os.path.join(parent, name)).st_size
+                    total += size(os.lstat(os.path.join(parent, name)))
     return total / 1e6
+
+
+def disk_mb(folder):
+    """What it takes on the disk: files with holes are smaller than they look."""
+    return size_mb(folder, size=lambda status: status.st_blocks * 512)
 
 
 def count_files(folder):
     return sum(len(names) for _, _, names in os.walk(folder))
 
 
-def processes(names=OUR_PROGRAMS):
-    """(pid, name) of the processes that run one of our programs."""
+def processes():
+    """(pid, group) of the processes that run one of our programs."""
     for entry in pathlib.Path("/proc").iterdir():
         if entry.name.isdigit():
             with contextlib.suppress(OSError):
-                path = os.path.basename(os.readlink(entry / "exe"))
-                if path in names:
-                    yield int(entry.name), path
+                program_name = os.path.basename(os.readlink(entry / "exe"))
+                status = (entry / "status").read_text(encoding="utf-8")
+                if program_name == "maruwebd":
+                    user = status.split("\nUid:\t")[1].split()[1]
+                    yield int(entry.name), "front" if user == FRONT_USER else "host"
+                elif program_name in PROGRAMS:
+                    yield int(entry.name), PROGRAMS[program_name]
 
 
 def cpu_seconds():
-    """CPU used so far by each of our programs, with the children they have waited for."""
+    """CPU used so far by each group of processes."""
     ticks = os.sysconf("SC_CLK_TCK")
-    used = dict.fromkeys(OUR_PROGRAMS, 0.0)
-    for pid, name in processes():
+    used = dict.fromkeys((*PROGRAMS.values(), "front", "host", "children"), 0.0)
+    for pid, group in processes():
         with contextlib.suppress(OSError):
             text = pathlib.Path(f"/proc/{pid}/stat").read_text(encoding="utf-8", errors="replace")
-            fields = text.rpartition(")")[2].split()
-            used[name] += sum(map(int, fields[11:15])) / ticks
+            own_user, own_system, user, system = map(int, text.rpartition(")")[2].split()[11:15])
+            used[group] += (own_user + own_system) / ticks
+            used["children" if group == "host" else group] += (user + system) / ticks
     return used
 
 
 def memory_mb():
-    """Memory of each program's processes, what they share counted once (PSS)."""
-    used = dict.fromkeys(OUR_PROGRAMS, 0.0)
-    for pid, name in processes():
+    """Memory of each group of processes, what they share counted once (PSS)."""
+    used = {}
+    for pid, group in processes():
         with contextlib.suppress(OSError):
             rollup = pathlib.Path(f"/proc/{pid}/smaps_rollup").read_text(encoding="utf-8")
-            used[name] += int(rollup.split("Pss:")[1].split()[0]) / 1024
+            used[group] = used.get(group, 0) + int(rollup.split("Pss:")[1].split()[0]) / 1024
     return used
 
 
 class System:
-    """A share's index and the services on it."""
+    """A share's index, which stays in `work` from run to run, and the services on it."""
 
     def __init__(self, share, work):
         self.share = share
         self.folder = road.SHARES / share
         self.work = work
+        state = work / "maruseeker"
+        state.mkdir(exist_ok=True)
+        shutil.chown(state, "MaruSeeker", "MaruSeeker")
+        subprocess.run(["mount", "--bind", state, road.STATE], check=True)
+        for path in road.STATE.iterdir():
+            if path.is_file():
+                path.unlink()
         self.services = road.Services()
         self.tokens = {}
 
@@ -129,6 +148,28 @@ class System:
         if result["failed"]:
             raise RuntimeError(f"{result['failed']} requests failed")
         return result
+
+    def daemon_times(self, queries, rounds, user="alice", **more):
+        """The same searches asked at the daemon's socket, as the plug-in asks them."""
+        def ask():
+            times = []
+            with road.socket.socket(road.socket.AF_UNIX) as connection:
+                connection.connect(road.SOCKET)
+                stream = connection.makefile("rwb")
+                for words in queries * rounds:
+                    request = road.daemon_search(words, ["fileindex_" + self.share], size=50)
+                    request["data"] |= more
+                    line = json.dumps(request).encode() + b"\n"
+                    start = time.perf_counter()
+                    stream.write(line)
+                    stream.flush()
+                    while b'"success"' not in stream.readline():
+                        pass
+                    times.append((time.perf_counter() - start) * 1e6)
+            return times
+
+        times = sorted(road.as_user(user, ask))
+        return {"p50": times[len(times) // 2], "p95": times[len(times) * 95 // 100]}
 
 
 if __name__ == "__main__":

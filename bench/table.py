@@ -40,7 +40,7 @@ def crawl_tables(name, figures):
 
 def search_tables(name, figures):
     search = figures["search"]
-    ours, engine = search["alone"], search["rivals"].get("bare engine", {})
+    ours = search["alone"]
     rows = [["search of " + name + ", 50 hits", "p50 us", "p95 us", "p99 us", "searches/s",
              "p50 against MaruSeeker's"]]
     rows.append(["MaruSeeker, HTTP to HTTP", number(ours["p50"]), number(ours["p95"]),
@@ -51,18 +51,33 @@ def search_tables(name, figures):
     for who, result in search["rivals"].items():
         rows.append([who, number(result["p50"]), number(result.get("p95")), "-",
                      number(result.get("per_second")), ratio(result["p50"], ours["p50"])])
-    daemon = search["daemon"]["p50"]
     cpu = ", ".join(f"{who} {number(used)}" for who, used in search["cpu"].items() if used)
-    notes = f"Where the time of the median goes: the daemon {number(daemon)} us"
-    if engine:
-        notes += (f", of it the engine {number(engine['exact'])} us with exact totals "
-                  f"({number(engine['p50'])} us for the best 50 alone)")
-        notes += (f"; HTTP, child, plug-in and enrichment {number(ours['p50'] - daemon)} us, of it "
-                  f"{number(search['still'])} us for an answer that needs none of them. p50 against "
-                  f"the bare engine: {ratio(ours['p50'], engine['p50'])}; searches/s of the whole "
-                  f"machine against the bare engine on both cores: "
-                  f"{ratio(loaded['per_second'], engine['per_second'])}")
-    return aligned(rows) + f"\n\n{notes}. CPU per search, us: {cpu}."
+    return (aligned(rows) + "\n\n" + where_time_goes(search) + f"\n\nCPU per search, us: {cpu}."
+            + against_engine(search))
+
+
+def where_time_goes(search):
+    """The median's parts: each boundary is measured, the rest is their difference."""
+    front, child, daemon = search["front"], search["child"], search["daemon"]["p50"]
+    engine = search["rivals"].get("bare engine", {}).get("exact", 0)
+    parts = [("the front's own answer", front),
+             ("host, child and plug-in that refuses at once, beyond that", child - front),
+             ("the engine, bare, with exact totals", engine),
+             ("the daemon beyond that: socket, rights, fields, page check", daemon - engine),
+             ("the plug-in's request, reply and enrichment: the rest",
+              search["alone"]["p50"] - child - daemon)]
+    return aligned([["where the time of the median goes", "us"],
+                    *[[what, number(time)] for what, time in parts]])
+
+
+def against_engine(search):
+    engine = search["rivals"].get("bare engine")
+    if not engine:
+        return ""
+    return (f" p50 against the bare engine: {ratio(search['alone']['p50'], engine['p50'])}, with exact "
+            f"totals on both sides {ratio(search['alone']['p50'], engine['exact'])}; searches/s of the "
+            "whole machine against the bare engine on all cores: "
+            f"{ratio(search['loaded']['per_second'], engine['per_second'])}.")
 
 
 def other_rows(results):
@@ -87,7 +102,8 @@ def other_rows(results):
         for method, p50 in figures.get("methods", {}).items():
             rows.append([f"{name}: {method}, p50, us", number(p50)])
         if "cold" in figures:
-            rows.append([f"{name}: start to first answer, s", number(figures["cold"]["seconds"])])
+            for how, seconds in figures["cold"].items():
+                rows.append([f"{name}: start to first answer, {how}, s", number(seconds)])
         memory = figures.get("memory")
         if memory:
             for when, used in (("at rest", memory["rest"]), ("under load", memory["load"])):
@@ -133,6 +149,6 @@ def check(results, where="results"):
         for key, value in results.items():
             check(value, f"{where}.{key}")
     elif isinstance(results, (int, float)) and not isinstance(results, bool):
-        may_be_zero = ("cpu", "maruindexd", "peak", "failed", "index", "repetition", "threads",
-                       "maruelasticd", "maruwebd", "stops_ms")
+        # CPU is counted in hundredths of a second; older work may stop before the newest is sent.
+        may_be_zero = (".cpu", "stops_ms", ".failed", "micro.")
         assert results > 0 or any(word in where for word in may_be_zero), f"{where} is {results}"
