@@ -10,7 +10,7 @@
 #include <fstream>
 #include <iostream>
 #include <iterator>
-#include <random>
+#include <stdexcept>
 #include <string>
 #include <thread>
 #include <vector>
@@ -102,6 +102,7 @@ int Measure(const std::string& path, const std::string& queries, std::size_t rou
   std::vector<std::string> lines;
   std::ifstream file(queries);
   for (std::string line; std::getline(file, line);) lines.push_back(line);
+  if (lines.empty() || rounds == 0) throw std::runtime_error("no queries in " + queries);
   Xapian::Database database(path);
   std::vector<double> times;
   std::size_t shown = 0;

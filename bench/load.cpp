@@ -11,6 +11,7 @@
 #include <iostream>
 #include <stdexcept>
 #include <string>
+#include <string_view>
 #include <thread>
 #include <vector>
 
@@ -31,6 +32,7 @@ struct Totals {
   std::vector<double> times;
   std::size_t failed = 0;
   std::size_t bytes = 0;
+  std::size_t hits = 0;
 };
 
 class Connection {
@@ -87,6 +89,15 @@ std::string Request(const Options& options, const std::string& body) {
          "\r\n\r\n" + body;
 }
 
+std::size_t HitsIn(const std::string& answer) {
+  std::size_t hits = 0;
+  const std::string_view mark = "\"MARUMDPath\"";
+  for (std::size_t at = 0; (at = answer.find(mark, at)) != std::string::npos; at += mark.size()) {
+    ++hits;
+  }
+  return hits;
+}
+
 void Run(const Options& options, std::size_t first, Totals& totals) {
   std::vector<std::string> requests;
   for (const std::string& body : options.bodies) requests.push_back(Request(options, body));
@@ -96,6 +107,7 @@ void Run(const Options& options, std::size_t first, Totals& totals) {
     const std::string& answer = connection.Exchange(requests[(first + i) % requests.size()]);
     totals.times.push_back(std::chrono::duration<double, std::micro>(Clock::now() - start).count());
     totals.bytes += answer.size();
+    totals.hits += HitsIn(answer);
     totals.failed += answer.find("\"success\":true") == std::string::npos &&
                      answer.find("\"success\" : true") == std::string::npos;
   }
@@ -122,6 +134,7 @@ int Measure(const Options& options) {
     all.times.insert(all.times.end(), one.times.begin(), one.times.end());
     all.failed += one.failed;
     all.bytes += one.bytes;
+    all.hits += one.hits;
   }
   if (all.times.empty()) return 1;
   std::sort(all.times.begin(), all.times.end());
@@ -130,7 +143,8 @@ int Measure(const Options& options) {
   };
   std::cout << "{\"p50\": " << at(50) << ", \"p95\": " << at(95) << ", \"p99\": " << at(99)
             << ", \"per_second\": " << static_cast<double>(all.times.size()) / seconds
-            << ", \"failed\": " << all.failed << ", \"bytes\": " << all.bytes << "}\n";
+            << ", \"failed\": " << all.failed << ", \"bytes\": " << all.bytes
+            << ", \"hits\": " << all.hits << "}\n";
   return 0;
 }
 

@@ -95,18 +95,17 @@ class Engine(Rival):
         return system.timed([system.program("maru-bench-engine"), "index", folder, self.work / "db",
                              self.writers, 500])
 
-    def measure(self, queries, rounds, totals):
-        file = self.work / "queries"
-        file.write_text("\n".join(queries) + "\n", encoding="utf-8")
-        return system.run_json(system.program("maru-bench-engine"), "search", self.work / "db", file,
-                               rounds, totals)
+    def measure(self, rounds, totals):
+        return system.run_json(system.program("maru-bench-engine"), "search", self.work / "db",
+                               self.work / "queries", rounds, totals)
 
     def search(self, queries, rounds):
         """The best 50; `exact`: with exact totals; `per_second`: with a process for each core."""
-        best, exact = (self.measure(queries, rounds, totals) for totals in ("best", "exact"))
+        (self.work / "queries").write_text("\n".join(queries) + "\n", encoding="utf-8")
+        best, exact = (self.measure(rounds, totals) for totals in ("best", "exact"))
         cores = os.cpu_count()
         with concurrent.futures.ThreadPoolExecutor(cores) as pool:
-            all_cores = pool.map(lambda _: self.measure(queries, rounds, "best"), range(cores))
+            all_cores = pool.map(lambda _: self.measure(rounds, "best"), range(cores))
         return {"p50": best["p50"], "p95": best["p95"], "exact": exact["p50"],
                 "hits": best["shown"] / rounds,
                 "per_second": sum(result["per_second"] for result in all_cores)}

@@ -84,7 +84,8 @@ class Roads:
         self.system.load(self.bodies(), rounds=2)
         for _ in range(self.options["runs"]):
             before = system.cpu_seconds()
-            ours["alone"].append(self.system.load(self.bodies(), rounds=rounds))
+            alone = self.system.load(self.bodies(), rounds=rounds)
+            ours["alone"].append(alone | {"hits": alone["hits"] / rounds})
             after = system.cpu_seconds()
             ours["cpu"].append({group: (after[group] - before[group]) * 1e6 / rounds
                                 / len(self.queries) for group in after})

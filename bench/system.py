@@ -4,10 +4,11 @@ import contextlib
 import json
 import os
 import pathlib
-import resource
+import select
 import shutil
 import subprocess
 import sys
+import tempfile
 import time
 
 TOP = pathlib.Path(__file__).resolve().parent.parent
@@ -15,9 +16,9 @@ sys.path.insert(0, str(TOP / "tests/road"))
 
 import road  # noqa: E402  the services, as the road tests start them
 
-# Groups of processes; maruwebd's are its front, its host and the children that the host has waited for.
+# Groups of processes; maruwebd's are its front, its host, and the children that are some user.
 PROGRAMS = {"maruelasticd": "daemon", "maruindexd": "indexer"}
-FRONT_USER = "59999"
+WEB_USERS = {"59999": "front", "0": "host"}
 INDEX = road.STATE / "index"
 
 
@@ -31,20 +32,42 @@ def run_json(*command):
     return json.loads(done.stdout)
 
 
-def timed(command, **options):
-    """Runs a command to its end: seconds, CPU seconds and the peak memory (MB) of its largest
-    process."""
-    before = resource.getrusage(resource.RUSAGE_CHILDREN)
+def memory_below(top):
+    """MB of memory of their own that a process and all below it have now."""
+    parents, used = {}, {}
+    for status in pathlib.Path("/proc").glob("[0-9]*/status"):
+        with contextlib.suppress(OSError, KeyError):
+            lines = dict(line.split(":", 1) for line in status.read_text(encoding="utf-8").splitlines())
+            pid = int(lines["Pid"])
+            parents[pid] = int(lines["PPid"])
+            used[pid] = int(lines["RssAnon"].split()[0]) + int(lines["RssShmem"].split()[0])
+
+    def is_below(pid):
+        while pid != top and pid in parents:
+            pid = parents[pid]
+        return pid == top
+
+    return sum(size for pid, size in used.items() if is_below(pid)) / 1024
+
+
+def timed(command):
+    """Runs a command to its end: seconds, CPU seconds and the peak memory (MB) of all its processes."""
     start = time.monotonic()
-    report = subprocess.run(["/usr/bin/env", "python3", __file__, *[str(word) for word in command]],
-                            stdin=subprocess.DEVNULL, stdout=subprocess.PIPE,
-                            stderr=subprocess.PIPE, check=False, **options)
-    seconds = time.monotonic() - start
-    after = resource.getrusage(resource.RUSAGE_CHILDREN)
-    if report.returncode != 0:
-        raise RuntimeError(report.stderr.decode(errors="replace")[-500:] or "it failed")
-    cpu = after.ru_utime + after.ru_stime - before.ru_utime - before.ru_stime
-    return {"seconds": seconds, "cpu": cpu, "peak": int(report.stdout.split()[-1]) / 1024}
+    peak = 0.0
+    with tempfile.TemporaryFile() as errors:
+        process = subprocess.Popen([str(word) for word in command], stdin=subprocess.DEVNULL,
+                                   stdout=subprocess.DEVNULL, stderr=errors)
+        with open(os.pidfd_open(process.pid)) as end:
+            while not select.select([end], [], [], 0.1)[0]:
+                peak = max(peak, memory_below(process.pid))
+        seconds = time.monotonic() - start
+        _, status, used = os.wait4(process.pid, 0)
+        process.returncode = os.waitstatus_to_exitcode(status)
+        if process.returncode != 0:
+            errors.seek(0)
+            raise RuntimeError(errors.read()[-500:].decode(errors="replace") or "it failed")
+    return {"seconds": seconds, "cpu": used.ru_utime + used.ru_stime,
+            "peak": peak or used.ru_maxrss / 1024}
 
 
 def size_mb(*folders, size=lambda status: status.st_size):
@@ -75,7 +98,7 @@ def processes():
                 status = (entry / "status").read_text(encoding="utf-8")
                 if program_name == "maruwebd":
                     user = status.split("\nUid:\t")[1].split()[1]
-                    yield int(entry.name), "front" if user == FRONT_USER else "host"
+                    yield int(entry.name), WEB_USERS.get(user, "children")
                 elif program_name in PROGRAMS:
                     yield int(entry.name), PROGRAMS[program_name]
 
@@ -170,10 +193,3 @@ class System:
 
         times = sorted(road.as_user(user, ask))
         return {"p50": times[len(times) // 2], "p95": times[len(times) * 95 // 100]}
-
-
-if __name__ == "__main__":
-    # A process of its own for a command, so that its peak is the command's alone.
-    status = subprocess.run(sys.argv[1:], stdout=subprocess.DEVNULL, check=False).returncode
-    print(resource.getrusage(resource.RUSAGE_CHILDREN).ru_maxrss)
-    sys.exit(status)

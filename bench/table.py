@@ -29,7 +29,7 @@ def crawl_tables(name, figures):
     for who, result in [("MaruSeeker", ours), *crawl["rivals"].items()]:
         rows.append([who, number(crawl["mb"] / result["seconds"]),
                      number(crawl["files"] / result["seconds"]), number(result["cpu"]),
-                     number(result["peak"]) if result["peak"] else "-", number(result["size"]),
+                     number(result["peak"] or None), number(result["size"]),
                      ratio(result["seconds"], ours["seconds"]) if result is not ours else ""])
     again = crawl["again"]
     notes = (f"{crawl['files']:,} files, {number(crawl['mb'])} MB. Index against text, stored text "
@@ -41,16 +41,16 @@ def crawl_tables(name, figures):
 def search_tables(name, figures):
     search = figures["search"]
     ours = search["alone"]
-    rows = [["search of " + name + ", 50 hits", "p50 us", "p95 us", "p99 us", "searches/s",
+    rows = [["search of " + name + ", 50 hits", "p50 us", "p95 us", "p99 us", "searches/s", "hits shown",
              "p50 against MaruSeeker's"]]
     rows.append(["MaruSeeker, HTTP to HTTP", number(ours["p50"]), number(ours["p95"]),
-                 number(ours["p99"]), number(ours["per_second"]), ""])
+                 number(ours["p99"]), number(ours["per_second"]), number(ours["hits"]), ""])
     loaded = search["loaded"]
     rows.append(["the same, 8 at once", number(loaded["p50"]), number(loaded["p95"]),
-                 number(loaded["p99"]), number(loaded["per_second"]), ""])
+                 number(loaded["p99"]), number(loaded["per_second"]), "", ""])
     for who, result in search["rivals"].items():
         rows.append([who, number(result["p50"]), number(result.get("p95")), "-",
-                     number(result.get("per_second")), ratio(result["p50"], ours["p50"])])
+                     number(result.get("per_second")), number(result["hits"]), ratio(result["p50"], ours["p50"])])
     cpu = ", ".join(f"{who} {number(used)}" for who, used in search["cpu"].items() if used)
     return (aligned(rows) + "\n\n" + where_time_goes(search) + f"\n\nCPU per search, us: {cpu}."
             + against_engine(search))
@@ -111,8 +111,10 @@ def other_rows(results):
                     f"{who} {number(part)}" for who, part in used.items() if part)])
         growth = figures.get("growth")
         if growth:
+            first = results.get("copies1", figures)["growth"]["search"]["p50"]
             rows.append([f"{name}: search p50 / p95, us",
-                         f"{number(growth['search']['p50'])} / {number(growth['search']['p95'])}"])
+                         f"{number(growth['search']['p50'])} / {number(growth['search']['p95'])}, p50 "
+                         f"{ratio(growth['search']['p50'], first)} of the smallest"])
             rows.append([f"{name}: prefix of two letters, p50 / p95, ms",
                          f"{number(growth['prefix']['p50'] / 1e3)} / "
                          f"{number(growth['prefix']['p95'] / 1e3)}"])
