@@ -23,8 +23,8 @@ def say(text):
 def unpack(packages, folder):
     """Downloads packages and unpacks them below the folder."""
     folder.mkdir(parents=True)
-    subprocess.run(["apt-get", "download", "-q", *packages], cwd=folder, check=True,
-                   stdout=subprocess.DEVNULL)
+    subprocess.run(["apt-get", "download", "-q", "-o", "APT::Sandbox::User=root", *packages],
+                   cwd=folder, check=True, stdout=subprocess.DEVNULL)
     for archive in sorted(folder.glob("*.deb")):
         subprocess.run(["dpkg-deb", "-x", archive, folder], check=True)
         archive.unlink()
@@ -77,12 +77,12 @@ def make_rights(target, corpora):
 
 
 def make_copies(count):
-    """So many copies, in each of which the long words are other words: what grows is the number of
-    files and the vocabulary."""
+    """So many copies, in each but the first of which the long words are other words: what grows is the
+    number of files and the vocabulary."""
     def build(target, corpora):
         small = make("small", corpora)
         for number in range(count):
-            letter = bytes([ord("a") + number])
+            letter = bytes([ord("a") + number]) if number else b""
             copy_files(small, target / f"copy{number}",
                        lambda name, data, letter=letter: LONG_WORD.sub(rb"\g<0>" + letter, data)
                        if name.endswith((".html", ".txt")) else data)
@@ -91,6 +91,8 @@ def make_copies(count):
 
 MAKERS = {"small": make_small, "large": make_large, "tiny": make_tiny, "rights": make_rights,
           "copies1": make_copies(1), "copies4": make_copies(4), "copies16": make_copies(COPIES)}
+# Corpora that are asked another's queries.
+QUERIES_OF = {"rights": "small", "copies1": "small", "copies4": "small", "copies16": "small"}
 
 
 def make(name, corpora):

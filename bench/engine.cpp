@@ -1,11 +1,9 @@
 // The bare engine: the least that indexes a folder's files and answers queries with it, in process.
 // What MaruSeeker adds is measured against it.
-#include <unistd.h>
 #include <xapian.h>
 
 #include <algorithm>
 #include <chrono>
-#include <cstring>
 #include <filesystem>
 #include <fstream>
 #include <iostream>
