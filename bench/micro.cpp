@@ -94,6 +94,13 @@ void ParseAndWriteJson(benchmark::State& state) {
 }
 BENCHMARK(ParseAndWriteJson);
 
+void JudgeRights(benchmark::State& state) {
+  const Identity who{1000, {100, 1000, 2000}, false};
+  const FileRights rights{0, 2000, 0640, ""};
+  for (auto _ : state) benchmark::DoNotOptimize(maru::RightsOf(who, rights));
+}
+BENCHMARK(JudgeRights);
+
 /// An index of a few thousand documents in a folder of its own.
 class SmallIndex : public benchmark::Fixture {
  public:
@@ -120,12 +127,15 @@ class SmallIndex : public benchmark::Fixture {
   }
 
  protected:
-  void Search(benchmark::State& state, Query::Kind kind, std::vector<std::string> words,
-              const Identity& who) {
+  static Query QueryOf(Query::Kind kind, std::vector<std::string> words) {
     Query query;
     query.kind = kind;
     query.words = std::move(words);
     query.fields = {{std::string(kText), 1}};
+    return query;
+  }
+
+  void Search(benchmark::State& state, const Query& query, const Identity& who) {
     SearchOptions options;
     options.size = 50;
     for (auto _ : state) {
@@ -140,14 +150,26 @@ class SmallIndex : public benchmark::Fixture {
   std::unique_ptr<Library> library_;
 };
 
+const Identity kRoot{0, {}, true};
+const Identity kSomebody{1000, {1000}, false};
+
 BENCHMARK_F(SmallIndex, SearchWord)(benchmark::State& state) {
-  Search(state, Query::Kind::kWord, {"berth"}, {0, {}, true});
+  Search(state, QueryOf(Query::Kind::kWord, {"berth"}), kRoot);
 }
 BENCHMARK_F(SmallIndex, SearchWordAsSomebody)(benchmark::State& state) {
-  Search(state, Query::Kind::kWord, {"berth"}, {1000, {1000}, false});
+  Search(state, QueryOf(Query::Kind::kWord, {"berth"}), kSomebody);
 }
 BENCHMARK_F(SmallIndex, SearchPhrase)(benchmark::State& state) {
-  Search(state, Query::Kind::kPhrase, {"tide", "is"}, {0, {}, true});
+  Search(state, QueryOf(Query::Kind::kPhrase, {"tide", "is"}), kRoot);
+}
+BENCHMARK_F(SmallIndex, StoredFragments)(benchmark::State& state) {
+  const Query query = QueryOf(Query::Kind::kWord, {"berth"});
+  const FragmentOptions options{std::string(kText), 100, 3};
+  auto reader = library_->Open({"fileindex_bench"});
+  reader->SetEyes(kSomebody);
+  for (auto _ : state) {
+    if (reader->Fragments(0, 1000, query, options).empty()) state.SkipWithError("no fragment");
+  }
 }
 
 }  // namespace
