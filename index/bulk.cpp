@@ -9,8 +9,8 @@ namespace {
 /// Size of the documents in a part, as Prepared::Size counts: what a builder holds in memory. Small
 /// parts are built in the processor's caches; what it takes to put more of them together is less.
 constexpr std::size_t kPartBytes = 16u << 20;
-/// Ids set aside for a part.
-constexpr DocumentId kPartIds = 16384;
+/// Ids set aside for a part; what it leaves unused are holes in every set of documents.
+constexpr DocumentId kPartIds = 2048;
 /// What may wait for one builder.
 constexpr std::size_t kWaitingBytes = 4u << 20;
 constexpr unsigned kMaxLanes = 8;

@@ -167,7 +167,8 @@ void DirectoryTable::Save(const MetadataWriter& write) {
   freed_.clear();
 }
 
-Eyes::Eyes(const DirectoryTable& table, const Identity& who) {
+Eyes::Eyes(const DirectoryTable& table, const Identity& who, DocumentId last)
+    : documents_(last / 4 + 1) {
   readable_.resize(table.Conditions() + 1);
   std::vector<bool> traversable(readable_.size());
   for (ConditionId id = 1; id < readable_.size(); ++id) {

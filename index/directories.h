@@ -1,6 +1,7 @@
 #pragma once
 
 #include <array>
+#include <atomic>
 #include <functional>
 #include <map>
 #include <memory>
@@ -92,13 +93,28 @@ class DirectoryTable {
   std::map<FileRights, ConditionId> known_;
 };
 
-/// What one identity can reach and read of one index at one commit.
+/// What one identity can reach and read of one index at one commit. Thread-safe.
 class Eyes {
  public:
-  Eyes(const DirectoryTable& table, const Identity& who);
+  /// `last` is the last document id of that commit.
+  Eyes(const DirectoryTable& table, const Identity& who, DocumentId last);
 
   bool Sees(DirectoryId parent, ConditionId condition) const {
     return Bit(reachable_, parent) && Bit(readable_, condition);
+  }
+  /// A document at the place that `place()` tells; asked once for each.
+  template <class PlaceOf>
+  bool SeesDocument(DocumentId id, PlaceOf&& place) const {
+    if (id / 4 >= documents_.size()) return false;
+    const unsigned shift = id % 4 * 2;
+    const unsigned bits = documents_[id / 4].load(std::memory_order_relaxed) >> shift;
+    if (bits & kAsked) return bits & kSeen;
+    const Place here = place();
+    const bool sees = Sees(here.parent, here.condition);
+    documents_[id / 4].fetch_or(
+        static_cast<std::uint8_t>((sees ? kAsked | kSeen : kAsked) << shift),
+        std::memory_order_relaxed);
+    return sees;
   }
   bool Reaches(DirectoryId directory) const { return Bit(reachable_, directory); }
 
@@ -106,7 +122,12 @@ class Eyes {
   static bool Bit(const std::vector<bool>& bits, std::uint32_t id) {
     return id < bits.size() && bits[id];
   }
+  static constexpr unsigned kAsked = 1;
+  static constexpr unsigned kSeen = 2;
+
   std::vector<bool> reachable_, readable_;
+  /// Two bits a document: what was found out.
+  mutable std::vector<std::atomic<std::uint8_t>> documents_;
 };
 
 /// The folders that lie under `top` (and `top`), as a bit an id.

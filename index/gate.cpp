@@ -62,7 +62,9 @@ PlaceSource::PlaceSource(std::shared_ptr<const PlaceRule> rule,
                          std::shared_ptr<const ShareNumbers> shares,
                          std::function<bool()> cancelled)
     : ChoiceSource(std::move(shares), std::move(cancelled), kPlacesBetweenLooks),
-      rule_(std::move(rule)) {}
+      rule_(std::move(rule)) {
+  place_ = [this] { return Place::Decode(ValueOf(document_, kPlaceSlot)); };
+}
 
 void PlaceSource::init(const Xapian::Database& database) {
   const Xapian::doccount documents = database.get_doccount();
@@ -73,8 +75,8 @@ void PlaceSource::init(const Xapian::Database& database) {
 
 bool PlaceSource::Accepts(Xapian::docid document) {
   if (!judges_) return true;
-  const std::string place = ValueOf(document, kPlaceSlot);
-  return !place.empty() && rule_->Accepts(share_, document, Place::Decode(place));
+  document_ = document;
+  return rule_->Accepts(share_, document, place_);
 }
 
 PhraseSource::PhraseSource(std::vector<std::string> words, Texts texts,

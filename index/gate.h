@@ -23,7 +23,9 @@ class PlaceRule {
   virtual ~PlaceRule() = default;
   /// False: Accepts is the same for every document and need not be asked.
   virtual bool Judges(std::size_t share) const = 0;
-  virtual bool Accepts(std::size_t share, DocumentId document, const Place& place) const = 0;
+  /// `place` tells where the document lies: asked for when it must be.
+  using PlaceOf = std::function<Place()>;
+  virtual bool Accepts(std::size_t share, DocumentId document, const PlaceOf& place) const = 0;
 };
 
 /// Share numbers by the engine's name of each database.
@@ -89,6 +91,9 @@ class PlaceSource : public ChoiceSource {
 
   std::shared_ptr<const PlaceRule> rule_;
   bool judges_ = true;
+  Xapian::docid document_ = 0;
+  /// Of `document_`.
+  PlaceRule::PlaceOf place_;
 };
 
 /// Documents with a phrase in their stored text; to be asked about those that have its words.

@@ -39,14 +39,14 @@ std::shared_ptr<const DirectoryTable> SharedIndex::Table(const Xapian::Database&
 }
 
 std::shared_ptr<const Eyes> SharedIndex::EyesOf(const std::shared_ptr<const DirectoryTable>& table,
-                                                const Identity& who) {
+                                                const Identity& who, DocumentId last) {
   {
     const std::lock_guard lock(mutex_);
     for (const Known& known : known_) {
       if (known.table == table && known.who == who) return known.eyes;
     }
   }
-  auto eyes = std::make_shared<const Eyes>(*table, who);
+  auto eyes = std::make_shared<const Eyes>(*table, who, last);
   const std::lock_guard lock(mutex_);
   if (known_.size() >= kKnownEyes) known_.erase(known_.begin());
   known_.push_back({table, who, eyes});

@@ -28,7 +28,7 @@ class SharedIndex {
   std::shared_ptr<const DirectoryTable> Table(const Xapian::Database& database);
   /// What `who` sees by that table; the last few are kept.
   std::shared_ptr<const Eyes> EyesOf(const std::shared_ptr<const DirectoryTable>& table,
-                                     const Identity& who);
+                                     const Identity& who, DocumentId last);
 
   TextReader texts;
 
@@ -69,7 +69,8 @@ class OpenIndices {
   SharedIndex& Index(std::size_t share) const { return *shares_[share].index; }
   const Xapian::Database& Database(std::size_t share) const { return shares_[share].database; }
   std::shared_ptr<const Eyes> EyesOf(std::size_t share, const Identity& who) const {
-    return shares_[share].index->EyesOf(shares_[share].table, who);
+    return shares_[share].index->EyesOf(shares_[share].table, who,
+                                        shares_[share].database.get_lastdocid());
   }
   const std::shared_ptr<const ShareNumbers>& Numbers() const { return numbers_; }
 

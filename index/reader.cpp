@@ -2,6 +2,7 @@
 #include <array>
 #include <cmath>
 
+#include "index/count.h"
 #include "index/engine.h"
 #include "index/fields.h"
 #include "index/fragments.h"
@@ -21,8 +22,8 @@ class EyesRule : public PlaceRule {
  public:
   explicit EyesRule(std::vector<std::shared_ptr<const Eyes>> eyes) : eyes_(std::move(eyes)) {}
   bool Judges(std::size_t share) const override { return share >= eyes_.size() || eyes_[share]; }
-  bool Accepts(std::size_t share, DocumentId, const Place& place) const override {
-    return share < eyes_.size() && eyes_[share]->Sees(place.parent, place.condition);
+  bool Accepts(std::size_t share, DocumentId document, const PlaceOf& place) const override {
+    return share < eyes_.size() && eyes_[share]->SeesDocument(document, place);
   }
 
  private:
@@ -41,11 +42,12 @@ class FolderRule : public PlaceRule {
   bool Judges(std::size_t share) const override {
     return share >= shares_.size() || !shares_[share].whole;
   }
-  bool Accepts(std::size_t share, DocumentId document, const Place& place) const override {
+  bool Accepts(std::size_t share, DocumentId document, const PlaceOf& place) const override {
     if (share >= shares_.size()) return false;
     const Share& here = shares_[share];
-    return document == here.self ||
-           (place.parent < here.folders.size() && here.folders[place.parent]);
+    if (document == here.self) return true;
+    const DirectoryId parent = place().parent;
+    return parent < here.folders.size() && here.folders[parent];
   }
 
  private:
@@ -166,9 +168,38 @@ Xapian::Query EngineReader::Phrase(const std::vector<std::string>& words) {
   return Xapian::Query(source->release());
 }
 
-Xapian::Enquire EngineReader::Enquire(const Query& query, const SearchOptions& options) {
+Xapian::Query EngineReader::Compile(const Query& query, const SearchOptions& options) {
   cancelled_ = options.cancelled;
-  Xapian::Query compiled = Compiler(indices_->All(), *this).Compile(query);
+  return Compiler(indices_->All(), *this).Compile(query);
+}
+
+std::optional<std::uint64_t> EngineReader::CountOf(const Xapian::Query& compiled) const {
+  if (blind_) return 0;
+  const auto look = [this] {
+    if (cancelled_ && cancelled_()) throw Cancelled{};
+  };
+  std::uint64_t total = 0;
+  for (std::size_t share = 0; share < indices_->Count(); ++share) {
+    const Xapian::Database& database = indices_->Database(share);
+    const auto matching = Matching(database, compiled, look);
+    if (!matching) return std::nullopt;
+    if (!eyes_[share]) {
+      total += matching->Count();
+      continue;
+    }
+    auto value = database.valuestream_begin(kPlaceSlot);
+    matching->ForEach([&](Xapian::docid id) {
+      total += eyes_[share]->SeesDocument(id, [&] {
+        if (value != database.valuestream_end(kPlaceSlot)) value.skip_to(id);
+        const bool here = value != database.valuestream_end(kPlaceSlot) && value.get_docid() == id;
+        return here ? Place::Decode(*value) : Place();
+      });
+    });
+  }
+  return total;
+}
+
+Xapian::Enquire EngineReader::Enquire(Xapian::Query compiled, const SearchOptions& options) {
   if (!options.boosts.empty()) {
     auto boosts = std::make_shared<BoostSource::Boosts>(options.boosts);
     for (auto& [place, boost] : *boosts) boost *= kBoostWeight;
@@ -194,7 +225,7 @@ Hit EngineReader::HitOf(std::size_t share, DocumentId id, const Xapian::Document
   Hit hit;
   hit.share = share;
   hit.document = id;
-  hit.record = DecodeRecord(document.get_value(kRecordSlot));
+  hit.record = DecodeRecord(document.get_data());
   hit.owner = table.Condition(place.condition).uid;
   if (place.parent != 0) hit.path = table.PathOf(place.parent) + "/" + hit.record.name;
   return hit;
@@ -204,10 +235,12 @@ SearchResult EngineReader::Search(const Query& query, const SearchOptions& optio
   return OnOneState("Cannot search", [&] {
     SearchResult result;
     if (indices_->Count() == 0) return result;
-    const Xapian::doccount everything = indices_->All().get_doccount();
+    const Xapian::Query compiled = Compile(query, options);
+    const auto total = CountOf(compiled);
     const Xapian::MSet matches =
-        Enquire(query, options).get_mset(options.from, options.size, everything);
-    result.total = matches.get_matches_estimated();
+        Enquire(compiled, options)
+            .get_mset(options.from, options.size, total ? 0 : indices_->All().get_doccount());
+    result.total = total ? *total : matches.get_matches_estimated();
     result.hits.reserve(matches.size());
     for (auto match = matches.begin(); match != matches.end(); ++match) {
       Hit hit =
@@ -229,7 +262,7 @@ std::vector<std::uint64_t> EngineReader::Count(const Query& query,
   const auto counts = OnOneState("Cannot count", [&] {
     KindSpy spy;
     if (indices_->Count() == 0) return spy.counts;
-    Xapian::Enquire enquire = Enquire(query, options);
+    Xapian::Enquire enquire = Enquire(Compile(query, options), options);
     enquire.set_weighting_scheme(Xapian::BoolWeight());
     enquire.add_matchspy(&spy);
     enquire.get_mset(0, 0, indices_->All().get_doccount());

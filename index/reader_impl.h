@@ -50,7 +50,10 @@ class EngineReader : public Reader, private Sources {
 
   /// The query as these eyes may ask it.
   Xapian::Query Gated(const Xapian::Query& query);
-  Xapian::Enquire Enquire(const Query& query, const SearchOptions& options);
+  Xapian::Query Compile(const Query& query, const SearchOptions& options);
+  Xapian::Enquire Enquire(Xapian::Query compiled, const SearchOptions& options);
+  /// How many matches these eyes see; nothing for a query that only a search can count.
+  std::optional<std::uint64_t> CountOf(const Xapian::Query& compiled) const;
   bool Sees(std::size_t share, const Xapian::Document& document) const;
   bool SomeDocumentSeen(const std::string& term) const;
   Hit HitOf(std::size_t share, DocumentId id, const Xapian::Document& document) const;

@@ -23,11 +23,11 @@ struct Place {
   static Place Decode(std::string_view bytes);
 };
 
-/// What a line of a result needs: value slot 1.
+/// What a line of a result needs: the engine's data of a document.
 std::string EncodeRecord(const Record& record);
 Record DecodeRecord(std::string_view bytes);
 
-/// Where a document's text lies among the stored texts: value slot 4 of those that have one.
+/// Where a document's text lies among the stored texts: value slot 1 of those that have one.
 struct TextPlace {
   std::uint32_t segment = 0;
   std::uint64_t offset = 0;
@@ -44,7 +44,6 @@ void EncodeEntry(Encoder& out, const Entry& entry);
 Entry DecodeEntry(Decoder& in);
 
 inline constexpr unsigned kPlaceSlot = 0;
-inline constexpr unsigned kRecordSlot = 1;
-inline constexpr unsigned kTextSlot = 4;
+inline constexpr unsigned kTextSlot = 1;
 
 }  // namespace maru::index

@@ -90,8 +90,8 @@ struct Writer::State {
     index::Place place{document.parent, table.ConditionOf(document.rights),
                        KindNumber(KindOf(document))};
     engine.add_value(kPlaceSlot, place.Encode());
-    engine.add_value(kRecordSlot, EncodeRecord({document.name, document.is_dir, document.size,
-                                                document.mtime, document.title, document.authors}));
+    engine.set_data(EncodeRecord({document.name, document.is_dir, document.size, document.mtime,
+                                  document.title, document.authors}));
     engine.add_value(kTextSlot, text.Encode());
     engine.add_value(static_cast<Xapian::valueno>(FindField(kSize)->slot),
                      Xapian::sortable_serialise(static_cast<double>(document.size)));
@@ -302,7 +302,7 @@ void Writer::Update(DocumentId id, const Document& document) {
   WithEngine("Cannot write the index", [&] {
     if (state_->bulk) state_->EndBulk();
     Xapian::Document engine = state_->database.get_document(id);
-    const Record stored = DecodeRecord(engine.get_value(kRecordSlot));
+    const Record stored = DecodeRecord(engine.get_data());
     const Place place = Place::Decode(engine.get_value(kPlaceSlot));
     Document complete = document;
     complete.title = stored.title;
