@@ -1,6 +1,7 @@
 """The files that are indexed: taken from Debian packages, unpacked into the build folder and never
 installed, so that they are the same on every machine with the same packages."""
 
+import os
 import pathlib
 import re
 import shutil
@@ -10,8 +11,6 @@ import sys
 SMALL = ("linux-doc-6.1", "postgresql-doc-15", "python3.11-doc", "git-doc")
 LARGE = "linux-source-6.1"
 COPIES = 16
-# Who may read which part of the corpus for rights: files of carol, a half with bob's group, and one
-# in a hundred for everybody.
 CAROL, WORK, ROOT = 60003, 60102, 0
 LONG_WORD = re.compile(rb"[A-Za-z]{9,}")
 
@@ -69,11 +68,20 @@ def make_tiny(target, _corpora):
 
 
 def make_rights(target, corpora):
+    """carol may read all, bob half, alice one in a hundred. In every other folder that has no folders
+    the folder's mode says so, elsewhere each file's."""
     copy_files(make("small", corpora), target)
-    for number, path in enumerate(sorted(path for path in target.rglob("*") if path.is_file())):
-        for_all, for_work = number % 100 == 0, number % 2 == 0
-        shutil.chown(path, CAROL, WORK if for_work else ROOT)
-        path.chmod(0o644 if for_all else 0o640)
+    number = 0
+    for place, (folder, folders, names) in enumerate(sorted(os.walk(target))):
+        by_folder = place % 2 == 1 and not folders
+        if by_folder:
+            shutil.chown(folder, CAROL, WORK)
+            os.chmod(folder, 0o750 if place % 4 == 1 else 0o700)
+        for name in sorted(names):
+            path = pathlib.Path(folder, name)
+            number += not by_folder
+            shutil.chown(path, CAROL, WORK if by_folder or number % 2 == 0 else ROOT)
+            path.chmod(0o644 if by_folder or number % 60 == 0 else 0o640)
 
 
 def make_copies(count):

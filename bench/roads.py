@@ -134,12 +134,15 @@ class Roads:
         return median_of(results) | {"daemon": median_of(daemon)["p50"]}
 
     def rights(self):
-        """alice reads one file in a hundred, bob every other, carol all."""
+        """The same searches by users who may read different parts of the files."""
         results = {user: [] for user in ("alice", "bob", "carol")}
+        files = [path for path in road.everything_under(self.system.folder) if os.path.isfile(path)]
+        parts = {user: len(road.as_user(user, road.readable, files)) * 100 / len(files)
+                 for user in results}
         for _ in range(self.options["runs"]):
             for user, some in results.items():
                 some.append(self.system.load(self.bodies(), user=user, rounds=self.options["rounds"]))
-        return {user: median_of(some) for user, some in results.items()}
+        return {user: median_of(some) | {"percent": parts[user]} for user, some in results.items()}
 
     def burst(self):
         """Twenty searches of one id, as somebody types, against the last of them alone."""

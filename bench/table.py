@@ -90,10 +90,10 @@ def other_rows(results):
                          f"daemon's p50 {number(fragments['daemon'] / 1e3)}"])
         rights = figures.get("rights")
         if rights:
-            for user, part in (("alice", "1 %"), ("bob", "50 %"), ("carol", "all")):
-                rows.append([f"{name}: {user}, who reads {part}, p50 / p95, us",
-                             f"{number(rights[user]['p50'])} / {number(rights[user]['p95'])}, p95 "
-                             f"{ratio(rights[user]['p95'], rights['carol']['p95'])} of all"])
+            for user, result in rights.items():
+                rows.append([f"{name}: {user}, who may read {number(result['percent'])} % of the files, "
+                             "p50 / p95, us", f"{number(result['p50'])} / {number(result['p95'])}, p95 "
+                             f"{ratio(result['p95'], rights['carol']['p95'])} of carol's"])
         burst = figures.get("burst")
         if burst:
             rows.append([f"{name}: burst of 20, CPU against the last alone", number(burst["cpu"])])

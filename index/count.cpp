@@ -15,84 +15,91 @@ constexpr unsigned kPostingsBetweenLooks = 4096;
 /// Thrown by a query that terms do not answer.
 struct NotByTerms {};
 
+/// A set that the answer lies in.
+struct Within {
+  explicit Within(DocumentSet documents) : set(std::move(documents)), count(set.Count()) {}
+  DocumentSet set;
+  std::uint64_t count;
+};
+
 class Evaluator {
  public:
   Evaluator(const Xapian::Database& database, const std::function<void()>& look)
       : database_(database), look_(look), last_(database.get_lastdocid()) {}
 
-  /// What matches, of `within` when that is given.
-  DocumentSet Evaluate(const Xapian::Query& query, const DocumentSet* within) {
+  /// Adds what matches, of `within` when that is given, to `set`.
+  void Add(const Xapian::Query& query, const Within* within, DocumentSet& set) {
     switch (query.get_type()) {
       case Op::LEAF_TERM:
-        return Term(*query.get_terms_begin(), within);
+        return AddTerm(*query.get_terms_begin(), within, set);
       case Op::LEAF_MATCH_ALL:
-        return Term({}, within);
+        return AddTerm({}, within, set);
       case Op::LEAF_MATCH_NOTHING:
-        return DocumentSet(last_);
+        return;
       case Op::OP_SCALE_WEIGHT:
       case Op::OP_AND_MAYBE:
-        return Evaluate(query.get_subquery(0), within);
+        return Add(query.get_subquery(0), within, set);
       case Op::OP_OR:
-        return Any(query, within);
+        for (std::size_t i = 0; i < query.get_num_subqueries(); ++i) {
+          Add(query.get_subquery(i), within, set);
+        }
+        return;
       case Op::OP_AND:
       case Op::OP_FILTER:
-        return All(query, within);
+        return AddAll(query, within, set);
       case Op::OP_AND_NOT:
-        return Without(query, within);
+        return AddWithout(query, within, set);
       default:
         throw NotByTerms{};
     }
   }
 
  private:
-  DocumentSet Term(const std::string& term, const DocumentSet* within) {
-    DocumentSet set(last_);
+  void AddTerm(const std::string& term, const Within* within, DocumentSet& set) {
     auto posting = database_.postlist_begin(term);
     const auto end = database_.postlist_end(term);
-    if (within && within->Count() * kMuchMore < Frequency(term)) {
-      within->ForEach([&](Xapian::docid id) {
+    if (posting == end) return;
+    if (within && within->count * kMuchMore < Frequency(term)) {
+      within->set.ForEach([&](Xapian::docid id) {
         if (posting == end) return;
         posting.skip_to(id);
         if (posting != end && *posting == id) set.Add(id);
       });
-      return set;
+      return;
     }
     for (; posting != end; ++posting) {
       if (++postings_ % kPostingsBetweenLooks == 0) look_();
-      set.Add(*posting);
+      if (!within || within->set.Has(*posting)) set.Add(*posting);
     }
-    if (within) set.Intersect(*within);
-    return set;
-  }
-
-  DocumentSet Any(const Xapian::Query& query, const DocumentSet* within) {
-    DocumentSet set(last_);
-    for (std::size_t i = 0; i < query.get_num_subqueries(); ++i) {
-      set.Unite(Evaluate(query.get_subquery(i), within));
-    }
-    return set;
   }
 
   /// The rarest first, so that the others are asked about little.
-  DocumentSet All(const Xapian::Query& query, const DocumentSet* within) {
+  void AddAll(const Xapian::Query& query, const Within* within, DocumentSet& set) {
     std::vector<std::pair<std::uint64_t, std::size_t>> order;
     for (std::size_t i = 0; i < query.get_num_subqueries(); ++i) {
       order.emplace_back(Bound(query.get_subquery(i)), i);
     }
     std::sort(order.begin(), order.end());
-    std::optional<DocumentSet> set;
+    std::optional<Within> so_far;
     for (const auto& [bound, i] : order) {
-      set = Evaluate(query.get_subquery(i), set ? &*set : within);
+      DocumentSet next(last_);
+      Add(query.get_subquery(i), so_far ? &*so_far : within, next);
+      so_far.emplace(std::move(next));
     }
-    return set ? std::move(*set) : DocumentSet(last_);
+    if (so_far) set.Unite(so_far->set);
   }
 
-  DocumentSet Without(const Xapian::Query& query, const DocumentSet* within) {
-    DocumentSet set = Evaluate(query.get_subquery(0), within);
+  void AddWithout(const Xapian::Query& query, const Within* within, DocumentSet& set) {
+    DocumentSet left(last_);
+    Add(query.get_subquery(0), within, left);
+    const Within wanted(std::move(left));
+    DocumentSet unwanted(last_);
     for (std::size_t i = 1; i < query.get_num_subqueries(); ++i) {
-      set.Subtract(Evaluate(query.get_subquery(i), &set));
+      Add(query.get_subquery(i), &wanted, unwanted);
     }
-    return set;
+    wanted.set.ForEach([&](Xapian::docid id) {
+      if (!unwanted.Has(id)) set.Add(id);
+    });
   }
 
   std::uint64_t Frequency(const std::string& term) const {
@@ -128,18 +135,12 @@ void DocumentSet::Unite(const DocumentSet& other) {
   for (std::size_t i = 0; i < words_.size(); ++i) words_[i] |= other.words_[i];
 }
 
-void DocumentSet::Intersect(const DocumentSet& other) {
-  for (std::size_t i = 0; i < words_.size(); ++i) words_[i] &= other.words_[i];
-}
-
-void DocumentSet::Subtract(const DocumentSet& other) {
-  for (std::size_t i = 0; i < words_.size(); ++i) words_[i] &= ~other.words_[i];
-}
-
 std::optional<DocumentSet> Matching(const Xapian::Database& database, const Xapian::Query& query,
                                     const std::function<void()>& look) {
   try {
-    return Evaluator(database, look).Evaluate(query, nullptr);
+    DocumentSet set(database.get_lastdocid());
+    Evaluator(database, look).Add(query, nullptr, set);
+    return set;
   } catch (const NotByTerms&) {
     return std::nullopt;
   }

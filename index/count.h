@@ -18,11 +18,11 @@ class DocumentSet {
   void Add(Xapian::docid id) {
     if (id / 64 < words_.size()) words_[id / 64] |= std::uint64_t{1} << (id % 64);
   }
-  bool Has(Xapian::docid id) const { return words_[id / 64] >> (id % 64) & 1; }
+  bool Has(Xapian::docid id) const {
+    return id / 64 < words_.size() && words_[id / 64] >> (id % 64) & 1;
+  }
   std::uint64_t Count() const;
   void Unite(const DocumentSet& other);
-  void Intersect(const DocumentSet& other);
-  void Subtract(const DocumentSet& other);
   /// Calls `use(id)` for each, ascending.
   template <class Use>
   void ForEach(Use&& use) const {

@@ -16,6 +16,10 @@ constexpr std::string_view kPostgreSQL = "postgresql";
 // The longest queue of writers is far shorter; a lock held longer is a fault to report.
 constexpr const char* kBusyTimeout = "PRAGMA busy_timeout = 20000";
 
+// In pages. The first to open the database reads the whole log, and here nearly everybody is that:
+// short-lived processes, one a request.
+constexpr const char* kCheckpoint = "PRAGMA wal_autocheckpoint = 50";
+
 std::unique_ptr<soci::session> Connect(std::string_view backend, const std::string& connection) {
   if (backend == kSQLite) return std::make_unique<soci::session>(soci::sqlite3, connection);
   // Loaded only where it is asked for, and by name, never from the current folder.
@@ -29,6 +33,7 @@ std::unique_ptr<soci::session> Connect(std::string_view backend, const std::stri
 
 void PrepareSQLite(soci::session& database) {
   database << kBusyTimeout;
+  database << kCheckpoint;
   std::string mode;
   database << "PRAGMA journal_mode", soci::into(mode);
   if (mode == "wal") return;

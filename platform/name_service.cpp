@@ -5,6 +5,9 @@
 #include <pwd.h>
 
 #include <algorithm>
+#include <chrono>
+#include <map>
+#include <utility>
 
 namespace maru {
 namespace {
@@ -29,14 +32,36 @@ bool WithBuffer(std::vector<char>& buffer, Look look) {
   return error == 0;
 }
 
+/// Answers of the last moment, for each thread its own. A request asks for the same account a dozen
+/// times, and some sources of the name service are on other machines.
+template <class Key, class Value>
+class Recent {
+ public:
+  template <class Look>
+  std::optional<Value> Get(const Key& key, Look look) {
+    const auto now = std::chrono::steady_clock::now();
+    const auto known = answers_.find(key);
+    if (known != answers_.end() && now - known->second.first < kNameServiceAge) {
+      errno = 0;
+      return known->second.second;
+    }
+    std::optional<Value> answer = look();
+    if (answers_.size() >= kMostRecent) answers_.clear();
+    if (answer) answers_.insert_or_assign(key, std::pair(now, *answer));
+    return answer;
+  }
+
+ private:
+  static constexpr std::size_t kMostRecent = 1024;
+  std::map<Key, std::pair<std::chrono::steady_clock::time_point, Value>> answers_;
+};
+
 std::optional<Account> ToAccount(const passwd* entry) {
   if (!entry) return std::nullopt;
   return Account{entry->pw_name, entry->pw_uid, entry->pw_gid, entry->pw_dir ? entry->pw_dir : ""};
 }
 
-}  // namespace
-
-std::optional<Account> AccountByName(const std::string& name) {
+std::optional<Account> LookUpName(const std::string& name) {
   std::vector<char> buffer;
   passwd entry;
   passwd* found = nullptr;
@@ -46,7 +71,7 @@ std::optional<Account> AccountByName(const std::string& name) {
   return answered ? ToAccount(found) : std::nullopt;
 }
 
-std::optional<Account> AccountByUID(uid_t uid) {
+std::optional<Account> LookUpUID(uid_t uid) {
   std::vector<char> buffer;
   passwd entry;
   passwd* found = nullptr;
@@ -55,7 +80,7 @@ std::optional<Account> AccountByUID(uid_t uid) {
   return answered ? ToAccount(found) : std::nullopt;
 }
 
-std::optional<gid_t> GroupByName(const std::string& name) {
+std::optional<gid_t> LookUpGroup(const std::string& name) {
   std::vector<char> buffer;
   group entry;
   group* found = nullptr;
@@ -66,7 +91,7 @@ std::optional<gid_t> GroupByName(const std::string& name) {
   return found->gr_gid;
 }
 
-std::optional<std::vector<gid_t>> GroupsOf(const Account& account) {
+std::optional<std::vector<gid_t>> LookUpGroupsOf(const Account& account) {
   const int before = errno;
   std::vector<gid_t> groups(64);
   int count = static_cast<int>(groups.size());
@@ -84,6 +109,31 @@ std::optional<std::vector<gid_t>> GroupsOf(const Account& account) {
   groups.erase(std::unique(groups.begin(), groups.end()), groups.end());
   groups.insert(groups.begin(), account.gid);
   errno = before;
+  return groups;
+}
+
+}  // namespace
+
+std::optional<Account> AccountByName(const std::string& name) {
+  thread_local Recent<std::string, Account> recent;
+  return recent.Get(name, [&] { return LookUpName(name); });
+}
+
+std::optional<Account> AccountByUID(uid_t uid) {
+  thread_local Recent<uid_t, Account> recent;
+  return recent.Get(uid, [&] { return LookUpUID(uid); });
+}
+
+std::optional<gid_t> GroupByName(const std::string& name) {
+  thread_local Recent<std::string, gid_t> recent;
+  return recent.Get(name, [&] { return LookUpGroup(name); });
+}
+
+std::optional<std::vector<gid_t>> GroupsOf(const Account& account) {
+  thread_local Recent<std::pair<std::string, gid_t>, std::vector<gid_t>> recent;
+  const int before = errno;
+  auto groups = recent.Get({account.name, account.gid}, [&] { return LookUpGroupsOf(account); });
+  if (groups) errno = before;
   return groups;
 }
 

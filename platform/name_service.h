@@ -2,13 +2,17 @@
 
 #include <sys/types.h>
 
+#include <chrono>
 #include <optional>
 #include <string>
 #include <vector>
 
 /// Accounts and groups of the name service (NSS), without its buffers. For this room. An empty
-/// answer leaves errno 0 when there is no such account, else what went wrong.
+/// answer leaves errno 0 when there is no such account, else what went wrong. What was found stands
+/// for kNameServiceAge.
 namespace maru {
+
+inline constexpr std::chrono::seconds kNameServiceAge{1};
 
 struct Account {
   std::string name;

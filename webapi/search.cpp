@@ -205,7 +205,7 @@ void SearchAPI::Search() {
       break;
     } else {
       MARU_FAIL_IF(received > kMaxAnswer, kErrorDaemonExchange);
-      result["hits"].append(js_resp);
+      result["hits"].append(std::move(js_resp));
     }
   }
   if (!AsBool(js_resp["success"])) {
