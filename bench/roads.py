@@ -59,6 +59,7 @@ class Roads:
     def crawl(self):
         """From nothing to the finished index, by turns; then, unchanged, once more."""
         folder = self.system.folder
+        system.read_all(folder)
         ours, theirs = [], {name: [] for name in self.rivals}
         for run in range(self.options["runs"]):
             self.system.wipe()

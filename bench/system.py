@@ -85,6 +85,14 @@ def disk_mb(folder):
     return size_mb(folder, size=lambda status: status.st_blocks * 512)
 
 
+def read_all(folder):
+    """Brings all files into the page cache."""
+    for parent, _, names in os.walk(folder):
+        for name in names:
+            with contextlib.suppress(OSError):
+                pathlib.Path(parent, name).read_bytes()
+
+
 def count_files(folder):
     return sum(len(names) for _, _, names in os.walk(folder))
 
