@@ -96,7 +96,14 @@ std::vector<std::string> Compiler::Forms(const std::string& word, std::string_vi
   return forms;
 }
 
-std::vector<std::string> Compiler::Expand(const Query& query, std::string_view field_prefix) {
+const std::vector<std::string>& Compiler::Expand(const Query& query,
+                                                 std::string_view field_prefix) {
+  return expansions_.Get({std::string(field_prefix), query.words.at(0), query.kind, query.exact},
+                         [&] { return FindExpansion(query, field_prefix); });
+}
+
+std::vector<std::string> Compiler::FindExpansion(const Query& query,
+                                                 std::string_view field_prefix) {
   const std::string& word = query.words.at(0);
   if (query.kind == Query::Kind::kPrefix) {
     return WordsWithPrefix(database_, field_prefix, word, Query::kMaxExpansion);

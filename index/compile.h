@@ -2,7 +2,9 @@
 
 #include <xapian.h>
 
+#include <map>
 #include <string>
+#include <tuple>
 #include <vector>
 
 #include "index/matcher.h"
@@ -21,11 +23,30 @@ class Sources {
   virtual Xapian::Query Phrase(const std::vector<std::string>& words) = 0;
 };
 
+/// What words and prefixes were widened to at one state of the indices: (prefix of the field, word,
+/// kind of query, exact) -> words. Emptied with a newer state.
+class Expansions {
+ public:
+  using Key = std::tuple<std::string, std::string, Query::Kind, bool>;
+  template <class Find>
+  const std::vector<std::string>& Get(Key key, Find&& find) {
+    if (known_.size() >= kMost) known_.clear();
+    const auto found = known_.find(key);
+    return found != known_.end() ? found->second
+                                 : known_.emplace(std::move(key), find()).first->second;
+  }
+  void Clear() { known_.clear(); }
+
+ private:
+  static constexpr std::size_t kMost = 1000;
+  std::map<Key, std::vector<std::string>> known_;
+};
+
 /// Throws Error (120) for a tree that is too deep or too large or names a field of another type.
 class Compiler {
  public:
-  Compiler(const Xapian::Database& database, Sources& sources)
-      : database_(database), sources_(sources) {}
+  Compiler(const Xapian::Database& database, Sources& sources, Expansions& expansions)
+      : database_(database), sources_(sources), expansions_(expansions) {}
 
   Xapian::Query Compile(const Query& query);
 
@@ -48,11 +69,13 @@ class Compiler {
   Xapian::Query CompileParts(const Query& query, unsigned depth);
   void Mark(const Query& query, unsigned depth, std::vector<MarkGroup>& groups);
   void CountNode(unsigned depth);
-  std::vector<std::string> Expand(const Query& query, std::string_view field_prefix);
+  const std::vector<std::string>& Expand(const Query& query, std::string_view field_prefix);
+  std::vector<std::string> FindExpansion(const Query& query, std::string_view field_prefix);
   std::vector<std::string> Forms(const std::string& word, std::string_view field_prefix);
 
   Xapian::Database database_;
   Sources& sources_;
+  Expansions& expansions_;
   unsigned nodes_ = 0;
 };
 

@@ -86,6 +86,7 @@ void OpenIndices::Refresh() {
     const FileIdentity version = FileIdentity::Of(path + kVersionFile);
     if (share.table && version == share.version) continue;
     share.database.reopen();
+    widened_.Clear();
     share.table = share.index->Table(share.database);
     share.version = version;
   }

@@ -8,6 +8,7 @@
 #include <string>
 #include <vector>
 
+#include "index/compile.h"
 #include "index/directories.h"
 #include "index/gate.h"
 #include "index/reader.h"
@@ -73,6 +74,8 @@ class OpenIndices {
                                         shares_[share].database.get_lastdocid());
   }
   const std::shared_ptr<const ShareNumbers>& Numbers() const { return numbers_; }
+  /// Of the state the handles are at.
+  Expansions& Widened() { return widened_; }
 
   /// Ids in `All` and ids within a share.
   std::size_t ShareOf(Xapian::docid id) const { return (id - 1) % Count(); }
@@ -94,6 +97,7 @@ class OpenIndices {
   std::vector<Share> shares_;
   Xapian::Database all_;
   std::shared_ptr<const ShareNumbers> numbers_;
+  Expansions widened_;
 };
 
 }  // namespace maru::index

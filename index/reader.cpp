@@ -170,7 +170,7 @@ Xapian::Query EngineReader::Phrase(const std::vector<std::string>& words) {
 
 Xapian::Query EngineReader::Compile(const Query& query, const SearchOptions& options) {
   cancelled_ = options.cancelled;
-  return Compiler(indices_->All(), *this).Compile(query);
+  return Compiler(indices_->All(), *this, indices_->Widened()).Compile(query);
 }
 
 std::optional<std::uint64_t> EngineReader::CountOf(const Xapian::Query& compiled) const {
@@ -287,7 +287,7 @@ std::vector<std::uint64_t> EngineReader::Count(const Query& query,
 
 const std::vector<MarkGroup>& EngineReader::MarksOf(const Query& query) {
   if (!marked_ || !(marked_query_ == query)) {
-    marks_ = Compiler(indices_->All(), *this).Marks(query);
+    marks_ = Compiler(indices_->All(), *this, indices_->Widened()).Marks(query);
     marked_query_ = query;
     marked_ = true;
   }

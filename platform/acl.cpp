@@ -62,12 +62,18 @@ int Walk(const maru::Identity& who, const std::string& folder, std::string_view 
 }  // namespace
 
 int MARUACLPermGet(const char* path, unsigned int* bits) {
-  if (!path || !bits || faccessat(AT_FDCWD, path, F_OK, AT_EACCESS) != 0) return -1;
+  if (!path || !bits) return -1;
+  // The way to the file is gone once.
+  const maru::UniqueFd file(open(path, O_PATH | O_CLOEXEC));
+  if (!file) return -1;
   const maru::KeepErrno keep;
+  const auto may = [&](int what) {
+    return faccessat(file.Get(), "", what, AT_EACCESS | AT_EMPTY_PATH) == 0;
+  };
   *bits = 0;
-  if (faccessat(AT_FDCWD, path, R_OK, AT_EACCESS) == 0) *bits |= kACLRead;
-  if (faccessat(AT_FDCWD, path, W_OK, AT_EACCESS) == 0) *bits |= kACLWrite;
-  if (faccessat(AT_FDCWD, path, X_OK, AT_EACCESS) == 0) *bits |= kACLExecute;
+  if (may(R_OK)) *bits |= kACLRead;
+  if (may(W_OK)) *bits |= kACLWrite;
+  if (may(X_OK)) *bits |= kACLExecute;
   return 0;
 }
 
