@@ -9,6 +9,7 @@ import concurrent.futures
 import json
 import os
 import pathlib
+import sqlite3
 import statistics
 import subprocess
 import sys
@@ -48,8 +49,8 @@ class Roads:
             return None
         try:
             return work()
-        except (OSError, RuntimeError, ValueError, subprocess.CalledProcessError, LookupError,
-                AssertionError) as error:
+        except (OSError, RuntimeError, ValueError, LookupError, AssertionError, ImportError,
+                subprocess.CalledProcessError, sqlite3.Error) as error:
             self.failed[name] = f"{type(error).__name__}: {error}"[:300]
             return None
 
