@@ -39,6 +39,19 @@ NodePointer Join(Kind kind, const NodePointer& a, const NodePointer& b) {
   return Height(a, kind) >= Height(b, kind) ? Append(kind, a, b) : Append(kind, b, a);
 }
 
+/// The column that all of a tree of alternatives compare for equality, and their values in order;
+/// null when it is not one column.
+const std::string* OneColumn(const Condition::Node& node, std::vector<const Value*>& values) {
+  if (node.kind == Kind::kCompare && node.op == "=") {
+    values.push_back(&node.value);
+    return &node.column;
+  }
+  if (node.kind != Kind::kOr) return nullptr;
+  const std::string* left = OneColumn(*node.left, values);
+  const std::string* right = left ? OneColumn(*node.right, values) : nullptr;
+  return right && *left == *right ? left : nullptr;
+}
+
 bool IsOperator(std::string_view op) {
   constexpr std::array<std::string_view, 6> operators{"=", "!=", "<", "<=", ">", ">="};
   return std::find(operators.begin(), operators.end(), op) != operators.end();
@@ -110,6 +123,16 @@ std::string StatementText::Of(const Condition::Node& node) {
       return std::string(session_.IsSQLite() ? "instr(" : "strpos(") + Column(node.column) + ", " +
              Bind(node.value) + ") > 0";
     default: {
+      if (node.kind == Condition::Node::kOr) {
+        // A set of values is looked up; a chain of thousands of comparisons would be gone through
+        // for every row.
+        std::vector<const Value*> values;
+        if (const std::string* column = OneColumn(node, values)) {
+          std::string list;
+          for (const Value* value : values) list += (list.empty() ? "" : ", ") + Bind(*value);
+          return Column(*column) + " IN (" + list + ")";
+        }
+      }
       // One after the other: values are bound in the order of their places.
       const std::string left = Of(*node.left);
       const std::string right = Of(*node.right);
