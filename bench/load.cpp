@@ -1,7 +1,9 @@
-// Sends HTTP requests over connections that stay open, and tells how long the answers took.
+// Sends requests over connections that stay open, to the web server or to the daemon's socket, and
+// tells how long the answers took.
 #include <arpa/inet.h>
 #include <netinet/tcp.h>
 #include <sys/socket.h>
+#include <sys/un.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -21,11 +23,11 @@ using Clock = std::chrono::steady_clock;
 
 struct Options {
   std::uint16_t port = 0;
-  std::string token;
-  std::string path;
-  std::vector<std::string> bodies;
+  std::string socket;  // the daemon's, in place of a port
+  std::vector<std::string> requests;
   std::size_t connections = 1;
   std::size_t rounds = 1;
+  std::string expected;  // stands in every answer that is as it should be
 };
 
 struct Totals {
@@ -35,25 +37,47 @@ struct Totals {
   std::size_t hits = 0;
 };
 
+/// How long an HTTP answer is, which may not have come in whole; 0 as long as that is open.
+std::size_t HttpLength(const std::string& answer) {
+  const std::size_t head = answer.find("\r\n\r\n");
+  if (head == std::string::npos) return 0;
+  const std::size_t length = answer.find("Content-Length: ");
+  if (length > head) throw std::runtime_error("an answer without a length");
+  return head + 4 + std::strtoul(answer.c_str() + length + 16, nullptr, 10);
+}
+
+/// Whether the daemon's last message has come: the one that says whether it succeeded.
+bool DaemonIsDone(const std::string& answer) {
+  if (!answer.ends_with('\n')) return false;
+  const std::size_t before = answer.rfind('\n', answer.size() - 2);
+  return answer.find("\"success\"", before == std::string::npos ? 0 : before) != std::string::npos;
+}
+
 class Connection {
  public:
-  explicit Connection(std::uint16_t port)
-      : socket_(socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0)) {
-    sockaddr_in address{};
-    address.sin_family = AF_INET;
-    address.sin_port = htons(port);
-    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-    const int on = 1;
-    setsockopt(socket_, IPPROTO_TCP, TCP_NODELAY, &on, sizeof on);
-    if (connect(socket_, reinterpret_cast<sockaddr*>(&address), sizeof address) != 0) {
-      throw std::runtime_error("cannot connect");
+  explicit Connection(const Options& options)
+      : is_http_(options.socket.empty()),
+        socket_(socket(is_http_ ? AF_INET : AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0)) {
+    if (is_http_) {
+      sockaddr_in address{};
+      address.sin_family = AF_INET;
+      address.sin_port = htons(options.port);
+      address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+      const int on = 1;
+      setsockopt(socket_, IPPROTO_TCP, TCP_NODELAY, &on, sizeof on);
+      Connect(address);
+    } else {
+      sockaddr_un address{};
+      address.sun_family = AF_UNIX;
+      options.socket.copy(address.sun_path, sizeof address.sun_path - 1);
+      Connect(address);
     }
   }
   ~Connection() { close(socket_); }
   Connection(const Connection&) = delete;
   Connection& operator=(const Connection&) = delete;
 
-  /// The answer's head and body.
+  /// The whole answer, of HTTP with its head.
   const std::string& Exchange(const std::string& request) {
     for (std::size_t sent = 0; sent < request.size();) {
       const ssize_t done =
@@ -63,28 +87,34 @@ class Connection {
     }
     answer_.clear();
     std::size_t whole = 0;
-    while (whole == 0 || answer_.size() < whole) {
+    do {
       char buffer[65536];
       const ssize_t got = recv(socket_, buffer, sizeof buffer, 0);
       if (got <= 0) throw std::runtime_error("the server hung up");
       answer_.append(buffer, static_cast<std::size_t>(got));
-      const std::size_t head = answer_.find("\r\n\r\n");
-      if (whole > 0 || head == std::string::npos) continue;
-      const std::size_t length = answer_.find("Content-Length: ");
-      if (length > head) throw std::runtime_error("an answer without a length");
-      whole = head + 4 + std::strtoul(answer_.c_str() + length + 16, nullptr, 10);
-    }
+      if (is_http_ && whole == 0) whole = HttpLength(answer_);
+    } while (is_http_ ? whole == 0 || answer_.size() < whole : !DaemonIsDone(answer_));
     return answer_;
   }
 
  private:
+  template <typename Address>
+  void Connect(const Address& address) {
+    if (connect(socket_, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
+      throw std::runtime_error("cannot connect");
+    }
+  }
+
+  bool is_http_;
   int socket_;
   std::string answer_;
 };
 
-std::string Request(const Options& options, const std::string& body) {
-  return "POST " + options.path + " HTTP/1.1\r\nHost: 127.0.0.1\r\nAuthorization: Bearer " +
-         options.token +
+/// A request over HTTP; one without a body is a GET.
+std::string HttpRequest(const std::string& token, const std::string& path,
+                        const std::string& body) {
+  return (body.empty() ? "GET " : "POST ") + path +
+         " HTTP/1.1\r\nHost: 127.0.0.1\r\nAuthorization: Bearer " + token +
          "\r\nContent-Type: application/json\r\nContent-Length: " + std::to_string(body.size()) +
          "\r\n\r\n" + body;
 }
@@ -99,17 +129,15 @@ std::size_t HitsIn(const std::string& answer) {
 }
 
 void Run(const Options& options, std::size_t first, Totals& totals) {
-  std::vector<std::string> requests;
-  for (const std::string& body : options.bodies) requests.push_back(Request(options, body));
-  Connection connection(options.port);
+  const std::vector<std::string>& requests = options.requests;
+  Connection connection(options);
   for (std::size_t i = 0; i < options.rounds * requests.size(); ++i) {
     const auto start = Clock::now();
     const std::string& answer = connection.Exchange(requests[(first + i) % requests.size()]);
     totals.times.push_back(std::chrono::duration<double, std::micro>(Clock::now() - start).count());
     totals.bytes += answer.size();
     totals.hits += HitsIn(answer);
-    totals.failed += answer.find("\"success\":true") == std::string::npos &&
-                     answer.find("\"success\" : true") == std::string::npos;
+    totals.failed += answer.find(options.expected) == std::string::npos;
   }
 }
 
@@ -150,20 +178,31 @@ int Measure(const Options& options) {
 
 }  // namespace
 
-int main(int count, char** words) {
-  if (count != 7) {
-    std::cerr << "Usage: maru-bench-load PORT TOKEN PATH BODIES CONNECTIONS ROUNDS\n"
-                 "Sends each line of the file BODIES to PATH, ROUNDS times on each connection, and "
-                 "prints one JSON object; times in microseconds.\n";
+int main(int count, char** given) {
+  const std::vector<std::string> words(given + 1, given + count);
+  const bool is_http = words.size() == 7 && words[0] == "http";
+  if (!is_http && !(words.size() == 5 && words[0] == "daemon")) {
+    std::cerr << "Usage: maru-bench-load http PORT TOKEN PATH CONNECTIONS ROUNDS EXPECTED\n"
+                 "       maru-bench-load daemon SOCKET CONNECTIONS ROUNDS EXPECTED\n"
+                 "Sends each line that it reads (an empty one: a GET) ROUNDS times on each "
+                 "connection, counts answers\nwithout the text EXPECTED as failed, and prints one "
+                 "JSON object; times in microseconds.\n";
     return 2;
   }
   Options options;
-  options.port = static_cast<std::uint16_t>(std::strtoul(words[1], nullptr, 10));
-  options.token = words[2];
-  options.path = words[3];
-  std::ifstream file(words[4]);
-  for (std::string line; std::getline(file, line);) options.bodies.push_back(line);
-  options.connections = std::max(1ul, std::strtoul(words[5], nullptr, 10));
-  options.rounds = std::max(1ul, std::strtoul(words[6], nullptr, 10));
-  return options.bodies.empty() ? 2 : Measure(options);
+  for (std::string line; std::getline(std::cin, line);) {
+    options.requests.push_back(is_http ? HttpRequest(words[2], words[3], line) : line + "\n");
+  }
+  const auto number = [&](std::size_t from_end) {
+    return std::strtoul(words[words.size() - from_end].c_str(), nullptr, 10);
+  };
+  if (is_http) {
+    options.port = static_cast<std::uint16_t>(number(6));
+  } else {
+    options.socket = words[1];
+  }
+  options.connections = number(3);
+  options.rounds = number(2);
+  options.expected = words.back();
+  return options.requests.empty() ? 2 : Measure(options);
 }

@@ -77,7 +77,8 @@ class Roads:
 
     def search(self):
         """The same searches of everybody, by turns; of us alone, eight at once, and of the daemon."""
-        rounds, ours = self.options["rounds"], {"alone": [], "loaded": [], "daemon": [], "cpu": []}
+        rounds = self.options["rounds"]
+        ours = {kind: [] for kind in ("alone", "loaded", "front", "child", "daemon", "cpu")}
         theirs = {name: [] for name in self.rivals}
         for name, rival in self.rivals.items():
             if not rival.is_indexed():
@@ -92,46 +93,33 @@ class Roads:
             ours["cpu"].append({group: (after[group] - before[group]) * 1e6 / rounds
                                 / len(self.queries) for group in after})
             ours["loaded"].append(self.system.load(self.bodies(), connections=8, rounds=rounds))
-            ours["daemon"].append(self.system.daemon_times(self.queries, rounds))
+            ours["front"].append(self.front(rounds))
+            ours["child"].append(self.child(rounds))
+            ours["daemon"].append(self.system.daemon_load(self.queries, rounds=rounds))
             for name, rival in self.rivals.items():
                 result = self.tried(name, lambda rival=rival: rival.search(self.queries, rounds))
                 theirs[name] += [result] if result else []
         return {kind: median_of(results) for kind, results in ours.items()} | {
-            "front": self.front(rounds), "child": self.child(rounds),
             "rivals": {name: median_of(results) for name, results in theirs.items() if results}}
 
     def front(self, rounds):
-        """An answer that the front gives by itself, in microseconds."""
-        connection = self.system.services.connect()
-        times = []
-        for _ in range(30 * rounds):
-            start = time.perf_counter()
-            connection.request("GET", "/healthz")
-            connection.getresponse().read()
-            times.append((time.perf_counter() - start) * 1e6)
-        return statistics.median(times)
+        """An answer that the front gives by itself."""
+        load = self.system.load([None], rounds=30 * rounds, path="/healthz", expected=" 200 ")
+        return {"p50": load["p50"]}
 
     def child(self, rounds):
         """An answer for which a child becomes the user and the plug-in refuses the request at once."""
-        body = json.dumps(road.search_request("x", query_id="a/b", query_serial=1))
-        headers = {"Content-Type": "application/json",
-                   "Authorization": "Bearer " + self.system.token("alice")}
-        connection = self.system.services.connect()
-        times = []
-        for _ in range(30 * rounds):
-            start = time.perf_counter()
-            connection.request("POST", road.SEARCH_PATH, body, headers)
-            answer = connection.getresponse().read()
-            times.append((time.perf_counter() - start) * 1e6)
-        assert json.loads(answer)["error"]["code"] == 120, answer
-        return statistics.median(times)
+        refused = road.search_request("x", query_id="a/b", query_serial=1)
+        load = self.system.load([refused], rounds=30 * rounds, expected='"code":120')
+        return {"p50": load["p50"]}
 
     def fragments(self):
         highlight = {"field": "MARUMDTextContent", "frag_length": 100, "num_fragments": 3}
         bodies = self.bodies(highlight=[highlight])
         results = [self.system.load(bodies, rounds=self.options["rounds"])
                    for _ in range(self.options["runs"])]
-        daemon = [self.system.daemon_times(self.queries, self.options["rounds"], highlight=[highlight])
+        daemon = [self.system.daemon_load(self.queries, rounds=self.options["rounds"],
+                                          highlight=[highlight])
                   for _ in range(self.options["runs"])]
         return median_of(results) | {"daemon": median_of(daemon)["p50"]}
 

@@ -26,9 +26,15 @@ def program(name):
     return str(road.BUILD / "bin" / name)
 
 
-def run_json(*command):
+def reachable(name):
+    """A program where every account of the sandbox can reach it."""
+    return pathlib.Path("/run/project", pathlib.Path(program(name)).relative_to(TOP))
+
+
+def run_json(*command, given=None):
     """Runs a program that prints one JSON object."""
-    done = subprocess.run([str(word) for word in command], stdout=subprocess.PIPE, check=True)
+    done = subprocess.run([str(word) for word in command], input=given, stdout=subprocess.PIPE,
+                          text=True, check=True)
     return json.loads(done.stdout)
 
 
@@ -170,34 +176,26 @@ class System:
             self.tokens[user] = self.services.sign_in(user)
         return self.tokens[user]
 
-    def load(self, bodies, user="alice", connections=1, rounds=1, path=road.SEARCH_PATH):
-        """Sends the requests so many times on each connection; times in microseconds."""
-        file = self.work / "bodies.jsonl"
-        file.write_text("".join(json.dumps(body) + "\n" for body in bodies), encoding="utf-8")
-        result = run_json(program("maru-bench-load"), self.services.port, self.token(user), path,
-                          file, connections, rounds)
+    def load(self, bodies, user="alice", connections=1, rounds=1, path=road.SEARCH_PATH,
+             expected='"success":true'):
+        """Sends the requests so many times on each connection, None as a GET; times in microseconds."""
+        lines = "".join("\n" if body is None else json.dumps(body) + "\n" for body in bodies)
+        return self.loaded(["http", self.services.port, self.token(user), path, connections, rounds,
+                            expected], lines)
+
+    def daemon_load(self, queries, user="alice", rounds=1, **more):
+        """The same searches asked at the daemon's socket, as the plug-in asks them."""
+        lines = []
+        for words in queries:
+            request = road.daemon_search(words, ["fileindex_" + self.share], size=50)
+            request["data"] |= more
+            lines.append(json.dumps(request) + "\n")
+        return road.as_user(user, self.loaded, ["daemon", road.SOCKET, 1, rounds, '"success":true'],
+                            "".join(lines))
+
+    @staticmethod
+    def loaded(arguments, lines):
+        result = run_json(reachable("maru-bench-load"), *arguments, given=lines)
         if result["failed"]:
             raise RuntimeError(f"{result['failed']} requests failed")
         return result
-
-    def daemon_times(self, queries, rounds, user="alice", **more):
-        """The same searches asked at the daemon's socket, as the plug-in asks them."""
-        def ask():
-            times = []
-            with road.socket.socket(road.socket.AF_UNIX) as connection:
-                connection.connect(road.SOCKET)
-                stream = connection.makefile("rwb")
-                for words in queries * rounds:
-                    request = road.daemon_search(words, ["fileindex_" + self.share], size=50)
-                    request["data"] |= more
-                    line = json.dumps(request).encode() + b"\n"
-                    start = time.perf_counter()
-                    stream.write(line)
-                    stream.flush()
-                    while b'"success"' not in stream.readline():
-                        pass
-                    times.append((time.perf_counter() - start) * 1e6)
-            return times
-
-        times = sorted(road.as_user(user, ask))
-        return {"p50": times[len(times) // 2], "p95": times[len(times) * 95 // 100]}

@@ -58,7 +58,7 @@ def search_tables(name, figures):
 
 def where_time_goes(search):
     """The median's parts: each boundary is measured, the rest is their difference."""
-    front, child, daemon = search["front"], search["child"], search["daemon"]["p50"]
+    front, child, daemon = (search[part]["p50"] for part in ("front", "child", "daemon"))
     engine = search["rivals"].get("bare engine", {}).get("exact", 0)
     parts = [("the front's own answer", front),
              ("host, child and plug-in that refuses at once, beyond that", child - front),
