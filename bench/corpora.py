@@ -67,21 +67,23 @@ def make_tiny(target, _corpora):
         copy_files(top / room, target / room)
 
 
-def make_rights(target, corpora):
+def make_rights(of):
     """carol may read all, bob half, alice one in a hundred. In every other folder that has no folders
     the folder's mode says so, elsewhere each file's."""
-    copy_files(make("small", corpora), target)
-    number = 0
-    for place, (folder, folders, names) in enumerate(sorted(os.walk(target))):
-        by_folder = place % 2 == 1 and not folders
-        if by_folder:
-            shutil.chown(folder, CAROL, WORK)
-            os.chmod(folder, 0o750 if place % 4 == 1 else 0o700)
-        for name in sorted(names):
-            path = pathlib.Path(folder, name)
-            number += not by_folder
-            shutil.chown(path, CAROL, WORK if by_folder or number % 2 == 0 else ROOT)
-            path.chmod(0o644 if by_folder or number % 60 == 0 else 0o640)
+    def build(target, corpora):
+        copy_files(make(of, corpora), target)
+        number = 0
+        for place, (folder, folders, names) in enumerate(sorted(os.walk(target))):
+            by_folder = place % 2 == 1 and not folders
+            if by_folder:
+                shutil.chown(folder, CAROL, WORK)
+                os.chmod(folder, 0o750 if place % 4 == 1 else 0o700)
+            for name in sorted(names):
+                path = pathlib.Path(folder, name)
+                number += not by_folder
+                shutil.chown(path, CAROL, WORK if by_folder or number % 2 == 0 else ROOT)
+                path.chmod(0o644 if by_folder or number % 60 == 0 else 0o640)
+    return build
 
 
 def make_copies(count):
@@ -97,10 +99,11 @@ def make_copies(count):
     return build
 
 
-MAKERS = {"small": make_small, "large": make_large, "tiny": make_tiny, "rights": make_rights,
+MAKERS = {"small": make_small, "large": make_large, "tiny": make_tiny,
+          "rights": make_rights("small"), "tinyrights": make_rights("tiny"),
           "copies1": make_copies(1), "copies4": make_copies(4), "copies16": make_copies(COPIES)}
 # Corpora that are asked another's queries.
-QUERIES_OF = {"rights": "small", "copies1": "small", "copies4": "small", "copies16": "small"}
+QUERIES_OF = {"rights": "small", "tinyrights": "tiny", "copies1": "small", "copies4": "small", "copies16": "small"}
 
 
 def make(name, corpora):

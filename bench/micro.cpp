@@ -5,6 +5,7 @@
 #include <filesystem>
 #include <string>
 
+#include "daemon/keyword.h"
 #include "index/fields.h"
 #include "index/fragments.h"
 #include "index/reader.h"
@@ -93,6 +94,15 @@ void ParseAndWriteJson(benchmark::State& state) {
   }
 }
 BENCHMARK(ParseAndWriteJson);
+
+void ReadKeyword(benchmark::State& state) {
+  const maru::daemon::KeywordOptions options{{{std::string(kName), 3}, {std::string(kText), 1}}};
+  for (auto _ : state) {
+    benchmark::DoNotOptimize(
+        maru::daemon::ParseKeyword("harbour (berth OR \"low tide\") -storm ship*", options));
+  }
+}
+BENCHMARK(ReadKeyword);
 
 void JudgeRights(benchmark::State& state) {
   const Identity who{1000, {100, 1000, 2000}, false};

@@ -44,7 +44,7 @@ class Roads:
         self.rivals = {name: rival(self.work) for name, rival in chosen.items()}
 
     def tried(self, name, work):
-        """A rival's figure, or None with the reason noted."""
+        """A rival's figure or a road's, or None with the reason noted."""
         if name in self.failed:
             return None
         try:
@@ -258,7 +258,9 @@ class Roads:
         try:
             for name in wanted:
                 say(name)
-                self.figures[name] = getattr(self, name)()
+                figures = self.tried(name, getattr(self, name))
+                if figures:
+                    self.figures[name] = figures
         finally:
             self.system.stop()
         self.figures["failed"] = self.failed

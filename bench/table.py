@@ -49,8 +49,9 @@ def search_tables(name, figures):
     rows.append(["the same, 8 at once", number(loaded["p50"]), number(loaded["p95"]),
                  number(loaded["p99"]), number(loaded["per_second"]), "", ""])
     for who, result in search["rivals"].items():
-        rows.append([who, number(result["p50"]), number(result.get("p95")), "-",
-                     number(result.get("per_second")), number(result["hits"]), ratio(result["p50"], ours["p50"])])
+        rows.append([who, number(result["p50"]), number(result["p95"]), number(result["p99"]),
+                     number(result.get("per_second")), number(result["hits"]),
+                     ratio(result["p50"], ours["p50"])])
     cpu = ", ".join(f"{who} {number(used)}" for who, used in search["cpu"].items() if used)
     return (aligned(rows) + "\n\n" + where_time_goes(search) + f"\n\nCPU per search, us: {cpu}."
             + against_engine(search))
