@@ -6,6 +6,10 @@
 namespace maru::index {
 namespace {
 
+constexpr std::size_t kBlock = 64;
+/// So many words are looked for block by block; more are told apart word by word.
+constexpr std::size_t kFewWords = 8;
+
 std::uint64_t LengthBit(std::size_t length) {
   return std::uint64_t{1} << std::min<std::size_t>(length, 63);
 }
@@ -32,7 +36,6 @@ bool IsAscii(std::string_view text) {
 
 /// Whether some byte of a block and the one `offset` behind it may be the ends of a word. Without
 /// branches, for the compiler to make it some instructions on whole registers.
-template <std::size_t kBlock>
 bool MayBeginIn(const char* block, std::size_t offset, char first, char last) {
   unsigned char any = 0;
   for (std::size_t i = 0; i < kBlock; ++i) {
@@ -70,6 +73,22 @@ Matcher::Matcher(const std::vector<MarkGroup>& groups) {
       if (groups[group].phrase) break;
     }
   }
+  // A longer run than the longest word is cut there: its last byte is not the word's.
+  plain_ =
+      words_.size() <= kFewWords && std::all_of(words_.begin(), words_.end(), [](const auto& row) {
+        return !row.first.empty() && row.first.size() < kMaxWord && IsAscii(row.first);
+      });
+}
+
+/// Whether one of the words may begin in the block; true near the text's end.
+bool Matcher::MayBeginAt(std::string_view text, std::size_t block) const {
+  for (const auto& [word, wanted] : words_) {
+    if (block + kBlock + word.size() > text.size() ||
+        MayBeginIn(text.data() + block, word.size() - 1, word.front(), word.back())) {
+      return true;
+    }
+  }
+  return false;
 }
 
 bool Matcher::MayBe(std::string_view word) const {
@@ -90,7 +109,28 @@ bool Matcher::Take(std::string_view text, const Token& token, Use& use) const {
 }
 
 template <class Use>
+void Matcher::ForEachPlain(std::string_view text, Use&& use) const {
+  char folded[kMaxWord];
+  for (std::size_t block = 0; block < text.size(); block += kBlock) {
+    if (!MayBeginAt(text, block)) continue;
+    const std::size_t block_end = std::min(block + kBlock, text.size());
+    for (std::size_t begin = block; begin < block_end; ++begin) {
+      if (!IsWordByte(text[begin]) || (begin > 0 && IsWordByte(text[begin - 1]))) continue;
+      std::size_t end = begin + 1;
+      while (end < text.size() && IsWordByte(text[end])) ++end;
+      const std::size_t length = std::min(end - begin, kMaxWord);
+      if (!(lengths_[static_cast<unsigned char>(FoldAscii(text[begin]))] & LengthBit(length))) {
+        continue;
+      }
+      for (std::size_t i = 0; i < length; ++i) folded[i] = FoldAscii(text[begin + i]);
+      if (!Take(text, {std::string_view(folded, length), begin, end}, use)) return;
+    }
+  }
+}
+
+template <class Use>
 void Matcher::ForEach(std::string_view text, Use&& use) const {
+  if (plain_ && IsAscii(text)) return ForEachPlain(text, use);
   Tokenizer tokenizer;
   Token token;
   char folded[kMaxWord];
@@ -176,14 +216,13 @@ bool PhraseFinder::IsHere(std::string_view text, std::size_t at) const {
 /// Most texts are ASCII, or hold the phrase as it is: blocks of bytes without both ends of the
 /// first word are passed over at once, and only where that does not decide are all words looked at.
 bool PhraseFinder::IsIn(std::string_view text) const {
-  constexpr std::size_t kBlock = 64;
   if (!plain_) return matcher_.AnyIn(text);
   const std::size_t width = words_[0].size();
   const char first = words_[0].front();
   const char last = words_[0].back();
   std::size_t at = 0;
   for (; at + kBlock + width <= text.size(); at += kBlock) {
-    if (!MayBeginIn<kBlock>(text.data() + at, width - 1, first, last)) continue;
+    if (!MayBeginIn(text.data() + at, width - 1, first, last)) continue;
     for (std::size_t i = at; i < at + kBlock; ++i) {
       if (FoldAscii(text[i]) == first && IsHere(text, i)) return true;
     }

@@ -45,11 +45,16 @@ class Matcher {
 
   template <class Use>
   void ForEach(std::string_view text, Use&& use) const;
+  template <class Use>
+  void ForEachPlain(std::string_view text, Use&& use) const;
+  bool MayBeginAt(std::string_view text, std::size_t block) const;
   bool MayBe(std::string_view word) const;
   template <class Use>
   bool Take(std::string_view text, const Token& token, Use& use) const;
 
   std::map<std::string, std::vector<Wanted>, std::less<>> words_;
+  /// Few words, all ASCII: in ASCII texts, blocks where none of them begins are passed over.
+  bool plain_ = false;
   /// By the first byte of the words: which lengths there are, one bit each.
   std::array<std::uint64_t, 256> lengths_{};
 };

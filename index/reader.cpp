@@ -16,6 +16,7 @@ namespace {
 
 /// The weight that a boost of 1 adds: about that of a rare word.
 constexpr double kBoostWeight = 10;
+constexpr std::size_t kFewChunks = 4;
 
 /// Sees what the eyes of each share see.
 class EyesRule : public PlaceRule {
@@ -322,8 +323,9 @@ std::vector<Fragment> EngineReader::TextFragments(std::size_t share, DocumentId 
       TextPlace::Decode(indices_->Database(share).get_document(document).get_value(kTextSlot));
   StoredText text;
   if (groups.empty() || !text.Open(indices_->Index(share).texts, place)) return {};
-  return FragmentsOf(text, text.Chunks() > 1 ? InDocument(share, document, groups) : groups,
-                     options);
+  // A few chunks are looked through faster than the document's list of terms.
+  const bool many = text.Chunks() > kFewChunks;
+  return FragmentsOf(text, many ? InDocument(share, document, groups) : groups, options);
 }
 
 std::vector<Fragment> EngineReader::Fragments(std::size_t share, DocumentId document,
