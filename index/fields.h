@@ -9,7 +9,7 @@
 namespace maru::index {
 
 enum class FieldType {
-  kText,     ///< words with positions, searched by keyword
+  kText,     ///< words, searched by keyword
   kKeyword,  ///< one exact value, folded to lower case
   kNumber,   ///< a 64-bit number: ranges, sorting
   kTime,     ///< seconds since the epoch: ranges, sorting

@@ -21,11 +21,6 @@ bool IsInside(char c) {
   return (static_cast<unsigned char>(c) & 0xc0) == 0x80;
 }
 
-bool IsWordByte(char c) {
-  const auto byte = static_cast<unsigned char>(c);
-  return byte >= 0x80 || kAsciiFold[byte];
-}
-
 /// Whether a reader sees a character begin at `at`: of a run of blanks, one.
 bool Shows(std::string_view text, std::size_t at) {
   if (IsInside(text[at])) return false;

@@ -14,15 +14,6 @@ std::uint64_t LengthBit(std::size_t length) {
   return std::uint64_t{1} << std::min<std::size_t>(length, 63);
 }
 
-char FoldAscii(char c) {
-  const auto byte = static_cast<unsigned char>(c);
-  return byte < 0x80 ? kAsciiFold[byte] : '\0';
-}
-
-bool IsWordByte(char c) {
-  return static_cast<unsigned char>(c) >= 0x80 || FoldAscii(c);
-}
-
 bool IsAscii(std::string_view text) {
   std::uint64_t all = 0;
   for (; text.size() >= sizeof all; text.remove_prefix(sizeof all)) {

@@ -29,6 +29,17 @@ inline constexpr std::array<char, 128> kAsciiFold = [] {
   return table;
 }();
 
+/// The same for any byte: 0 also for those of longer characters.
+inline char FoldAscii(char c) {
+  const auto byte = static_cast<unsigned char>(c);
+  return byte < 0x80 ? kAsciiFold[byte] : '\0';
+}
+
+/// Whether a byte may be part of a word: all of longer characters may.
+inline bool IsWordByte(char c) {
+  return static_cast<unsigned char>(c) >= 0x80 || FoldAscii(c);
+}
+
 struct Token {
   /// Folded; valid only during the call that hands it over.
   std::string_view word;
