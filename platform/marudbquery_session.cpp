@@ -19,6 +19,9 @@ constexpr const char* kBusyTimeout = "PRAGMA busy_timeout = 20000";
 // In pages. The first to open the database reads the whole log, and here nearly everybody is that:
 // short-lived processes, one a request.
 constexpr const char* kCheckpoint = "PRAGMA wal_autocheckpoint = 50";
+// The disk is waited for at checkpoints only: a power cut may cost the last few rows, never the
+// database.
+constexpr const char* kSynchronous = "PRAGMA synchronous = NORMAL";
 
 std::unique_ptr<soci::session> Connect(std::string_view backend, const std::string& connection) {
   if (backend == kSQLite) return std::make_unique<soci::session>(soci::sqlite3, connection);
@@ -34,6 +37,7 @@ std::unique_ptr<soci::session> Connect(std::string_view backend, const std::stri
 void PrepareSQLite(soci::session& database) {
   database << kBusyTimeout;
   database << kCheckpoint;
+  database << kSynchronous;
   std::string mode;
   database << "PRAGMA journal_mode", soci::into(mode);
   if (mode == "wal") return;
