@@ -5,6 +5,7 @@
 #include <sys/resource.h>
 #include <unistd.h>
 
+#include "platform/guard.h"
 #include "platform/log.h"
 
 namespace {
@@ -13,20 +14,13 @@ constexpr int kFollowUpNice = 10;
 
 thread_local int last_error = 0;
 
-/// Follow-up work gives way to answers that somebody waits for.
-void StepBack() {
-  const sched_param none{};
-  sched_setscheduler(0, SCHED_BATCH, &none);
-  setpriority(PRIO_PROCESS, 0, kFollowUpNice);
-}
-
 }  // namespace
 
 int MLIBCProcForkEx(int close_descriptors) {
   const pid_t child = fork();
   if (child < 0) MLIBCErrSet(kErrSystem);
   if (child != 0 || !close_descriptors) return child;
-  StepBack();
+  maru::GiveWay();
   // The log's own socket goes with the rest; its number may soon be another file's.
   maru::ReopenLog();
   close_range(STDERR_FILENO + 1, ~0u, 0);
@@ -41,3 +35,14 @@ int MLIBCErrGet() {
 void MLIBCErrSet(int code) {
   last_error = code;
 }
+
+namespace maru {
+
+void GiveWay() {
+  const KeepErrno keep;
+  const sched_param none{};
+  sched_setscheduler(0, SCHED_BATCH, &none);
+  setpriority(PRIO_PROCESS, 0, kFollowUpNice);
+}
+
+}  // namespace maru

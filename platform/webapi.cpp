@@ -110,7 +110,11 @@ void APIResponse::SetSuccess(const Json::Value& data) {
   set_ = true;
   success_ = true;
   error_code_ = 0;
-  data_ = data;
+  if (!take_success_) {
+    data_ = data;
+  } else if (!std::exchange(taken_, true)) {
+    take_success_(data);
+  }
 }
 
 void APIResponse::SetError(int code, const Json::Value& data) {

@@ -89,9 +89,17 @@ class APIRequest {
   Json::Value params_;
 };
 
-/// The answer. The last call of SetSuccess or SetError wins.
+/// The answer. The last call of SetSuccess or SetError wins, unless a success is taken at once.
 class APIResponse {
  public:
+  using Taker = std::function<void(const Json::Value& data)>;
+
+  APIResponse() = default;
+  /// `take_success` is called within the first SetSuccess, so that the client need not wait for
+  /// what the method does after it. That success is the answer: its data are not kept here, and an
+  /// error set later is only seen in this object.
+  explicit APIResponse(Taker take_success) : take_success_(std::move(take_success)) {}
+
   void SetSuccess(const Json::Value& data);
   void SetError(int code, const Json::Value& data);
 
@@ -106,6 +114,8 @@ class APIResponse {
   bool success_ = false;
   int error_code_ = 0;
   Json::Value data_;
+  Taker take_success_;
+  bool taken_ = false;
 };
 
 using APIEntry = void (*)(APIRequest*, APIResponse*);

@@ -8,10 +8,13 @@
 #include <unistd.h>
 
 #include <exception>
+#include <utility>
 
 #include "common/error.h"
+#include "platform/guard.h"
 #include "platform/json.h"
 #include "platform/log.h"
+#include "platform/process.h"
 #include "platform/share_table.h"
 #include "server/account.h"
 #include "server/answer.h"
@@ -48,28 +51,51 @@ bool ParseParams(const std::string& body, Json::Value& params) {
   return json::FromString(RestoreBytes(body), params) && params.isObject();
 }
 
-Answer AnswerOf(const MARU::APIResponse& response) {
-  if (!response.IsSet()) return Failure(maruseeker::kErrorUnknown, Json::Value());
-  return response.IsSuccess() ? Success(response.Data())
-                              : Failure(response.ErrorCode(), response.Data());
-}
+/// Where the one answer of a request goes.
+class Reply {
+ public:
+  /// `front` takes the answer, `host` hears first that there is one: when the front then closes its
+  /// end, the child is left to finish what follows. Both outlive this object.
+  Reply(const Descriptor& front, const Descriptor& host) : front_(front), host_(host) {}
 
-Answer RunMethod(const Plugin::Method& method, MARU::APIRequest& request) {
-  MARU::APIResponse response;
+  /// Sends the first answer; what comes after it is only logged.
+  void Give(Answer answer) {
+    if (std::exchange(given_, true)) {
+      MARU_LOG("An answer was already given; status %d came after it", answer.status);
+      return;
+    }
+    answer.body = HideBytes(std::move(answer.body));
+    if (answer.body.size() > kMaxAnswer) {
+      MARU_LOG("An answer of %zu bytes is too long", answer.body.size());
+      answer = Unknown();
+    }
+    const KeepErrno keep;
+    SendPacket(host_.Get(), kAnswered, Wait::kNo);
+    SendAnswer(front_.Get(), answer, Wait::kYes);
+    GiveWay();
+  }
+
+  static Answer Unknown() { return Failure(maruseeker::kErrorUnknown, Json::Value()); }
+
+ private:
+  const Descriptor& front_;
+  const Descriptor& host_;
+  bool given_ = false;
+};
+
+void RunMethod(const Plugin::Method& method, MARU::APIRequest& request, Reply& reply) {
+  MARU::APIResponse response([&](const Json::Value& data) { reply.Give(Success(data)); });
   try {
     if (method.check(&request, &response)) method.entry(&request, &response);
   } catch (const std::exception& exception) {
     MARU_LOG("An exception left the plug-in: %s", exception.what());
-    return Failure(maruseeker::kErrorUnknown, Json::Value());
+    return reply.Give(Reply::Unknown());
   } catch (...) {
     MARU_LOG("An exception left the plug-in");
-    return Failure(maruseeker::kErrorUnknown, Json::Value());
+    return reply.Give(Reply::Unknown());
   }
-  Answer answer = AnswerOf(response);
-  answer.body = HideBytes(std::move(answer.body));
-  if (answer.body.size() <= kMaxAnswer) return answer;
-  MARU_LOG("An answer of %zu bytes is too long", answer.body.size());
-  return Failure(maruseeker::kErrorUnknown, Json::Value());
+  if (response.IsSuccess()) return;
+  reply.Give(response.IsSet() ? Failure(response.ErrorCode(), response.Data()) : Reply::Unknown());
 }
 
 Answer WhoAnswer(const MARU::APIRequest& request) {
@@ -80,32 +106,34 @@ Answer WhoAnswer(const MARU::APIRequest& request) {
   return Success(who);
 }
 
-Answer CallAnswer(const Task& task, int socket, Packet& packet, const Plugin& plugin,
-                  MARU::APIRequest::Login login) {
-  std::string body;
-  if (!ReadBody(socket, task.body_size, packet, body)) _exit(0);
+void Call(const Task& task, std::string body, const Plugin& plugin, MARU::APIRequest::Login login,
+          Reply& reply) {
   const Plugin::Method method = plugin.Find(task.name);
-  if (!method.entry) return Refusal(404);
+  if (!method.entry) return reply.Give(Refusal(404));
   Json::Value params;
-  if (!ParseParams(body, params)) return Refusal(400);
+  if (!ParseParams(body, params)) return reply.Give(Refusal(400));
   MARU::APIRequest request(std::move(login), std::move(params));
-  return RunMethod(method, request);
+  RunMethod(method, request, reply);
 }
 
-int Serve(const Task& task, int socket, Packet& packet, const Plugin& plugin) {
+int Serve(const Task& task, const Descriptor& socket, Packet& packet, const Plugin& plugin,
+          Reply& reply) {
   const auto account = FindAccount(task.user);
   if (!account || account->uid != task.uid || account->stamp != task.stamp ||
       (task.ask_pam && !IsAdmitted(task.user))) {
-    SendAnswer(socket, Refusal(401), Wait::kYes);
+    reply.Give(Refusal(401));
     return kExitSessionOver;
   }
   const MARU::APIRequest::Login login{task.uid, task.user, task.session_id,
                                       IsAdministrator(task.user)};
+  std::string body;
+  if (!ReadBody(socket.Get(), task.body_size, packet, body)) return 0;
   errno = 0;
-  const Answer answer = task.kind == AskKind::kWho
-                            ? WhoAnswer(MARU::APIRequest(login, Json::Value()))
-                            : CallAnswer(task, socket, packet, plugin, login);
-  SendAnswer(socket, answer, Wait::kYes);
+  if (task.kind == AskKind::kWho) {
+    reply.Give(WhoAnswer(MARU::APIRequest(login, Json::Value())));
+  } else {
+    Call(task, std::move(body), plugin, login, reply);
+  }
   return 0;
 }
 
@@ -144,11 +172,11 @@ void RunRequestChild(Descriptor tasks, const Plugin& plugin) {
   if (ReceivePacket(tasks.Get(), packet, Wait::kYes) != ReceiveResult::kPacket) _exit(0);
   const auto task = UnpackTask(packet.View());
   const Descriptor socket = std::move(packet.passed);
-  tasks.Close();
   if (!task || !socket) _exit(1);
+  Reply reply(socket, tasks);
   int status = 1;
   try {
-    status = Serve(*task, socket.Get(), packet, plugin);
+    status = Serve(*task, socket, packet, plugin, reply);
   } catch (const std::exception& exception) {
     MARU_LOG("Failed to serve a request: %s", exception.what());
   }

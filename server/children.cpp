@@ -1,6 +1,7 @@
 #include "server/children.h"
 
 #include <signal.h>
+#include <sys/socket.h>
 #include <sys/wait.h>
 
 #include "platform/log.h"
@@ -44,17 +45,23 @@ Children::Start Children::Hand(const Task& task, Descriptor& request, Seconds no
     if (!child) return Start::kFailed;
     if (SendPacket(child->tasks.Get(), packet, Wait::kNo, request.Get()) == SendResult::kDone) {
       poller_.Add(request.Get(), static_cast<Poller::Key>(child->pid), 0);
-      busy_.insert_or_assign(child->pid, BusyChild{task.session_id, std::move(request), now});
+      busy_.insert_or_assign(
+          child->pid, BusyChild{task.session_id, std::move(child->tasks), std::move(request), now});
       return Start::kDone;
     }
     if (!was_idle) return Start::kFailed;
   }
 }
 
+bool Children::HasAnswered(const BusyChild& child) {
+  char letter;
+  return recv(child.tasks.Get(), &letter, sizeof(letter), MSG_DONTWAIT) == sizeof(letter);
+}
+
 void Children::HangUp(pid_t pid) {
   const auto found = busy_.find(pid);
   if (found == busy_.end() || !found->second.request) return;
-  kill(pid, SIGKILL);
+  if (!HasAnswered(found->second)) kill(pid, SIGKILL);
   poller_.Remove(found->second.request.Get());
   found->second.request.Close();
 }

@@ -32,7 +32,8 @@ class Children {
   /// otherwise it is the caller's still.
   Start Hand(const Task& task, Descriptor& request, Seconds now);
 
-  /// The client of this child is gone: ends the child. Unknown ids are ignored.
+  /// The front has closed its end: ends the child, unless that has answered and only finishes what
+  /// follows. Unknown ids are ignored.
   void HangUp(pid_t pid);
   /// Ends the children that have worked too long.
   void EndOverdue(Seconds now);
@@ -61,12 +62,13 @@ class Children {
   };
   struct BusyChild {
     std::string session_id;
-    Descriptor request;
+    Descriptor tasks, request;
     Seconds since;
     bool overdue = false;
   };
 
   std::optional<IdleChild> Fork();
+  static bool HasAnswered(const BusyChild& child);
 
   Poller& poller_;
   const Plugin& plugin_;

@@ -117,6 +117,18 @@ void Fork(APIRequest* request, APIResponse* response) {
   response->SetSuccess("forked");
 }
 
+/// Answers, and after `ms` milliseconds leaves a file behind and thinks better of it. Without `ms`:
+/// whether there is the file.
+void Follow(APIRequest* request, APIResponse* response) {
+  constexpr const char* kFile = "/tmp/followed";
+  const int milliseconds = IntOf(request, "ms");
+  response->SetSuccess(milliseconds > 0 || access(kFile, F_OK) == 0);
+  if (milliseconds <= 0) return;
+  usleep(static_cast<useconds_t>(milliseconds) * 1000);
+  close(creat(kFile, 0600));
+  response->SetError(120, Json::Value());
+}
+
 void Huge(APIRequest* request, APIResponse* response) {
   response->SetSuccess(std::string(static_cast<std::size_t>(IntOf(request, "size")), 'x'));
 }
@@ -134,11 +146,11 @@ void Hungry(APIRequest*, APIResponse* response) {
 constexpr const char* kApi = "Test.Server";
 
 MARU::APIRow api_table[] = {
-    {kApi, 1, "echo", Echo},       {kApi, 1, "inspect", Inspect}, {kApi, 1, "slow", Slow},
-    {kApi, 1, "kill", Kill},       {kApi, 1, "crash", Crash},     {kApi, 1, "exit", Exit},
-    {kApi, 1, "throw", Throw},     {kApi, 1, "silent", Silent},   {kApi, 1, "error", Error},
-    {kApi, 1, "fork", Fork},       {kApi, 1, "huge", Huge},       {kApi, 1, "hungry", Hungry},
-    {nullptr, 0, nullptr, nullptr}};
+    {kApi, 1, "echo", Echo},     {kApi, 1, "inspect", Inspect}, {kApi, 1, "slow", Slow},
+    {kApi, 1, "kill", Kill},     {kApi, 1, "crash", Crash},     {kApi, 1, "exit", Exit},
+    {kApi, 1, "throw", Throw},   {kApi, 1, "silent", Silent},   {kApi, 1, "error", Error},
+    {kApi, 1, "fork", Fork},     {kApi, 1, "huge", Huge},       {kApi, 1, "hungry", Hungry},
+    {kApi, 1, "follow", Follow}, {nullptr, 0, nullptr, nullptr}};
 
 MARU::APICheckRow check_table[] = {{kApi, 1, "echo", RefuseWithoutText, {}},
                                    {kApi, 1, "inspect", Accept, {}},
@@ -152,6 +164,7 @@ MARU::APICheckRow check_table[] = {{kApi, 1, "echo", RefuseWithoutText, {}},
                                    {kApi, 1, "fork", Accept, {}},
                                    {kApi, 1, "huge", Accept, {}},
                                    {kApi, 1, "hungry", Accept, {}},
+                                   {kApi, 1, "follow", Accept, {}},
                                    {nullptr, 0, nullptr, nullptr, {}}};
 
 }  // namespace

@@ -145,8 +145,8 @@ class CallTest(WebTest):
         first, second = (self.call("inspect")[1] for _ in range(2))
         self.assertNotEqual(first["pid"], second["pid"])
         self.assertLess(first["pid"], 10000)
-        # Standard input, output, error, the request, and the folder that the method looks at.
-        self.assertLessEqual(set(first["descriptors"]), set("01234"))
+        # Standard input, output, error, the host, the request, and the folder that the method looks at.
+        self.assertLessEqual(set(first["descriptors"]), set("012345"))
         self.assertNotIn("tmp", first, "a /tmp of its own")
         self.assertEqual(first["umask"], 0o077)
         self.assertEqual((first["becomes_user"], first["euid"], first["reads_shadow"]),
@@ -175,6 +175,12 @@ class CallTest(WebTest):
         for keep in ("", "all"):
             self.assertEqual(self.call("fork", {"ms": LONG, "all": keep}), (200, "forked"))
         self.wait_until_idle()
+
+    def test_an_answer_is_not_held_up_and_what_follows_is_done(self):
+        self.assertEqual(self.call("follow"), (200, False))
+        self.assertEqual(self.call("follow", {"ms": 2000}), (200, True))
+        self.assertEqual(self.call("follow"), (200, False), "the answer came before the file")
+        wait_until(lambda: self.call("follow") == (200, True), "what follows to be done")
 
     def test_a_client_that_leaves_ends_its_request(self):
         for sent_ahead in (b"", b"GET /healthz HTTP/1.1\r\nHost: x\r\n\r\n"):
