@@ -8,10 +8,13 @@
 #include <string>
 
 #include "daemon/privilege.h"
+#include "platform/rights_cache.h"
 #include "platform/unique_fd.h"
 
 namespace maru::daemon {
 namespace {
+
+RightsCache known_rights;
 
 /// Walks from folder to folder of one share with the way to the present one kept open, so that hits
 /// in the order of their paths look at each folder once.
@@ -45,7 +48,7 @@ class Walk {
       return fstatat(folder, name.c_str(), &status, AT_SYMLINK_NOFOLLOW | AT_EMPTY_PATH) == 0;
     }
     FileRights rights;
-    return ReadFileRights(folder, name.c_str(), rights) && (RightsOf(who_, rights) & wanted);
+    return known_rights.Read(folder, name.c_str(), rights) && (RightsOf(who_, rights) & wanted);
   }
 
   /// Makes the folder ("/a/b") the present one. False when they cannot reach it.

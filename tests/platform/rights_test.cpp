@@ -1,6 +1,7 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/mount.h>
+#include <sys/stat.h>
 #include <sys/xattr.h>
 
 #include <array>
@@ -8,6 +9,7 @@
 
 #include "platform/account.h"
 #include "platform/acl.h"
+#include "platform/rights_cache.h"
 #include "platform/share_table.h"
 #include "tests/platform/support.h"
 
@@ -173,6 +175,51 @@ TEST(Rights, ReadingThemFollowsNoLink) {
   ASSERT_TRUE(maru::ReadFileRights(directory, "", rights));
   EXPECT_EQ(rights.mode, 0755);
   EXPECT_FALSE(maru::ReadFileRights(directory, "none", rights));
+  EXPECT_EQ(errno, ENOENT);
+  close(directory);
+}
+
+TEST(Rights, RememberedOnesAreThoseOfNow) {
+  const TempFolder folder;
+  const std::string file = folder.Write("file", "");
+  const int directory = open((folder / "").c_str(), O_RDONLY | O_DIRECTORY);
+  constexpr time_t kAtOnce = -1000;
+  maru::RightsCache cache(kAtOnce);
+  FileRights known, now;
+  const auto agree = [&](const char* path) {
+    EXPECT_TRUE(cache.Read(directory, path, known));
+    EXPECT_TRUE(maru::ReadFileRights(directory, path, now));
+    return known == now;
+  };
+  const auto change_time = [&] {
+    struct stat status {};
+    stat(file.c_str(), &status);
+    return std::pair(status.st_ctim.tv_sec, status.st_ctim.tv_nsec);
+  };
+  const std::string acls[] = {
+      "", Raw({{kUserObject, 6}, {kUser, 4, 60001}, {kGroupObject, 4}, {kMask, 4}, {kOther, 0}})};
+  for (int round = 0; round < 6; ++round) {
+    ASSERT_TRUE(agree("file")) << round;
+    ASSERT_TRUE(agree("file")) << round;
+    const auto before = change_time();
+    const std::string& acl = acls[(round + 1) % 2];
+    do {
+      if (acl.empty()) {
+        removexattr(file.c_str(), "system.posix_acl_access");
+        chmod(file.c_str(), 0600);
+      } else if (setxattr(file.c_str(), "system.posix_acl_access", acl.data(), acl.size(), 0) !=
+                 0) {
+        GTEST_SKIP() << "needs a file system with ACLs";
+      }
+    } while (change_time() == before);
+  }
+  folder.Write("other", "");
+  chmod((folder / "other").c_str(), 0604);
+  ASSERT_EQ(rename((folder / "other").c_str(), file.c_str()), 0);
+  EXPECT_TRUE(agree("file"));
+  EXPECT_EQ(known.mode, 0604);
+  unlink(file.c_str());
+  EXPECT_FALSE(cache.Read(directory, "file", known));
   EXPECT_EQ(errno, ENOENT);
   close(directory);
 }
