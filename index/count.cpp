@@ -1,7 +1,9 @@
 #include "index/count.h"
 
 #include <algorithm>
-#include <bit>
+#include <optional>
+#include <stdexcept>
+#include <vector>
 
 namespace maru::index {
 namespace {
@@ -11,9 +13,6 @@ using Op = Xapian::Query;
 /// A term with so many times the documents of a set is looked up for each of the set.
 constexpr std::uint64_t kMuchMore = 8;
 constexpr unsigned kPostingsBetweenLooks = 4096;
-
-/// Thrown by a query that terms do not answer.
-struct NotByTerms {};
 
 /// A set that the answer lies in.
 struct Within {
@@ -50,7 +49,7 @@ class Evaluator {
       case Op::OP_AND_NOT:
         return AddWithout(query, within, set);
       default:
-        throw NotByTerms{};
+        throw std::logic_error("a query that terms do not answer");
     }
   }
 
@@ -125,25 +124,32 @@ class Evaluator {
 
 }  // namespace
 
-std::uint64_t DocumentSet::Count() const {
-  std::uint64_t count = 0;
-  for (const std::uint64_t word : words_) count += static_cast<std::uint64_t>(std::popcount(word));
-  return count;
-}
-
-void DocumentSet::Unite(const DocumentSet& other) {
-  for (std::size_t i = 0; i < words_.size(); ++i) words_[i] |= other.words_[i];
-}
-
-std::optional<DocumentSet> Matching(const Xapian::Database& database, const Xapian::Query& query,
-                                    const std::function<void()>& look) {
-  try {
-    DocumentSet set(database.get_lastdocid());
-    Evaluator(database, look).Add(query, nullptr, set);
-    return set;
-  } catch (const NotByTerms&) {
-    return std::nullopt;
+bool IsOfTerms(const Xapian::Query& query) {
+  switch (query.get_type()) {
+    case Op::LEAF_TERM:
+    case Op::LEAF_MATCH_ALL:
+    case Op::LEAF_MATCH_NOTHING:
+    case Op::OP_SCALE_WEIGHT:
+    case Op::OP_AND_MAYBE:
+    case Op::OP_OR:
+    case Op::OP_AND:
+    case Op::OP_FILTER:
+    case Op::OP_AND_NOT:
+      break;
+    default:
+      return false;
   }
+  for (std::size_t i = 0; i < query.get_num_subqueries(); ++i) {
+    if (!IsOfTerms(query.get_subquery(i))) return false;
+  }
+  return true;
+}
+
+DocumentSet Matching(const Xapian::Database& database, const Xapian::Query& query,
+                     const std::function<void()>& look) {
+  DocumentSet set(database.get_lastdocid());
+  Evaluator(database, look).Add(query, nullptr, set);
+  return set;
 }
 
 }  // namespace maru::index

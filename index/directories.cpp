@@ -168,7 +168,7 @@ void DirectoryTable::Save(const MetadataWriter& write) {
 }
 
 Eyes::Eyes(const DirectoryTable& table, const Identity& who, DocumentId last)
-    : documents_(last / 4 + 1) {
+    : asked_(last / 64 + 1), seen_(asked_.size()) {
   readable_.resize(table.Conditions() + 1);
   std::vector<bool> traversable(readable_.size());
   for (ConditionId id = 1; id < readable_.size(); ++id) {

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <algorithm>
 #include <array>
 #include <atomic>
 #include <functional>
@@ -10,6 +11,7 @@
 #include <string_view>
 #include <vector>
 
+#include "index/document_set.h"
 #include "index/record.h"
 #include "platform/acl.h"
 
@@ -105,16 +107,28 @@ class Eyes {
   /// A document at the place that `place()` tells; asked once for each.
   template <class PlaceOf>
   bool SeesDocument(DocumentId id, PlaceOf&& place) const {
-    if (id / 4 >= documents_.size()) return false;
-    const unsigned shift = id % 4 * 2;
-    const unsigned bits = documents_[id / 4].load(std::memory_order_relaxed) >> shift;
-    if (bits & kAsked) return bits & kSeen;
+    if (id / 64 >= asked_.size()) return false;
+    const std::uint64_t bit = std::uint64_t{1} << (id % 64);
+    if (Asked(id / 64) & bit) return Seen(id / 64) & bit;
     const Place here = place();
     const bool sees = Sees(here.parent, here.condition);
-    documents_[id / 4].fetch_or(
-        static_cast<std::uint8_t>((sees ? kAsked | kSeen : kAsked) << shift),
-        std::memory_order_relaxed);
+    if (sees) seen_[id / 64].fetch_or(bit, std::memory_order_relaxed);
+    asked_[id / 64].fetch_or(bit, std::memory_order_release);
     return sees;
+  }
+  /// How many of the documents they see. `place(id)` as above, ascending.
+  template <class PlaceOf>
+  std::uint64_t CountSeen(const DocumentSet& documents, PlaceOf&& place) const {
+    const auto& words = documents.Words();
+    std::uint64_t count = 0;
+    for (std::size_t i = 0; i < std::min(words.size(), asked_.size()); ++i) {
+      const std::uint64_t known = words[i] & Asked(i);
+      count += DocumentSet::CountBits(known & Seen(i));
+      DocumentSet::ForEachBit(i, words[i] & ~known, [&](DocumentId id) {
+        count += SeesDocument(id, [&] { return place(id); });
+      });
+    }
+    return count;
   }
   bool Reaches(DirectoryId directory) const { return Bit(reachable_, directory); }
 
@@ -122,12 +136,15 @@ class Eyes {
   static bool Bit(const std::vector<bool>& bits, std::uint32_t id) {
     return id < bits.size() && bits[id];
   }
-  static constexpr unsigned kAsked = 1;
-  static constexpr unsigned kSeen = 2;
+  /// What was found out; a bit of `seen_` is valid once that of `asked_` is set.
+  std::uint64_t Asked(std::size_t word) const {
+    return asked_[word].load(std::memory_order_acquire);
+  }
+  std::uint64_t Seen(std::size_t word) const { return seen_[word].load(std::memory_order_relaxed); }
 
   std::vector<bool> reachable_, readable_;
-  /// Two bits a document: what was found out.
-  mutable std::vector<std::atomic<std::uint8_t>> documents_;
+  /// A bit a document, as in a DocumentSet.
+  mutable std::vector<std::atomic<std::uint64_t>> asked_, seen_;
 };
 
 /// The folders that lie under `top` (and `top`), as a bit an id.

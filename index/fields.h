@@ -1,5 +1,6 @@
 #pragma once
 
+#include <array>
 #include <cstdint>
 #include <span>
 #include <string>
@@ -53,6 +54,8 @@ bool IsKind(std::string_view kind);
 /// Number of kinds, and the number of each (from 0, the row of the table; kKinds for an unknown
 /// one).
 inline constexpr std::uint8_t kKinds = 8;
+/// Documents of each kind.
+using KindCounts = std::array<std::uint64_t, kKinds>;
 std::uint8_t KindNumber(std::string_view kind);
 /// The extension of a file name: what follows its last dot, lower-cased; empty without one.
 std::string ExtensionOf(std::string_view name);

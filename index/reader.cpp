@@ -1,5 +1,4 @@
 #include <algorithm>
-#include <array>
 #include <cmath>
 
 #include "index/count.h"
@@ -81,6 +80,22 @@ std::optional<Entry> Resolve(const Xapian::Database& database, std::string_view 
   return at;
 }
 
+/// The places of documents, asked for in ascending order.
+class Places {
+ public:
+  explicit Places(const Xapian::Database& database)
+      : at_(database.valuestream_begin(kPlaceSlot)), end_(database.valuestream_end(kPlaceSlot)) {}
+
+  /// None for a document that is gone.
+  Place Of(DocumentId id) {
+    if (at_ != end_) at_.skip_to(id);
+    return at_ != end_ && at_.get_docid() == id ? Place::Decode(*at_) : Place();
+  }
+
+ private:
+  Xapian::ValueIterator at_, end_;
+};
+
 /// Counts matches by kind.
 class KindSpy : public Xapian::MatchSpy {
  public:
@@ -88,11 +103,11 @@ class KindSpy : public Xapian::MatchSpy {
     const Place place = Place::Decode(document.get_value(kPlaceSlot));
     if (place.kind < kKinds) ++counts[place.kind];
   }
-  std::array<std::uint64_t, kKinds> counts{};
+  KindCounts counts{};
 };
 
 /// The kinds a filter keeps, when that is all it asks.
-std::optional<std::array<bool, kKinds>> KindsOf(const Query& filter) {
+std::optional<std::array<bool, kKinds>> KindsKept(const Query& filter) {
   std::array<bool, kKinds> kinds{};
   if (filter.kind == Query::Kind::kEverything) {
     kinds.fill(true);
@@ -104,7 +119,7 @@ std::optional<std::array<bool, kKinds>> KindsOf(const Query& filter) {
   }
   if (filter.kind != Query::Kind::kOr) return std::nullopt;
   for (const Query& part : filter.parts) {
-    const auto some = KindsOf(part);
+    const auto some = KindsKept(part);
     if (!some) return std::nullopt;
     for (std::size_t i = 0; i < kKinds; ++i) kinds[i] = kinds[i] || (*some)[i];
   }
@@ -174,30 +189,39 @@ Xapian::Query EngineReader::Compile(const Query& query, const SearchOptions& opt
   return Compiler(indices_->All(), *this, indices_->Widened()).Compile(query);
 }
 
-std::optional<std::uint64_t> EngineReader::CountOf(const Xapian::Query& compiled) const {
+void EngineReader::LookUp() const {
+  if (cancelled_ && cancelled_()) throw Cancelled{};
+}
+
+std::uint64_t EngineReader::CountOf(const Xapian::Query& compiled) const {
   if (blind_) return 0;
-  const auto look = [this] {
-    if (cancelled_ && cancelled_()) throw Cancelled{};
-  };
   std::uint64_t total = 0;
   for (std::size_t share = 0; share < indices_->Count(); ++share) {
     const Xapian::Database& database = indices_->Database(share);
-    const auto matching = Matching(database, compiled, look);
-    if (!matching) return std::nullopt;
+    const DocumentSet matching = Matching(database, compiled, [this] { LookUp(); });
     if (!eyes_[share]) {
-      total += matching->Count();
+      total += matching.Count();
       continue;
     }
-    auto value = database.valuestream_begin(kPlaceSlot);
-    matching->ForEach([&](Xapian::docid id) {
-      total += eyes_[share]->SeesDocument(id, [&] {
-        if (value != database.valuestream_end(kPlaceSlot)) value.skip_to(id);
-        const bool here = value != database.valuestream_end(kPlaceSlot) && value.get_docid() == id;
-        return here ? Place::Decode(*value) : Place();
-      });
-    });
+    Places places(database);
+    total += eyes_[share]->CountSeen(matching, [&](DocumentId id) { return places.Of(id); });
   }
   return total;
+}
+
+KindCounts EngineReader::KindsOf(const Xapian::Query& compiled) const {
+  KindCounts counts{};
+  if (blind_) return counts;
+  for (std::size_t share = 0; share < indices_->Count(); ++share) {
+    const Xapian::Database& database = indices_->Database(share);
+    Places places(database);
+    Matching(database, compiled, [this] { LookUp(); }).ForEach([&](DocumentId id) {
+      const Place place = places.Of(id);
+      const bool seen = !eyes_[share] || eyes_[share]->SeesDocument(id, [&] { return place; });
+      if (seen && place.kind < kKinds) ++counts[place.kind];
+    });
+  }
+  return counts;
 }
 
 Xapian::Enquire EngineReader::Enquire(Xapian::Query compiled, const SearchOptions& options) {
@@ -237,11 +261,14 @@ SearchResult EngineReader::Search(const Query& query, const SearchOptions& optio
     SearchResult result;
     if (indices_->Count() == 0) return result;
     const Xapian::Query compiled = Compile(query, options);
-    const auto total = CountOf(compiled);
+    const bool of_terms = IsOfTerms(compiled);
     const Xapian::MSet matches =
         Enquire(compiled, options)
-            .get_mset(options.from, options.size, total ? 0 : indices_->All().get_doccount());
-    result.total = total ? *total : matches.get_matches_estimated();
+            .get_mset(options.from, options.size, of_terms ? 0 : indices_->All().get_doccount());
+    const bool last_page = matches.size() < options.size && (options.from == 0 || !matches.empty());
+    result.total = last_page  ? options.from + matches.size()
+                   : of_terms ? CountOf(compiled)
+                              : matches.get_matches_estimated();
     result.hits.reserve(matches.size());
     for (auto match = matches.begin(); match != matches.end(); ++match) {
       Hit hit =
@@ -259,11 +286,13 @@ std::vector<std::uint64_t> EngineReader::Count(const Query& query,
   SearchOptions options;
   options.cancelled = cancelled;
   std::vector<std::optional<std::array<bool, kKinds>>> kinds;
-  for (const Query& filter : filters) kinds.push_back(KindsOf(filter));
+  for (const Query& filter : filters) kinds.push_back(KindsKept(filter));
   const auto counts = OnOneState("Cannot count", [&] {
     KindSpy spy;
     if (indices_->Count() == 0) return spy.counts;
-    Xapian::Enquire enquire = Enquire(Compile(query, options), options);
+    const Xapian::Query compiled = Compile(query, options);
+    if (IsOfTerms(compiled)) return KindsOf(compiled);
+    Xapian::Enquire enquire = Enquire(compiled, options);
     enquire.set_weighting_scheme(Xapian::BoolWeight());
     enquire.add_matchspy(&spy);
     enquire.get_mset(0, 0, indices_->All().get_doccount());

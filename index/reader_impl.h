@@ -9,6 +9,7 @@
 #include "index/codec.h"
 #include "index/compile.h"
 #include "index/engine.h"
+#include "index/fields.h"
 #include "index/library.h"
 #include "index/reader.h"
 
@@ -52,8 +53,11 @@ class EngineReader : public Reader, private Sources {
   Xapian::Query Gated(const Xapian::Query& query);
   Xapian::Query Compile(const Query& query, const SearchOptions& options);
   Xapian::Enquire Enquire(Xapian::Query compiled, const SearchOptions& options);
-  /// How many matches these eyes see; nothing for a query that only a search can count.
-  std::optional<std::uint64_t> CountOf(const Xapian::Query& compiled) const;
+  /// Throws Cancelled when nobody waits any more.
+  void LookUp() const;
+  /// How many matches of a query of terms these eyes see; the same by kind.
+  std::uint64_t CountOf(const Xapian::Query& compiled) const;
+  KindCounts KindsOf(const Xapian::Query& compiled) const;
   bool Sees(std::size_t share, const Xapian::Document& document) const;
   bool SomeDocumentSeen(const std::string& term) const;
   Hit HitOf(std::size_t share, DocumentId id, const Xapian::Document& document) const;
