@@ -108,7 +108,8 @@ std::vector<std::string> Compiler::FindExpansion(const Query& query,
   if (query.kind == Query::Kind::kPrefix) {
     return WordsWithPrefix(database_, field_prefix, word, Query::kMaxExpansion);
   }
-  std::vector<std::string> words{word};
+  std::vector<std::string> words;
+  if (database_.term_exists(TermOf(field_prefix, word))) words.push_back(word);
   if (query.exact) return words;
   for (std::string& form : Forms(word, field_prefix)) words.push_back(std::move(form));
   return words;
@@ -118,12 +119,10 @@ Xapian::Query Compiler::CompileWord(const Query& query) {
   std::vector<Xapian::Query> any;
   for (const FieldWeight& where : query.fields) {
     const Field& field = FieldOf(where.field, {FieldType::kText});
-    bool first = true;
     for (const std::string& word : Expand(query, field.prefix)) {
-      const bool other_form = !first && query.kind == Query::Kind::kWord;
+      const bool other_form = query.kind == Query::Kind::kWord && word != query.words[0];
       any.push_back(Scaled(Xapian::Query(TermOf(field.prefix, word)),
                            where.weight * (other_form ? kFormWeight : 1)));
-      first = false;
     }
   }
   return AnyOf(any);

@@ -1,5 +1,6 @@
 #include <algorithm>
 #include <cmath>
+#include <numeric>
 
 #include "index/count.h"
 #include "index/engine.h"
@@ -141,11 +142,8 @@ void EngineReader::SetEyes(const Identity& who) {
   }
 }
 
-bool EngineReader::Sees(std::size_t share, const Xapian::Document& document) const {
-  if (blind_) return false;
-  if (!eyes_[share]) return true;
-  const Place place = Place::Decode(document.get_value(kPlaceSlot));
-  return eyes_[share]->Sees(place.parent, place.condition);
+bool EngineReader::Sees(std::size_t share, const Place& place) const {
+  return !blind_ && (!eyes_[share] || eyes_[share]->Sees(place.parent, place.condition));
 }
 
 Xapian::Query EngineReader::Gated(const Xapian::Query& query) {
@@ -244,16 +242,31 @@ Xapian::Enquire EngineReader::Enquire(Xapian::Query compiled, const SearchOption
   return enquire;
 }
 
-Hit EngineReader::HitOf(std::size_t share, DocumentId id, const Xapian::Document& document) const {
+Hit EngineReader::HitOf(std::size_t share, DocumentId id, Stored stored) const {
   const DirectoryTable& table = indices_->Table(share);
-  const Place place = Place::Decode(document.get_value(kPlaceSlot));
   Hit hit;
   hit.share = share;
   hit.document = id;
-  hit.record = DecodeRecord(document.get_data());
-  hit.owner = table.Condition(place.condition).uid;
-  if (place.parent != 0) hit.path = table.PathOf(place.parent) + "/" + hit.record.name;
+  hit.record = std::move(stored.record);
+  hit.owner = table.Condition(stored.place.condition).uid;
+  const DirectoryId parent = stored.place.parent;
+  if (parent != 0) hit.path = table.PathOf(parent) + "/" + hit.record.name;
   return hit;
+}
+
+/// Documents are read in their own order, in which the engine reads each block once.
+std::vector<Hit> EngineReader::HitsOf(const Xapian::MSet& matches) const {
+  std::vector<Xapian::doccount> order(matches.size());
+  std::iota(order.begin(), order.end(), 0);
+  std::sort(order.begin(), order.end(), [&](auto a, auto b) { return *matches[a] < *matches[b]; });
+  std::vector<Hit> hits(matches.size());
+  for (const Xapian::doccount rank : order) {
+    const auto match = matches[rank];
+    hits[rank] = HitOf(indices_->ShareOf(*match), indices_->DocumentOf(*match),
+                       Stored::Decode(match.get_document().get_data()));
+    hits[rank].score = match.get_weight();
+  }
+  return hits;
 }
 
 SearchResult EngineReader::Search(const Query& query, const SearchOptions& options) {
@@ -269,13 +282,7 @@ SearchResult EngineReader::Search(const Query& query, const SearchOptions& optio
     result.total = last_page  ? options.from + matches.size()
                    : of_terms ? CountOf(compiled)
                               : matches.get_matches_estimated();
-    result.hits.reserve(matches.size());
-    for (auto match = matches.begin(); match != matches.end(); ++match) {
-      Hit hit =
-          HitOf(indices_->ShareOf(*match), indices_->DocumentOf(*match), match.get_document());
-      hit.score = match.get_weight();
-      result.hits.push_back(std::move(hit));
-    }
+    result.hits = HitsOf(matches);
     return result;
   });
 }
@@ -346,10 +353,9 @@ std::vector<MarkGroup> EngineReader::InDocument(std::size_t share, DocumentId do
 }
 
 std::vector<Fragment> EngineReader::TextFragments(std::size_t share, DocumentId document,
+                                                  const TextPlace& place,
                                                   const std::vector<MarkGroup>& groups,
                                                   const FragmentOptions& options) {
-  const auto place =
-      TextPlace::Decode(indices_->Database(share).get_document(document).get_value(kTextSlot));
   StoredText text;
   if (groups.empty() || !text.Open(indices_->Index(share).texts, place)) return {};
   // A few chunks are looked through faster than the document's list of terms.
@@ -364,11 +370,14 @@ std::vector<Fragment> EngineReader::Fragments(std::size_t share, DocumentId docu
     throw maruseeker::Error(maruseeker::kErrorBadParameter, "No fragments of " + options.field);
   }
   return OnOneState("Cannot read a text", [&]() -> std::vector<Fragment> {
-    if (!Find(share, document)) return {};
+    const auto stored = Read(share, document);
+    if (!stored) return {};
     std::vector<MarkGroup> groups = MarksOf(query);
     std::erase_if(groups, [&](const MarkGroup& group) { return group.field != options.field; });
-    if (options.field == kText) return TextFragments(share, document, groups, options);
-    const Record record = Find(share, document)->record;
+    if (options.field == kText) {
+      return TextFragments(share, document, stored->text, groups, options);
+    }
+    const Record& record = stored->record;
     std::string text = options.field == kName ? record.name : record.title;
     if (options.field == kAuthors) {
       for (const std::string& author : record.authors) text += (text.empty() ? "" : "; ") + author;
@@ -380,16 +389,22 @@ std::vector<Fragment> EngineReader::Fragments(std::size_t share, DocumentId docu
   });
 }
 
+/// Nothing for a document that is gone or these eyes do not see.
+std::optional<Stored> EngineReader::Read(std::size_t share, DocumentId document) const {
+  if (share >= indices_->Count() || document == 0) return std::nullopt;
+  try {
+    Stored stored = Stored::Decode(indices_->Database(share).get_document(document).get_data());
+    return Sees(share, stored.place) ? std::optional(std::move(stored)) : std::nullopt;
+  } catch (const Xapian::DocNotFoundError&) {
+    return std::nullopt;
+  }
+}
+
 std::optional<Hit> EngineReader::Find(std::size_t share, DocumentId document) {
   return OnOneState("Cannot read a document", [&]() -> std::optional<Hit> {
-    if (share >= indices_->Count() || document == 0) return std::nullopt;
-    try {
-      const Xapian::Document found = indices_->Database(share).get_document(document);
-      if (!Sees(share, found)) return std::nullopt;
-      return HitOf(share, document, found);
-    } catch (const Xapian::DocNotFoundError&) {
-      return std::nullopt;
-    }
+    auto stored = Read(share, document);
+    if (!stored) return std::nullopt;
+    return HitOf(share, document, std::move(*stored));
   });
 }
 

@@ -58,14 +58,16 @@ class EngineReader : public Reader, private Sources {
   /// How many matches of a query of terms these eyes see; the same by kind.
   std::uint64_t CountOf(const Xapian::Query& compiled) const;
   KindCounts KindsOf(const Xapian::Query& compiled) const;
-  bool Sees(std::size_t share, const Xapian::Document& document) const;
+  bool Sees(std::size_t share, const Place& place) const;
   bool SomeDocumentSeen(const std::string& term) const;
-  Hit HitOf(std::size_t share, DocumentId id, const Xapian::Document& document) const;
+  Hit HitOf(std::size_t share, DocumentId id, Stored stored) const;
+  std::vector<Hit> HitsOf(const Xapian::MSet& matches) const;
   const std::vector<MarkGroup>& MarksOf(const Query& query);
   std::vector<MarkGroup> InDocument(std::size_t share, DocumentId document,
                                     const std::vector<MarkGroup>& groups) const;
+  std::optional<Stored> Read(std::size_t share, DocumentId document) const;
   std::vector<Fragment> TextFragments(std::size_t share, DocumentId document,
-                                      const std::vector<MarkGroup>& groups,
+                                      const TextPlace& place, const std::vector<MarkGroup>& groups,
                                       const FragmentOptions& options);
 
   std::unique_ptr<OpenIndices> indices_;

@@ -1,5 +1,7 @@
 #include "index/record.h"
 
+#include <algorithm>
+
 namespace maru::index {
 namespace {
 
@@ -17,28 +19,8 @@ std::string Place::Encode() const {
 }
 
 Place Place::Decode(std::string_view bytes) {
-  if (bytes.size() != 9) return {};
+  if (bytes.size() != kSize) return {};
   return {Fixed32(bytes, 0), Fixed32(bytes, 4), static_cast<std::uint8_t>(bytes[8])};
-}
-
-std::string EncodeRecord(const Record& record) {
-  Encoder out;
-  out.String(record.name).Number(record.is_dir).Number(record.size).Signed(record.mtime);
-  out.String(record.title).Number(record.authors.size());
-  for (const std::string& author : record.authors) out.String(author);
-  return out.Take();
-}
-
-Record DecodeRecord(std::string_view bytes) {
-  Decoder in(bytes);
-  Record record;
-  record.name = in.String();
-  record.is_dir = in.Number() != 0;
-  record.size = in.Number();
-  record.mtime = in.Signed();
-  record.title = in.String();
-  for (std::uint64_t left = in.Number(); left > 0; --left) record.authors.emplace_back(in.String());
-  return record;
 }
 
 std::string TextPlace::Encode() const {
@@ -54,6 +36,34 @@ TextPlace TextPlace::Decode(std::string_view bytes) {
   place.offset = in.Number();
   place.length = in.Number();
   return place;
+}
+
+std::string Stored::Encode() const {
+  Encoder out;
+  out.String(text.Encode())
+      .String(record.name)
+      .Number(record.is_dir)
+      .Number(record.size)
+      .Signed(record.mtime);
+  out.String(record.title).Number(record.authors.size());
+  for (const std::string& author : record.authors) out.String(author);
+  return place.Encode() + out.Take();
+}
+
+Stored Stored::Decode(std::string_view bytes) {
+  const std::size_t split = std::min(bytes.size(), Place::kSize);
+  Decoder in(bytes.substr(split));
+  Stored stored;
+  stored.place = Place::Decode(bytes.substr(0, split));
+  stored.text = TextPlace::Decode(in.String());
+  Record& record = stored.record;
+  record.name = in.String();
+  record.is_dir = in.Number() != 0;
+  record.size = in.Number();
+  record.mtime = in.Signed();
+  record.title = in.String();
+  for (std::uint64_t left = in.Number(); left > 0; --left) record.authors.emplace_back(in.String());
+  return stored;
 }
 
 std::string EntriesKey(DirectoryId directory) {

@@ -12,20 +12,18 @@ namespace maru::index {
 /// Which rights record (see directories.h) a document has.
 using ConditionId = std::uint32_t;
 
-/// What matching looks at: value slot 0, nine bytes.
+/// Where a document lies and who may read it. What matching looks at: value slot 0.
 struct Place {
   DirectoryId parent = 0;
   ConditionId condition = 0;
   /// Row of the kinds' table in fields.h.
   std::uint8_t kind = 0;
 
+  static constexpr std::size_t kSize = 9;
+  /// kSize bytes.
   std::string Encode() const;
   static Place Decode(std::string_view bytes);
 };
-
-/// What a line of a result needs: the engine's data of a document.
-std::string EncodeRecord(const Record& record);
-Record DecodeRecord(std::string_view bytes);
 
 /// Where a document's text lies among the stored texts: value slot 1 of those that have one.
 struct TextPlace {
@@ -36,6 +34,16 @@ struct TextPlace {
   /// Empty for a length of 0.
   std::string Encode() const;
   static TextPlace Decode(std::string_view bytes);
+};
+
+/// What a line of a result and its fragments need, read in one go: the engine's data of a document.
+struct Stored {
+  Place place;
+  TextPlace text;
+  Record record;
+
+  std::string Encode() const;
+  static Stored Decode(std::string_view bytes);
 };
 
 /// Entries of folders, one behind the other, in the metadata of EntriesKey.

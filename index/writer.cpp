@@ -90,8 +90,9 @@ struct Writer::State {
     index::Place place{document.parent, table.ConditionOf(document.rights),
                        KindNumber(KindOf(document))};
     engine.add_value(kPlaceSlot, place.Encode());
-    engine.set_data(EncodeRecord({document.name, document.is_dir, document.size, document.mtime,
-                                  document.title, document.authors}));
+    const Record record{document.name,  document.is_dir, document.size,
+                        document.mtime, document.title,  document.authors};
+    engine.set_data(Stored{place, text, record}.Encode());
     engine.add_value(kTextSlot, text.Encode());
     engine.add_value(static_cast<Xapian::valueno>(FindField(kSize)->slot),
                      Xapian::sortable_serialise(static_cast<double>(document.size)));
@@ -108,7 +109,7 @@ struct Writer::State {
   }
 
   void ForgetText(DocumentId id) {
-    const TextPlace text = TextPlace::Decode(database.get_document(id).get_value(kTextSlot));
+    const TextPlace text = Stored::Decode(database.get_document(id).get_data()).text;
     std::uint64_t& live = live_texts[text.segment];
     live -= std::min(live, text.length);
   }
@@ -157,10 +158,11 @@ void Writer::State::CopyTexts(const std::vector<std::uint32_t>& segments) {
   }
   for (const DocumentId id : documents) {
     Xapian::Document engine = database.get_document(id);
-    const TextPlace text =
-        texts.Append(reader.ReadPacked(TextPlace::Decode(engine.get_value(kTextSlot))));
-    live_texts[text.segment] += text.length;
-    engine.add_value(kTextSlot, text.Encode());
+    Stored stored = Stored::Decode(engine.get_data());
+    stored.text = texts.Append(reader.ReadPacked(stored.text));
+    live_texts[stored.text.segment] += stored.text.length;
+    engine.set_data(stored.Encode());
+    engine.add_value(kTextSlot, stored.text.Encode());
     database.replace_document(id, engine);
   }
   for (const std::uint32_t segment : segments) live_texts.erase(segment);
@@ -302,17 +304,16 @@ void Writer::Update(DocumentId id, const Document& document) {
   WithEngine("Cannot write the index", [&] {
     if (state_->bulk) state_->EndBulk();
     Xapian::Document engine = state_->database.get_document(id);
-    const Record stored = DecodeRecord(engine.get_data());
-    const Place place = Place::Decode(engine.get_value(kPlaceSlot));
+    const Stored stored = Stored::Decode(engine.get_data());
     Document complete = document;
-    complete.title = stored.title;
-    complete.authors = stored.authors;
-    if (stored.name != document.name ||
-        state_->table.Condition(place.condition).uid != document.rights.uid) {
+    complete.title = stored.record.title;
+    complete.authors = stored.record.authors;
+    if (stored.record.name != document.name ||
+        state_->table.Condition(stored.place.condition).uid != document.rights.uid) {
       RemoveNameTerms(engine);
       AddNameTerms(engine, complete);
     }
-    state_->Place(engine, complete, TextPlace::Decode(engine.get_value(kTextSlot)));
+    state_->Place(engine, complete, stored.text);
     state_->database.replace_document(id, engine);
     state_->pending += 1000;
   });
