@@ -1,5 +1,6 @@
 #pragma once
 
+#include <sys/stat.h>
 #include <sys/types.h>
 
 #include <cstdint>
@@ -52,12 +53,17 @@ struct FileRights {
   /// The raw value of the attribute system.posix_acl_access; empty when the mode says all.
   std::string acl;
 
+  /// All but the ACL.
+  void TakeMode(const struct stat& status);
+
   friend auto operator<=>(const FileRights&, const FileRights&) = default;
 };
 
 /// Reads them without following a link in the last component. `path` is relative to `directory` (or
-/// AT_FDCWD); an empty path means `directory` itself. False with errno.
-bool ReadFileRights(int directory, const char* path, FileRights& rights);
+/// AT_FDCWD); an empty path means `directory` itself. `status`, when given, is the file's as it was
+/// just before. False with errno.
+bool ReadFileRights(int directory, const char* path, FileRights& rights,
+                    struct stat* status = nullptr);
 
 /// The bits (4, 2, 1) of one identity by these rights alone (the way there is not judged). A
 /// malformed ACL gives none.

@@ -111,21 +111,26 @@ bool ReadACL(int descriptor, std::string& acl) {
   return size >= 0;
 }
 
-bool ReadOpenFile(int descriptor, FileRights& rights) {
-  struct stat status;
+bool ReadOpenFile(int descriptor, FileRights& rights, struct stat& status) {
   if (fstat(descriptor, &status) != 0 || !ReadACL(descriptor, rights.acl)) return false;
-  rights.uid = status.st_uid;
-  rights.gid = status.st_gid;
-  rights.mode = static_cast<std::uint16_t>(status.st_mode & 0777);
+  rights.TakeMode(status);
   return true;
 }
 
 }  // namespace
 
-bool ReadFileRights(int directory, const char* path, FileRights& rights) {
-  if (*path == '\0') return ReadOpenFile(directory, rights);
+void FileRights::TakeMode(const struct stat& status) {
+  uid = status.st_uid;
+  gid = status.st_gid;
+  mode = static_cast<std::uint16_t>(status.st_mode & 0777);
+}
+
+bool ReadFileRights(int directory, const char* path, FileRights& rights, struct stat* status) {
+  struct stat unwanted;
+  struct stat& found = status ? *status : unwanted;
+  if (*path == '\0') return ReadOpenFile(directory, rights, found);
   const UniqueFd file(openat(directory, path, O_PATH | O_NOFOLLOW | O_CLOEXEC));
-  return file && ReadOpenFile(file.Get(), rights);
+  return file && ReadOpenFile(file.Get(), rights, found);
 }
 
 int RightsOf(const Identity& who, const FileRights& rights) {

@@ -8,34 +8,33 @@ namespace maru {
 bool RightsCache::Read(int directory, const char* path, FileRights& rights) {
   struct stat status;
   if (fstatat(directory, path, &status, AT_SYMLINK_NOFOLLOW | AT_EMPTY_PATH) != 0) return false;
-  const Key key{status.st_dev, status.st_ino, status.st_ctim};
-  if (Find(key, rights.acl)) {
-    rights.uid = status.st_uid;
-    rights.gid = status.st_gid;
-    rights.mode = static_cast<std::uint16_t>(status.st_mode & 0777);
+  if (Find(status, rights.acl)) {
+    rights.TakeMode(status);
     return true;
   }
   const time_t now = time(nullptr);
-  if (!ReadFileRights(directory, path, rights)) return false;
-  // The path may by now lead to another file, and this one may have changed.
-  struct stat after;
-  const bool same = fstatat(directory, path, &after, AT_SYMLINK_NOFOLLOW | AT_EMPTY_PATH) == 0 &&
-                    key == Key{after.st_dev, after.st_ino, after.st_ctim};
-  if (same && status.st_ctim.tv_sec + settled_seconds_ < now) Keep(key, rights.acl);
+  if (!ReadFileRights(directory, path, rights, &status)) return false;
+  if (status.st_ctim.tv_sec + settled_seconds_ < now) Keep(status, rights.acl);
   return true;
 }
 
-bool RightsCache::Find(const Key& key, std::string& acl) {
+bool RightsCache::Find(const struct stat& status, std::string& acl) {
   const std::lock_guard lock(mutex_);
-  const Slot& slot = slots_[key.inode % kSlots];
-  if (!(slot.key == key)) return false;
-  acl = slot.acl;
+  const auto found = known_.find(status.st_ino);
+  if (found == known_.end()) return false;
+  const Known& known = found->second;
+  if (known.device != status.st_dev || known.changed.tv_sec != status.st_ctim.tv_sec ||
+      known.changed.tv_nsec != status.st_ctim.tv_nsec) {
+    return false;
+  }
+  acl = known.acl;
   return true;
 }
 
-void RightsCache::Keep(const Key& key, const std::string& acl) {
+void RightsCache::Keep(const struct stat& status, const std::string& acl) {
   const std::lock_guard lock(mutex_);
-  slots_[key.inode % kSlots] = {key, acl};
+  if (known_.size() >= kMost) known_.clear();
+  known_[status.st_ino] = {status.st_dev, status.st_ctim, acl};
 }
 
 }  // namespace maru

@@ -1,9 +1,9 @@
 #pragma once
 
-#include <sys/stat.h>
+#include <time.h>
 
 #include <mutex>
-#include <vector>
+#include <unordered_map>
 
 #include "platform/acl.h"
 
@@ -16,37 +16,28 @@ class RightsCache {
  public:
   /// A file that changed less than `settled_seconds` ago is not kept: change times are coarse, and
   /// a second change may bear the same.
-  explicit RightsCache(time_t settled_seconds = 3)
-      : settled_seconds_(settled_seconds), slots_(kSlots) {}
+  explicit RightsCache(time_t settled_seconds = 3) : settled_seconds_(settled_seconds) {}
 
   /// As ReadFileRights, and as true: owner and mode are read each time, the ACL when the file has
   /// changed.
   bool Read(int directory, const char* path, FileRights& rights);
 
  private:
-  static constexpr std::size_t kSlots = 1u << 12;
-  struct Key {
+  /// About 2 MB.
+  static constexpr std::size_t kMost = 1u << 14;
+  struct Known {
     dev_t device = 0;
-    ino_t inode = 0;
     timespec changed{};
-
-    bool operator==(const Key& other) const {
-      return device == other.device && inode == other.inode &&
-             changed.tv_sec == other.changed.tv_sec && changed.tv_nsec == other.changed.tv_nsec;
-    }
-  };
-  struct Slot {
-    Key key;
     std::string acl;
   };
 
-  bool Find(const Key& key, std::string& acl);
-  void Keep(const Key& key, const std::string& acl);
+  bool Find(const struct stat& status, std::string& acl);
+  void Keep(const struct stat& status, const std::string& acl);
 
   const time_t settled_seconds_;
   std::mutex mutex_;
-  /// By inode; a newcomer takes the place of who stands there.
-  std::vector<Slot> slots_;
+  /// By inode.
+  std::unordered_map<ino_t, Known> known_;
 };
 
 }  // namespace maru
