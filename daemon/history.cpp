@@ -8,6 +8,14 @@
 
 namespace maru::daemon {
 
+void OpenHistory() {
+  try {
+    maruseeker::db::DBSession::Instance()->Open();
+  } catch (const std::exception& error) {
+    MARU_LOG("Cannot open the search history: %s", error.what());
+  }
+}
+
 std::vector<std::string> EarlierSearches(uid_t uid) {
   static std::mutex mutex;
   const std::lock_guard lock(mutex);

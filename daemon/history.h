@@ -7,6 +7,10 @@
 
 namespace maru::daemon {
 
+/// Opens the history's database and keeps it open, so that processes that write one row need not
+/// read its log first. A failure is logged; the first use tries again.
+void OpenHistory();
+
 /// Earlier searches that are looked at for suggestions.
 constexpr int kMaxEarlierSearches = 500;
 

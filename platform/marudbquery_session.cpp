@@ -16,14 +16,27 @@ constexpr std::string_view kPostgreSQL = "postgresql";
 // The longest queue of writers is far shorter; a lock held longer is a fault to report.
 constexpr const char* kBusyTimeout = "PRAGMA busy_timeout = 20000";
 
-// In pages. The first to open the database reads the whole log, and here nearly everybody is that:
-// short-lived processes, one a request.
-constexpr const char* kCheckpoint = "PRAGMA wal_autocheckpoint = 50";
+// In pages. Whoever opens the database while nobody else has it open reads the whole log; while the
+// search daemon runs, nobody has to.
+constexpr const char* kCheckpoint = "PRAGMA wal_autocheckpoint = 400";
 // The disk is waited for at checkpoints only: a power cut may cost the last few rows, never the
 // database.
 constexpr const char* kSynchronous = "PRAGMA synchronous = NORMAL";
 
+/// Most connections live for a few statements: memory laid out ahead for many costs more than it
+/// saves.
+void KeepMemorySmall() {
+  static const bool done = [] {
+    constexpr int kNone = 0;
+    sqlite_api::sqlite3_config(SQLITE_CONFIG_LOOKASIDE, kNone, kNone);
+    sqlite_api::sqlite3_config(SQLITE_CONFIG_PAGECACHE, nullptr, kNone, kNone);
+    return true;
+  }();
+  static_cast<void>(done);
+}
+
 std::unique_ptr<soci::session> Connect(std::string_view backend, const std::string& connection) {
+  if (backend == kSQLite) KeepMemorySmall();
   if (backend == kSQLite) return std::make_unique<soci::session>(soci::sqlite3, connection);
   // Loaded only where it is asked for, and by name, never from the current folder.
   static const bool registered = [] {
