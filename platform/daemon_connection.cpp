@@ -10,6 +10,7 @@
 
 #include <algorithm>
 #include <chrono>
+#include <utility>
 
 #include "platform/unique_fd.h"
 
@@ -18,7 +19,8 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 
-constexpr std::size_t kChunk = 64u << 10;
+/// About a page of hits. Every process that receives pays for memory it never had before.
+constexpr std::size_t kChunk = 16u << 10;
 
 bool Refuse(int error) {
   errno = error;
@@ -76,6 +78,7 @@ void SockConnection::Disconnect() {
   if (descriptor_ >= 0) close(descriptor_);
   descriptor_ = -1;
   received_.clear();
+  begin_ = 0;
 }
 
 bool SockConnection::Send(const std::string& message) {
@@ -102,14 +105,15 @@ bool SockConnection::Recv(std::string& message) {
   const int before = errno;
   if (descriptor_ < 0) return Refuse(ENOTCONN);
   const auto deadline = After(kReceiveTimeout);
-  for (std::size_t searched = 0;;) {
+  for (std::size_t searched = begin_;;) {
     const std::size_t end = received_.find('\n', searched);
-    if (std::min(end, received_.size()) > kMaxMessage) return Refuse(EMSGSIZE);
+    if (std::min(end, received_.size()) - begin_ > kMaxMessage) return Refuse(EMSGSIZE);
     if (end != std::string::npos) {
-      message.assign(received_, 0, end);
-      received_.erase(0, end + 1);
+      message.assign(received_, begin_, end - begin_);
+      begin_ = end + 1;
       return Done(before);
     }
+    received_.erase(0, std::exchange(begin_, 0));
     const std::size_t size = searched = received_.size();
     received_.resize(size + kChunk);
     const ssize_t count = recv(descriptor_, received_.data() + size, kChunk, 0);

@@ -33,6 +33,8 @@ class SockConnection {
 
  private:
   std::string received_;
+  /// Where in it the next message begins.
+  std::size_t begin_ = 0;
 };
 
 class DomainSockConnection : public SockConnection {

@@ -1,5 +1,7 @@
 #include "server/names.h"
 
+#include <string.h>
+
 #include <algorithm>
 #include <charconv>
 #include <cstdint>
@@ -12,9 +14,9 @@ namespace {
 /// Of an escape \uXXXX.
 constexpr std::size_t kEscapeLength = 6;
 
-/// The length of the UTF-8 character at `at` (RFC 3629: no surrogates, nothing overlong), or 0.
+/// The length of the UTF-8 character at `at`, which is not ASCII (RFC 3629: no surrogates, nothing
+/// overlong), or 0.
 std::size_t CharacterLength(const std::string& text, std::size_t at) {
-  if (static_cast<std::uint8_t>(text[at]) < 0x80) return 1;
   const auto byte = [&](std::size_t i) -> std::uint8_t {
     return at + i < text.size() ? static_cast<std::uint8_t>(text[at + i]) : 0;
   };
@@ -28,6 +30,18 @@ std::size_t CharacterLength(const std::string& text, std::size_t at) {
   }
   if ((first == 0xf0 && second < 0x90) || (first == 0xf4 && second >= 0x90)) return 0;
   return follows(2) && follows(3) ? 4 : 0;
+}
+
+/// The place of the next byte that is not ASCII, or the end; eight bytes at a time.
+std::size_t NextNonASCII(const std::string& text, std::size_t at) {
+  constexpr std::uint64_t kHighBits = 0x8080808080808080;
+  std::uint64_t eight;
+  for (; at + sizeof(eight) <= text.size(); at += sizeof(eight)) {
+    memcpy(&eight, text.data() + at, sizeof(eight));
+    if (eight & kHighBits) break;
+  }
+  while (at < text.size() && static_cast<std::uint8_t>(text[at]) < 0x80) ++at;
+  return at;
 }
 
 /// The unit of the escape \uXXXX at `at`, or nothing when there is no such escape.
@@ -48,7 +62,7 @@ bool IsWithin(std::optional<unsigned> unit, unsigned first, unsigned last) {
 std::string HideBytes(std::string text) {
   std::string result;
   std::size_t run = 0;  // the start of what is good and not yet in the result
-  for (std::size_t at = 0; at < text.size();) {
+  for (std::size_t at = 0; (at = NextNonASCII(text, at)) < text.size();) {
     const std::size_t length = CharacterLength(text, at);
     if (length > 0) {
       at += length;
