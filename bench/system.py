@@ -16,9 +16,9 @@ sys.path.insert(0, str(TOP / "tests/road"))
 
 import road  # noqa: E402  the services, as the road tests start them
 
-# Groups of processes; maruwebd's are its front, its host, and the children that are some user.
+# Groups of processes; maruwebd's first process counts as its host.
 PROGRAMS = {"maruelasticd": "daemon", "maruindexd": "indexer"}
-WEB_USERS = {"59999": "front", "0": "host"}
+WEB_GROUPS = {"maruweb-front": "front", "maruweb-request": "children"}
 INDEX = road.STATE / "index"
 
 
@@ -109,10 +109,9 @@ def processes():
         if entry.name.isdigit():
             with contextlib.suppress(OSError):
                 program_name = os.path.basename(os.readlink(entry / "exe"))
-                status = (entry / "status").read_text(encoding="utf-8")
                 if program_name == "maruwebd":
-                    user = status.split("\nUid:\t")[1].split()[1]
-                    yield int(entry.name), WEB_USERS.get(user, "children")
+                    name = (entry / "comm").read_text(encoding="utf-8").strip()
+                    yield int(entry.name), WEB_GROUPS.get(name, "host")
                 elif program_name in PROGRAMS:
                     yield int(entry.name), PROGRAMS[program_name]
 

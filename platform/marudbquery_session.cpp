@@ -7,6 +7,7 @@
 
 #include "platform/config.h"
 #include "platform/marudbquery_impl.h"
+#include "platform/process.h"
 
 namespace marudbquery {
 namespace {
@@ -198,6 +199,8 @@ constexpr const char* kPostgreSQLSchema =
 
 marudbquery::Session* DBSession::Instance() {
   static marudbquery::Session session = [] {
+    // No process forked off this one could use the connection.
+    maru::EndWithRequest(true);
     const maru::Config& config = maru::Config::Get();
     const std::string& connection = config.history_database;
     if (connection.empty()) {

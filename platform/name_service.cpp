@@ -112,29 +112,38 @@ std::optional<std::vector<gid_t>> LookUpGroupsOf(const Account& account) {
   return groups;
 }
 
+struct Answers {
+  Recent<std::string, Account> by_name;
+  Recent<uid_t, Account> by_uid;
+  Recent<std::string, gid_t> groups;
+  Recent<std::pair<std::string, gid_t>, std::vector<gid_t>> groups_of;
+};
+thread_local Answers recent;
+
 }  // namespace
 
 std::optional<Account> AccountByName(const std::string& name) {
-  thread_local Recent<std::string, Account> recent;
-  return recent.Get(name, [&] { return LookUpName(name); });
+  return recent.by_name.Get(name, [&] { return LookUpName(name); });
 }
 
 std::optional<Account> AccountByUID(uid_t uid) {
-  thread_local Recent<uid_t, Account> recent;
-  return recent.Get(uid, [&] { return LookUpUID(uid); });
+  return recent.by_uid.Get(uid, [&] { return LookUpUID(uid); });
 }
 
 std::optional<gid_t> GroupByName(const std::string& name) {
-  thread_local Recent<std::string, gid_t> recent;
-  return recent.Get(name, [&] { return LookUpGroup(name); });
+  return recent.groups.Get(name, [&] { return LookUpGroup(name); });
 }
 
 std::optional<std::vector<gid_t>> GroupsOf(const Account& account) {
-  thread_local Recent<std::pair<std::string, gid_t>, std::vector<gid_t>> recent;
   const int before = errno;
-  auto groups = recent.Get({account.name, account.gid}, [&] { return LookUpGroupsOf(account); });
+  auto groups =
+      recent.groups_of.Get({account.name, account.gid}, [&] { return LookUpGroupsOf(account); });
   if (groups) errno = before;
   return groups;
+}
+
+void ForgetAccounts() {
+  recent = Answers();
 }
 
 }  // namespace maru

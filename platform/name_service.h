@@ -7,7 +7,7 @@
 #include <string>
 #include <vector>
 
-/// Accounts and groups of the name service (NSS), without its buffers. For this room. An empty
+/// Accounts and groups of the name service (NSS), without its buffers. An empty
 /// answer leaves errno 0 when there is no such account, else what went wrong. What was found stands
 /// for kNameServiceAge.
 namespace maru {
@@ -27,5 +27,8 @@ std::optional<gid_t> GroupByName(const std::string& name);
 
 /// The account's groups, the primary one first, each once.
 std::optional<std::vector<gid_t>> GroupsOf(const Account& account);
+
+/// Everything this thread has found is asked for anew.
+void ForgetAccounts();
 
 }  // namespace maru

@@ -13,6 +13,7 @@ namespace {
 constexpr int kFollowUpNice = 10;
 
 thread_local int last_error = 0;
+bool ends_with_request = false;
 
 }  // namespace
 
@@ -37,6 +38,14 @@ void MLIBCErrSet(int code) {
 }
 
 namespace maru {
+
+void EndWithRequest(bool must) {
+  ends_with_request = must;
+}
+
+bool EndsWithRequest() {
+  return ends_with_request;
+}
 
 void GiveWay() {
   const KeepErrno keep;

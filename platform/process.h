@@ -18,6 +18,12 @@ constexpr int kErrSystem = 0x2a00;
 
 namespace maru {
 
+/// Whether this process has to end with the request that it serves: something that outlasts the
+/// request names it by its process id, or would not stand another request beside it. False at
+/// first.
+void EndWithRequest(bool must);
+bool EndsWithRequest();
+
 /// From now on the process has a low priority: nobody waits for it.
 void GiveWay();
 

@@ -2,18 +2,22 @@
 
 #include <errno.h>
 #include <fcntl.h>
+#include <poll.h>
 #include <signal.h>
 #include <sys/prctl.h>
 #include <sys/resource.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <exception>
 #include <utility>
 
 #include "common/error.h"
+#include "platform/account.h"
 #include "platform/guard.h"
 #include "platform/json.h"
 #include "platform/log.h"
+#include "platform/name_service.h"
 #include "platform/process.h"
 #include "platform/share_table.h"
 #include "server/account.h"
@@ -23,6 +27,11 @@
 
 namespace maru::server {
 namespace {
+
+/// Then a new child takes over, and what a method may have left in memory is gone.
+constexpr int kMostRequests = 1000;
+/// How soon a process that a request has left behind is reaped.
+constexpr int kReapMilliseconds = 100;
 
 #ifndef __SANITIZE_ADDRESS__
 constexpr rlim_t kMaxMemory = rlim_t{2} << 30;
@@ -51,6 +60,10 @@ bool ParseParams(const std::string& body, Json::Value& params) {
   return json::FromString(RestoreBytes(body), params) && params.isObject();
 }
 
+void Say(const Descriptor& host, char word) {
+  SendPacket(host.Get(), {&word, 1}, Wait::kNo);
+}
+
 /// Where the one answer of a request goes.
 class Reply {
  public:
@@ -70,10 +83,11 @@ class Reply {
       answer = Unknown();
     }
     const KeepErrno keep;
-    SendPacket(host_.Get(), kAnswered, Wait::kNo);
+    Say(host_, kAnswered);
     SendAnswer(front_.Get(), answer, Wait::kYes);
-    GiveWay();
   }
+
+  bool IsGiven() const { return given_; }
 
   static Answer Unknown() { return Failure(maruseeker::kErrorUnknown, Json::Value()); }
 
@@ -89,9 +103,11 @@ void RunMethod(const Plugin::Method& method, MARU::APIRequest& request, Reply& r
     if (method.check(&request, &response)) method.entry(&request, &response);
   } catch (const std::exception& exception) {
     MARU_LOG("An exception left the plug-in: %s", exception.what());
+    EndWithRequest(true);
     return reply.Give(Reply::Unknown());
   } catch (...) {
     MARU_LOG("An exception left the plug-in");
+    EndWithRequest(true);
     return reply.Give(Reply::Unknown());
   }
   if (response.IsSuccess()) return;
@@ -148,6 +164,32 @@ void WarmUp() {
   errno = 0;
 }
 
+/// Serves the request in `packet`. Not 0 when the child is not to go on: the status to end with.
+int ServeOne(const Descriptor& tasks, Packet& packet, const Plugin& plugin) {
+  const auto task = UnpackTask(packet.View());
+  const Descriptor socket = std::move(packet.passed);
+  ForgetAccounts();
+  if (!task || !socket) return 1;
+  Reply reply(socket, tasks);
+  try {
+    if (const int status = Serve(*task, socket, packet, plugin, reply)) return status;
+  } catch (const std::exception& exception) {
+    MARU_LOG("Failed to serve a request: %s", exception.what());
+    return 1;
+  }
+  return reply.IsGiven() ? 0 : 1;
+}
+
+/// Until there is a task, or nothing is left of what the requests before have forked.
+void ReapUntilAsked(const Descriptor& tasks) {
+  pollfd asked{tasks.Get(), POLLIN, 0};
+  pid_t pid;
+  do {
+    pid = waitpid(-1, nullptr, WNOHANG);
+  } while (pid > 0 || (pid == 0 && poll(&asked, 1, kReapMilliseconds) == 0));
+  errno = 0;
+}
+
 }  // namespace
 
 Descriptor KeepOnly(Descriptor kept) {
@@ -169,18 +211,14 @@ void RunRequestChild(Descriptor tasks, const Plugin& plugin) {
   ShareTable::Freeze();
   WarmUp();
   Packet packet;
-  if (ReceivePacket(tasks.Get(), packet, Wait::kYes) != ReceiveResult::kPacket) _exit(0);
-  const auto task = UnpackTask(packet.View());
-  const Descriptor socket = std::move(packet.passed);
-  if (!task || !socket) _exit(1);
-  Reply reply(socket, tasks);
-  int status = 1;
-  try {
-    status = Serve(*task, socket, packet, plugin, reply);
-  } catch (const std::exception& exception) {
-    MARU_LOG("Failed to serve a request: %s", exception.what());
+  for (int served = 0; served < kMostRequests; ++served) {
+    ReapUntilAsked(tasks);
+    if (ReceivePacket(tasks.Get(), packet, Wait::kYes) != ReceiveResult::kPacket) _exit(0);
+    if (const int status = ServeOne(tasks, packet, plugin)) _exit(status);
+    if (EndsWithRequest() || !ResetCredentialsByName("root", true)) _exit(0);
+    Say(tasks, kRequestOver);
   }
-  _exit(status);
+  _exit(0);
 }
 
 }  // namespace maru::server

@@ -1,7 +1,5 @@
 #pragma once
 
-#include <string_view>
-
 #include "server/descriptor.h"
 #include "server/plugin.h"
 
@@ -11,12 +9,15 @@ namespace maru::server {
 /// another password, so that the session is over.
 constexpr int kExitSessionOver = 77;
 
-/// What a child sends to the host before its answer goes to the front.
-constexpr std::string_view kAnswered = "a";
+/// What a child says to the host: that its answer is about to go to the front; and, if it stays for
+/// its user's next request, that this one is over.
+constexpr char kAnswered = 'a';
+constexpr char kRequestOver = 'd';
 
-/// The whole life of a request child, right after its fork: waits at `tasks` for one Task, serves
-/// it, finishes what follows the answer and ends. What the child shares with its parent it lets go
-/// of first. Never returns, and runs none of the parent's exit handlers.
+/// The whole life of a request child, right after its fork: waits at `tasks` for a Task, serves it
+/// and finishes what follows the answer, and then waits for another of the same user, unless
+/// something ties its process to that request. What the child shares with its parent it lets go of
+/// first. Never returns, and runs none of the parent's exit handlers.
 [[noreturn]] void RunRequestChild(Descriptor tasks, const Plugin& plugin);
 
 /// For any forked child: the signals as a new program expects them, and no descriptor but `kept`

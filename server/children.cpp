@@ -4,6 +4,9 @@
 #include <sys/socket.h>
 #include <sys/wait.h>
 
+#include <algorithm>
+#include <utility>
+
 #include "platform/log.h"
 #include "server/answer.h"
 #include "server/child.h"
@@ -11,7 +14,7 @@
 
 namespace maru::server {
 
-std::optional<Children::IdleChild> Children::Fork() {
+std::optional<Children::Child> Children::Fork() {
   SocketPair pair = MakeSocketPair();
   const pid_t pid = fork();
   if (pid == 0) RunRequestChild(std::move(pair.second), plugin_);
@@ -20,53 +23,92 @@ std::optional<Children::IdleChild> Children::Fork() {
     return std::nullopt;
   }
   ++forked_;
-  return IdleChild{pid, std::move(pair.first)};
+  return Child{pid, std::move(pair.first)};
 }
 
 void Children::ForkAhead(Seconds now) {
   if (auto child = Fork())
-    idle_.push_back(std::move(*child));
+    fresh_.push_back(std::move(*child));
   else
     not_before_ = now + 1;
+}
+
+void Children::Renew() {
+  fresh_.clear();
+  rested_.clear();
+  renewed_ = next_number_;
+}
+
+/// A request that was under way when a child's own ended may have read of that child's process id
+/// and be about to end it. So a child works again only when all those requests are over.
+std::optional<Children::Child> Children::TakeRested(uid_t uid) {
+  std::uint64_t oldest = next_number_;
+  for (const auto& [pid, child] : busy_) oldest = std::min(oldest, child.number);
+  // The last one first: the others may go when there is less to do.
+  const auto found = std::find_if(rested_.rbegin(), rested_.rend(), [&](const RestedChild& rested) {
+    return rested.uid == uid && rested.first <= oldest;
+  });
+  if (found == rested_.rend()) return std::nullopt;
+  Child child = std::move(found->child);
+  rested_.erase(std::prev(found.base()));
+  return child;
 }
 
 Children::Start Children::Hand(const Task& task, Descriptor& request, Seconds now) {
   if (busy_.size() >= kMaxBusy) return Start::kTooMany;
   const std::string packet = Pack(task);
   for (;;) {
-    std::optional<IdleChild> child;
-    const bool was_idle = !idle_.empty();
-    if (was_idle) {
-      child = std::move(idle_.front());
-      idle_.pop_front();
-    } else {
-      child = Fork();
+    std::optional<Child> child = TakeRested(task.uid);
+    if (!child && !fresh_.empty()) {
+      child = std::move(fresh_.front());
+      fresh_.pop_front();
     }
+    const bool waited = child.has_value();
+    if (!waited) child = Fork();
     if (!child) return Start::kFailed;
     if (SendPacket(child->tasks.Get(), packet, Wait::kNo, request.Get()) == SendResult::kDone) {
       poller_.Add(request.Get(), static_cast<Poller::Key>(child->pid), 0);
-      busy_.insert_or_assign(
-          child->pid, BusyChild{task.session_id, std::move(child->tasks), std::move(request), now});
+      busy_.insert_or_assign(child->pid,
+                             BusyChild{task.session_id, task.uid, std::move(child->tasks),
+                                       std::move(request), next_number_++, now});
       return Start::kDone;
     }
-    if (!was_idle) return Start::kFailed;
+    if (!waited) return Start::kFailed;
   }
 }
 
-bool Children::HasAnswered(const BusyChild& child) {
-  char letter;
-  return recv(child.tasks.Get(), &letter, sizeof(letter), MSG_DONTWAIT) == sizeof(letter);
+std::optional<Children::Finished> Children::Hear(pid_t pid, Seconds now) {
+  const auto found = busy_.find(pid);
+  if (found == busy_.end()) return std::nullopt;
+  BusyChild& child = found->second;
+  char said;
+  while (recv(child.tasks.Get(), &said, sizeof(said), MSG_DONTWAIT) == sizeof(said)) {
+    if (said == kRequestOver) return Rest(found, now);
+    child.answered = true;
+  }
+  if (!child.request) return std::nullopt;
+  poller_.Remove(child.request.Get());
+  child.request.Close();
+  if (child.answered)
+    poller_.Add(child.tasks.Get(), static_cast<Poller::Key>(pid), EPOLLIN);
+  else
+    kill(pid, SIGKILL);
+  return std::nullopt;
 }
 
-void Children::HangUp(pid_t pid) {
-  const auto found = busy_.find(pid);
-  if (found == busy_.end() || !found->second.request) return;
-  if (!HasAnswered(found->second)) kill(pid, SIGKILL);
-  poller_.Remove(found->second.request.Get());
-  found->second.request.Close();
+std::optional<Children::Finished> Children::Rest(Busy::iterator place, Seconds now) {
+  BusyChild& child = place->second;
+  poller_.Remove(child.request ? child.request.Get() : child.tasks.Get());
+  if (rested_.size() < kMaxRested && child.number >= renewed_)
+    rested_.push_back({{place->first, std::move(child.tasks)}, child.uid, next_number_, now});
+  Finished finished{std::move(child.session_id)};
+  busy_.erase(place);
+  return finished;
 }
 
 void Children::EndOverdue(Seconds now) {
+  std::erase_if(rested_,
+                [&](const RestedChild& rested) { return now - rested.since >= kRestSeconds; });
   for (auto& [pid, child] : busy_) {
     if (child.overdue || now - child.since < kMaxSeconds) continue;
     MARU_LOG("Request child %d has worked for %lld s and is ended", pid,
@@ -77,11 +119,12 @@ void Children::EndOverdue(Seconds now) {
 }
 
 std::optional<Children::Finished> Children::Reaped(pid_t pid, int wait_status, Seconds now) {
-  if (std::erase_if(idle_, [&](const IdleChild& child) { return child.pid == pid; })) {
+  if (std::erase_if(fresh_, [&](const Child& child) { return child.pid == pid; })) {
     MARU_LOG("Request child %d ended before it had a request (status 0x%x)", pid, wait_status);
     not_before_ = now + 1;
     return std::nullopt;
   }
+  std::erase_if(rested_, [&](const RestedChild& rested) { return rested.child.pid == pid; });
   const auto found = busy_.find(pid);
   if (found == busy_.end()) return std::nullopt;
   BusyChild& child = found->second;
@@ -91,9 +134,9 @@ std::optional<Children::Finished> Children::Reaped(pid_t pid, int wait_status, S
       MARU_LOG("Request child %d was ended by signal %d", pid, WTERMSIG(wait_status));
     SendChildEnd(child.request.Get(),
                  killed && !child.overdue ? ChildEnd::kKilled : ChildEnd::kFailed);
-    poller_.Remove(child.request.Get());
   }
-  Finished finished{child.session_id,
+  poller_.Remove(child.request ? child.request.Get() : child.tasks.Get());
+  Finished finished{std::move(child.session_id),
                     WIFEXITED(wait_status) && WEXITSTATUS(wait_status) == kExitSessionOver};
   busy_.erase(found);
   return finished;

@@ -63,6 +63,7 @@ class Host {
   void LookAtShares();
   void TakeSignals();
   void ReapAll();
+  void End(const std::optional<Children::Finished>& request);
   void TakeAsks();
   void Take(Ask ask, Descriptor request);
   void TakeSignIn(Ask& ask, Descriptor request);
@@ -117,7 +118,7 @@ void Host::Handle(const epoll_event& event) {
       TakeSignals();
       break;
     default:
-      children_.HangUp(static_cast<pid_t>(event.data.u64));
+      End(children_.Hear(static_cast<pid_t>(event.data.u64), Now()));
   }
 }
 
@@ -158,14 +159,17 @@ void Host::ReapAll() {
   pid_t pid;
   while ((pid = waitpid(-1, &status, WNOHANG)) > 0) {
     if (auto outcome = sign_ins_.Reaped(pid)) FinishSignIn(std::move(*outcome));
-    const auto finished = children_.Reaped(pid, status, Now());
-    if (!finished) continue;
-    if (Session* session = sessions_.Find(finished->session_id)) --session->running;
-    if (finished->session_over) sessions_.End(finished->session_id);
+    End(children_.Reaped(pid, status, Now()));
   }
   // When ending: nothing is left, also none of the children's own children.
   if (end_ && pid < 0) over_ = true;
   errno = 0;
+}
+
+void Host::End(const std::optional<Children::Finished>& request) {
+  if (!request) return;
+  if (Session* session = sessions_.Find(request->session_id)) --session->running;
+  if (request->session_over) sessions_.End(request->session_id);
 }
 
 void Host::TakeAsks() {
@@ -249,7 +253,7 @@ void Host::FinishSignIn(SignIns::Outcome outcome) {
 
 Answer Host::Status() const {
   Json::Value numbers;
-  numbers["children_busy"] = Json::UInt64{children_.Busy()};
+  numbers["children_busy"] = Json::UInt64{children_.AtWork()};
   numbers["children_idle"] = Json::UInt64{children_.Idle()};
   numbers["children_forked"] = Json::UInt64{children_.Forked()};
   numbers["sign_ins"] = Json::UInt64{sign_ins_.Count()};

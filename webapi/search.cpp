@@ -16,6 +16,7 @@
 #include "platform/file_index.h"
 #include "platform/json.h"
 #include "platform/preference.h"
+#include "platform/process.h"
 #include "platform/share.h"
 #include "webapi/daemon_channel.h"
 #include "webapi/param_check.h"
@@ -213,7 +214,7 @@ void SearchAPI::Search() {
     MARU_LOG("error: %.4096s", maru::json::ToString(error).c_str());
   }
   output_ = std::move(result);
-  if (!query_id_.empty()) unlink(query_info_file.c_str());
+  if (!query_id_.empty() && unlink(query_info_file.c_str()) == 0) maru::EndWithRequest(false);
 }
 
 /// Ends the older query of the same client and notes this one instead, or throws when this one is
@@ -230,6 +231,8 @@ bool SearchAPI::TakeOver(const string& query_info_file) const {
   } else {
     query_info = Json::Value(Json::objectValue);
   }
+  // The next query may kill this process, whatever it does by then.
+  maru::EndWithRequest(true);
   query_info["pid"] = getpid();
   query_info["query_serial"] = query_serial_;
   // Neither a missing file nor a process already gone is a failure that the log should name.

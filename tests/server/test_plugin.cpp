@@ -56,10 +56,12 @@ void Echo(APIRequest* request, APIResponse* response) {
   response->SetSuccess(data);
 }
 
-/// What the process of a request looks like from within.
+/// What the process of a request looks like from within; with "last", it is to end with it.
 void Inspect(APIRequest* request, APIResponse* response) {
   Json::Value data;
+  maru::EndWithRequest(!StringOf(request, "last").empty());
   data["pid"] = getpid();
+  data["euid_before"] = geteuid();
   for (const auto& entry : std::filesystem::directory_iterator("/proc/self/fd"))
     data["descriptors"].append(entry.path().filename().string());
   for (const auto& entry : std::filesystem::directory_iterator("/tmp"))

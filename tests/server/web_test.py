@@ -141,17 +141,41 @@ class CallTest(WebTest):
         status, answer = self.services.finish(older)
         self.assertEqual((status, answer["error"]), (409, {"code": 1600}))
 
+    def inspected(self, token=None, **params):
+        """What a request sees once no other is under way."""
+        self.wait_until_idle()
+        return self.call("inspect", params, token)[1]
+
     def test_a_child_is_confined(self):
-        first, second = (self.call("inspect")[1] for _ in range(2))
-        self.assertNotEqual(first["pid"], second["pid"])
-        self.assertLess(first["pid"], 10000)
-        # Standard input, output, error, the host, the request, and the folder that the method looks at.
-        self.assertLessEqual(set(first["descriptors"]), set("012345"))
-        self.assertNotIn("tmp", first, "a /tmp of its own")
-        self.assertEqual(first["umask"], 0o077)
-        self.assertEqual((first["becomes_user"], first["euid"], first["reads_shadow"]),
-                         (True, 60001, False))
-        self.assertEqual(sorted(first["shares"]), ["docs", "homes", "photo", "private"])
+        for seen in (self.inspected(), self.inspected()):
+            self.assertLess(seen["pid"], 10000)
+            # Standard input, output, error, the host, the request, and the folder that the method looks at.
+            self.assertLessEqual(set(seen["descriptors"]), set("012345"))
+            self.assertNotIn("tmp", seen, "a /tmp of its own")
+            self.assertEqual(seen["umask"], 0o077)
+            self.assertEqual((seen["euid_before"], seen["becomes_user"], seen["euid"],
+                              seen["reads_shadow"]), (0, True, 60001, False))
+            self.assertEqual(sorted(seen["shares"]), ["docs", "homes", "photo", "private"])
+
+    def test_a_child_stays_for_its_user(self):
+        first = self.inspected()["pid"]
+        self.assertEqual(self.inspected()["pid"], first)
+        self.assertNotEqual(self.inspected(self.carol)["pid"], first, "never for another")
+        self.assertEqual(self.call("throw"), (500, {"code": 117}), "by the same child")
+        second = self.inspected(last="yes")["pid"]
+        self.assertNotEqual(second, first, "what threw is not trusted again")
+        self.assertNotEqual(self.inspected()["pid"], second, "nor does one serve again that must not")
+
+    def test_a_child_rests_while_others_may_end_it(self):
+        first = self.inspected()["pid"]
+        slow = self.begin_call("slow", {"ms": LONG})
+        wait_until(lambda: self.metric("maruweb_children_busy") == 1, "the query to run")
+        second = self.call("inspect")[1]["pid"]
+        third = self.call("inspect")[1]["pid"]
+        self.assertEqual(len({first, second, third}), 3)
+        slow.close()
+        self.wait_until_idle()
+        self.assertIn(self.call("inspect")[1]["pid"], (second, third))
 
     def test_slow_requests_hold_nobody_up(self):
         slow = [self.begin_call("slow", {"ms": LONG}) for _ in range(20)]
