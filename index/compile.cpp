@@ -29,16 +29,8 @@ const Field& FieldOf(const std::string& name, std::initializer_list<FieldType> t
   return *field;
 }
 
-Xapian::Query Scaled(Xapian::Query query, double weight) {
-  return weight == 1 ? query : Xapian::Query(Xapian::Query::OP_SCALE_WEIGHT, query, weight);
-}
-
 bool ArePaired(const std::string& first, const std::string& second) {
   return IsSpacelessWord(first) && IsSpacelessWord(second);
-}
-
-Xapian::Query AnyOf(const std::vector<Xapian::Query>& queries) {
-  return Xapian::Query(Xapian::Query::OP_OR, queries.begin(), queries.end());
 }
 
 /// Words of Latin letters alone have English forms; everything else stands for itself.
@@ -115,88 +107,83 @@ std::vector<std::string> Compiler::FindExpansion(const Query& query,
   return words;
 }
 
-Xapian::Query Compiler::CompileWord(const Query& query) {
-  std::vector<Xapian::Query> any;
+Plan Compiler::CompileWord(const Query& query) {
+  std::vector<Plan> any;
   for (const FieldWeight& where : query.fields) {
     const Field& field = FieldOf(where.field, {FieldType::kText});
     for (const std::string& word : Expand(query, field.prefix)) {
       const bool other_form = query.kind == Query::Kind::kWord && word != query.words[0];
-      any.push_back(Scaled(Xapian::Query(TermOf(field.prefix, word)),
-                           where.weight * (other_form ? kFormWeight : 1)));
+      any.push_back(Plan::Term(TermOf(field.prefix, word))
+                        .Scaled(where.weight * (other_form ? kFormWeight : 1)));
     }
   }
-  return AnyOf(any);
+  return Plan(Plan::Kind::kOr, std::move(any));
 }
 
 /// The index keeps no positions of the text: it tells which documents have all the words, and the
 /// texts of those tell the rest.
-Xapian::Query Compiler::TextPhrase(const std::vector<std::string>& words) {
+Plan Compiler::TextPhrase(const std::vector<std::string>& words) {
   const std::string_view prefix = FindField(kText)->prefix;
-  std::vector<Xapian::Query> terms;
+  std::vector<Plan> terms;
   bool all_paired = words.size() > 1;
   for (std::size_t i = 0; i < words.size(); ++i) {
     const bool pairs = i > 0 && ArePaired(words[i - 1], words[i]);
     const bool paired = i + 1 < words.size() && ArePaired(words[i], words[i + 1]);
     all_paired = all_paired && (i == 0 || pairs);
-    if (pairs) terms.emplace_back(TermOf(prefix, words[i - 1] + words[i]));
-    if (!pairs && !paired) terms.emplace_back(TermOf(prefix, words[i]));
+    if (pairs) terms.push_back(Plan::Term(TermOf(prefix, words[i - 1] + words[i])));
+    if (!pairs && !paired) terms.push_back(Plan::Term(TermOf(prefix, words[i])));
   }
-  const Xapian::Query all(Xapian::Query::OP_AND, terms.begin(), terms.end());
+  Plan all = Plan(Plan::Kind::kAnd, std::move(terms));
   if (words.size() == 1 || (words.size() == 2 && all_paired)) return all;
-  return Xapian::Query(Xapian::Query::OP_FILTER, all, sources_.Phrase(words));
+  return Plan(Plan::Kind::kFilter, {std::move(all), Plan::Other(sources_.Phrase(words))});
 }
 
-Xapian::Query Compiler::CompilePhrase(const Query& query) {
-  std::vector<Xapian::Query> any;
+Plan Compiler::CompilePhrase(const Query& query) {
+  std::vector<Plan> any;
   for (const FieldWeight& where : query.fields) {
     const Field& field = FieldOf(where.field, {FieldType::kText});
     if (where.field == kText) {
-      any.push_back(Scaled(TextPhrase(query.words), where.weight));
+      any.push_back(TextPhrase(query.words).Scaled(where.weight));
       continue;
     }
     std::vector<std::string> terms;
     for (const std::string& word : query.words) terms.push_back(TermOf(field.prefix, word));
-    any.push_back(Scaled(Xapian::Query(Xapian::Query::OP_PHRASE, terms.begin(), terms.end(),
-                                       static_cast<Xapian::termcount>(terms.size())),
-                         where.weight));
+    any.push_back(Plan::Other(Xapian::Query(Xapian::Query::OP_PHRASE, terms.begin(), terms.end(),
+                                            static_cast<Xapian::termcount>(terms.size())))
+                      .Scaled(where.weight));
   }
-  return AnyOf(any);
+  return Plan(Plan::Kind::kOr, std::move(any));
 }
 
-Xapian::Query Compiler::CompileValue(const Query& query) {
+Plan Compiler::CompileValue(const Query& query) {
   const Field& field = FieldOf(query.field, {FieldType::kKeyword, FieldType::kFlag});
-  if (field.type == FieldType::kFlag) {
-    const Xapian::Query flag(TermOf(field.prefix, "1"));
-    return query.text == "1"
-               ? Scaled(flag, 0)
-               : Xapian::Query(Xapian::Query::OP_AND_NOT, Xapian::Query::MatchAll, flag);
-  }
-  return Scaled(Xapian::Query(TermOf(field.prefix, query.text)), 0);
+  if (field.type != FieldType::kFlag) return Plan::Term(TermOf(field.prefix, query.text)).Scaled(0);
+  Plan flag = Plan::Term(TermOf(field.prefix, "1")).Scaled(0);
+  if (query.text == "1") return flag;
+  return Plan(Plan::Kind::kAndNot, {Plan(Plan::Kind::kEverything, {}), std::move(flag)});
 }
 
-Xapian::Query Compiler::CompileRange(const Query& query) {
+Plan Compiler::CompileRange(const Query& query) {
   const Field& field = FieldOf(query.field, {FieldType::kNumber, FieldType::kTime});
-  if (!(query.low <= query.high)) return Xapian::Query::MatchNothing;
-  return Xapian::Query(Xapian::Query::OP_VALUE_RANGE, static_cast<Xapian::valueno>(field.slot),
-                       Xapian::sortable_serialise(query.low),
-                       Xapian::sortable_serialise(query.high));
+  if (!(query.low <= query.high)) return {};
+  return Plan::Other(
+      Xapian::Query(Xapian::Query::OP_VALUE_RANGE, static_cast<Xapian::valueno>(field.slot),
+                    Xapian::sortable_serialise(query.low), Xapian::sortable_serialise(query.high)));
 }
 
-Xapian::Query Compiler::CompileParts(const Query& query, unsigned depth) {
-  std::vector<Xapian::Query> parts;
+Plan Compiler::CompileParts(const Query& query, unsigned depth) {
+  std::vector<Plan> parts;
   for (const Query& part : query.parts) parts.push_back(Compile(part, depth + 1));
-  if (parts.empty()) return Xapian::Query::MatchNothing;
+  if (parts.empty()) return {};
   switch (query.kind) {
     case Query::Kind::kAnd:
-      return Xapian::Query(Xapian::Query::OP_AND, parts.begin(), parts.end());
+      return Plan(Plan::Kind::kAnd, std::move(parts));
     case Query::Kind::kOr:
-      return AnyOf(parts);
+      return Plan(Plan::Kind::kOr, std::move(parts));
     case Query::Kind::kAndNot:
-      if (parts.size() == 1) return parts[0];
-      return Xapian::Query(Xapian::Query::OP_AND_NOT, parts[0],
-                           Xapian::Query(Xapian::Query::OP_OR, parts.begin() + 1, parts.end()));
+      return Plan(Plan::Kind::kAndNot, std::move(parts));
     default:
-      return Xapian::Query(Xapian::Query::OP_FILTER, parts.begin(), parts.end());
+      return Plan(Plan::Kind::kFilter, std::move(parts));
   }
 }
 
@@ -206,13 +193,13 @@ void Compiler::CountNode(unsigned depth) {
   }
 }
 
-Xapian::Query Compiler::Compile(const Query& query, unsigned depth) {
+Plan Compiler::Compile(const Query& query, unsigned depth) {
   CountNode(depth);
   switch (query.kind) {
     case Query::Kind::kEverything:
-      return Xapian::Query::MatchAll;
+      return Plan(Plan::Kind::kEverything, {});
     case Query::Kind::kNothing:
-      return Xapian::Query::MatchNothing;
+      return {};
     case Query::Kind::kWord:
     case Query::Kind::kPrefix:
       if (query.words.empty()) throw BadQuery("A word is missing");
@@ -225,13 +212,13 @@ Xapian::Query Compiler::Compile(const Query& query, unsigned depth) {
     case Query::Kind::kRange:
       return CompileRange(query);
     case Query::Kind::kUnder:
-      return sources_.Under(query.text);
+      return Plan::Other(sources_.Under(query.text));
     default:
       return CompileParts(query, depth);
   }
 }
 
-Xapian::Query Compiler::Compile(const Query& query) {
+Plan Compiler::Compile(const Query& query) {
   nodes_ = 0;
   return Compile(query, 0);
 }

@@ -8,9 +8,10 @@
 #include <vector>
 
 #include "index/matcher.h"
+#include "index/plan.h"
 #include "index/query.h"
 
-/// From a query's tree to the engine's, and to the words that are marked in fragments.
+/// From a query's tree to a plan, and to the words that are marked in fragments.
 namespace maru::index {
 
 /// Makes the sources of what only the reader knows of documents. Those of Phrase look for the
@@ -48,7 +49,7 @@ class Compiler {
   Compiler(const Xapian::Database& database, Sources& sources, Expansions& expansions)
       : database_(database), sources_(sources), expansions_(expansions) {}
 
-  Xapian::Query Compile(const Query& query);
+  Plan Compile(const Query& query);
 
   /// What to mark for a query: its words, less those it excludes.
   std::vector<MarkGroup> Marks(const Query& query);
@@ -60,13 +61,13 @@ class Compiler {
                                                   const std::string& prefix, std::size_t limit);
 
  private:
-  Xapian::Query Compile(const Query& query, unsigned depth);
-  Xapian::Query CompileWord(const Query& query);
-  Xapian::Query CompilePhrase(const Query& query);
-  Xapian::Query TextPhrase(const std::vector<std::string>& words);
-  Xapian::Query CompileValue(const Query& query);
-  Xapian::Query CompileRange(const Query& query);
-  Xapian::Query CompileParts(const Query& query, unsigned depth);
+  Plan Compile(const Query& query, unsigned depth);
+  Plan CompileWord(const Query& query);
+  Plan CompilePhrase(const Query& query);
+  Plan TextPhrase(const std::vector<std::string>& words);
+  Plan CompileValue(const Query& query);
+  Plan CompileRange(const Query& query);
+  Plan CompileParts(const Query& query, unsigned depth);
   void Mark(const Query& query, unsigned depth, std::vector<MarkGroup>& groups);
   void CountNode(unsigned depth);
   const std::vector<std::string>& Expand(const Query& query, std::string_view field_prefix);

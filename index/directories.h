@@ -11,7 +11,7 @@
 #include <string_view>
 #include <vector>
 
-#include "index/document_set.h"
+#include "index/bits.h"
 #include "index/record.h"
 #include "platform/acl.h"
 
@@ -108,7 +108,7 @@ class Eyes {
   template <class PlaceOf>
   bool SeesDocument(DocumentId id, PlaceOf&& place) const {
     if (id / 64 >= asked_.size()) return false;
-    const std::uint64_t bit = std::uint64_t{1} << (id % 64);
+    const Bits bit = Bits{1} << (id % 64);
     if (Asked(id / 64) & bit) return Seen(id / 64) & bit;
     const Place here = place();
     const bool sees = Sees(here.parent, here.condition);
@@ -116,19 +116,16 @@ class Eyes {
     asked_[id / 64].fetch_or(bit, std::memory_order_release);
     return sees;
   }
-  /// How many of the documents they see. `place(id)` as above, ascending.
+  /// Those that they see of the documents of one word of bits. `place(id)` as above, ascending.
   template <class PlaceOf>
-  std::uint64_t CountSeen(const DocumentSet& documents, PlaceOf&& place) const {
-    const auto& words = documents.Words();
-    std::uint64_t count = 0;
-    for (std::size_t i = 0; i < std::min(words.size(), asked_.size()); ++i) {
-      const std::uint64_t known = words[i] & Asked(i);
-      count += DocumentSet::CountBits(known & Seen(i));
-      DocumentSet::ForEachBit(i, words[i] & ~known, [&](DocumentId id) {
-        count += SeesDocument(id, [&] { return place(id); });
-      });
-    }
-    return count;
+  Bits SeenOf(std::size_t word, Bits documents, PlaceOf&& place) const {
+    if (word >= asked_.size()) return 0;
+    const Bits asked = Asked(word);
+    Bits seen = documents & asked & Seen(word);
+    ForEachBit(word, documents & ~asked, [&](DocumentId id) {
+      if (SeesDocument(id, [&] { return place(id); })) seen |= Bits{1} << (id % 64);
+    });
+    return seen;
   }
   bool Reaches(DirectoryId directory) const { return Bit(reachable_, directory); }
 
@@ -137,14 +134,12 @@ class Eyes {
     return id < bits.size() && bits[id];
   }
   /// What was found out; a bit of `seen_` is valid once that of `asked_` is set.
-  std::uint64_t Asked(std::size_t word) const {
-    return asked_[word].load(std::memory_order_acquire);
-  }
-  std::uint64_t Seen(std::size_t word) const { return seen_[word].load(std::memory_order_relaxed); }
+  Bits Asked(std::size_t word) const { return asked_[word].load(std::memory_order_acquire); }
+  Bits Seen(std::size_t word) const { return seen_[word].load(std::memory_order_relaxed); }
 
   std::vector<bool> reachable_, readable_;
-  /// A bit a document, as in a DocumentSet.
-  mutable std::vector<std::atomic<std::uint64_t>> asked_, seen_;
+  /// Words of bits.
+  mutable std::vector<std::atomic<Bits>> asked_, seen_;
 };
 
 /// The folders that lie under `top` (and `top`), as a bit an id.

@@ -34,6 +34,8 @@ std::shared_ptr<const DirectoryTable> SharedIndex::Table(const Xapian::Database&
   if (ahead) return table;
   table_ = table;
   engine_name_ = engine_name;
+  lengths_table_ = nullptr;
+  lengths_ = nullptr;
   std::erase_if(known_, [](const Known& known) { return known.table.use_count() <= 1; });
   return table_;
 }
@@ -51,6 +53,18 @@ std::shared_ptr<const Eyes> SharedIndex::EyesOf(const std::shared_ptr<const Dire
   if (known_.size() >= kKnownEyes) known_.erase(known_.begin());
   known_.push_back({table, who, eyes});
   return eyes;
+}
+
+std::shared_ptr<const Lengths> SharedIndex::LengthsOf(
+    const std::shared_ptr<const DirectoryTable>& table, DocumentId last) {
+  const std::lock_guard lock(mutex_);
+  if (lengths_table_ == table) return lengths_;
+  auto lengths = std::make_shared<const Lengths>(last);
+  if (table == table_) {
+    lengths_table_ = table;
+    lengths_ = lengths;
+  }
+  return lengths;
 }
 
 FileIdentity FileIdentity::Of(const std::string& path) {

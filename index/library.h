@@ -11,6 +11,7 @@
 #include "index/compile.h"
 #include "index/directories.h"
 #include "index/gate.h"
+#include "index/matches.h"
 #include "index/reader.h"
 #include "index/texts.h"
 
@@ -31,6 +32,10 @@ class SharedIndex {
   std::shared_ptr<const Eyes> EyesOf(const std::shared_ptr<const DirectoryTable>& table,
                                      const Identity& who, DocumentId last);
 
+  /// Of the documents of the state that the table belongs to; those of the newest are kept.
+  std::shared_ptr<const Lengths> LengthsOf(const std::shared_ptr<const DirectoryTable>& table,
+                                           DocumentId last);
+
   TextReader texts;
 
  private:
@@ -44,6 +49,8 @@ class SharedIndex {
     std::shared_ptr<const Eyes> eyes;
   };
   std::vector<Known> known_;
+  std::shared_ptr<const DirectoryTable> lengths_table_;
+  std::shared_ptr<const Lengths> lengths_;
 };
 
 /// Tells a file from the one that took its place.
@@ -72,6 +79,10 @@ class OpenIndices {
   std::shared_ptr<const Eyes> EyesOf(std::size_t share, const Identity& who) const {
     return shares_[share].index->EyesOf(shares_[share].table, who,
                                         shares_[share].database.get_lastdocid());
+  }
+  std::shared_ptr<const Lengths> LengthsOf(std::size_t share) const {
+    return shares_[share].index->LengthsOf(shares_[share].table,
+                                           shares_[share].database.get_lastdocid());
   }
   const std::shared_ptr<const ShareNumbers>& Numbers() const { return numbers_; }
   /// Of the state the handles are at.

@@ -2,10 +2,10 @@
 #include <cmath>
 #include <numeric>
 
-#include "index/count.h"
 #include "index/engine.h"
 #include "index/fields.h"
 #include "index/fragments.h"
+#include "index/matches.h"
 #include "index/reader_impl.h"
 #include "index/tokenizer.h"
 #include "platform/file_index.h"
@@ -182,7 +182,7 @@ Xapian::Query EngineReader::Phrase(const std::vector<std::string>& words) {
   return Xapian::Query(source->release());
 }
 
-Xapian::Query EngineReader::Compile(const Query& query, const SearchOptions& options) {
+Plan EngineReader::Compile(const Query& query, const SearchOptions& options) {
   cancelled_ = options.cancelled;
   return Compiler(indices_->All(), *this, indices_->Widened()).Compile(query);
 }
@@ -191,38 +191,93 @@ void EngineReader::LookUp() const {
   if (cancelled_ && cancelled_()) throw Cancelled{};
 }
 
-std::uint64_t EngineReader::CountOf(const Xapian::Query& compiled) const {
-  if (blind_) return 0;
-  std::uint64_t total = 0;
+template <class Use>
+void EngineReader::ForEachSeen(const Plan& plan, const Weighing* weighing, Use&& use) const {
+  if (blind_) return;
+  const auto block = std::make_unique<MatchBlock>();
   for (std::size_t share = 0; share < indices_->Count(); ++share) {
     const Xapian::Database& database = indices_->Database(share);
-    const DocumentSet matching = Matching(database, compiled, [this] { LookUp(); });
-    if (!eyes_[share]) {
-      total += matching.Count();
-      continue;
-    }
+    const auto lengths = weighing ? indices_->LengthsOf(share) : nullptr;
+    Matches matches(database, plan, weighing, lengths.get());
     Places places(database);
-    total += eyes_[share]->CountSeen(matching, [&](DocumentId id) { return places.Of(id); });
+    const auto place = [&](DocumentId id) { return places.Of(id); };
+    while (matches.Next(*block)) {
+      LookUp();
+      for (std::size_t i = 0; i < MatchBlock::kWords; ++i) {
+        const std::size_t word = block->first / 64 + i;
+        const Bits bits = block->bits[i];
+        if (bits)
+          use(share, *block, i, eyes_[share] ? eyes_[share]->SeenOf(word, bits, place) : bits);
+      }
+    }
   }
+}
+
+std::uint64_t EngineReader::CountOf(const Plan& plan) const {
+  std::uint64_t total = 0;
+  ForEachSeen(plan, nullptr, [&](std::size_t, const MatchBlock&, std::size_t, Bits seen) {
+    total += CountBits(seen);
+  });
   return total;
 }
 
-KindCounts EngineReader::KindsOf(const Xapian::Query& compiled) const {
+KindCounts EngineReader::KindsOf(const Plan& plan) const {
   KindCounts counts{};
-  if (blind_) return counts;
+  std::vector<Places> places;
   for (std::size_t share = 0; share < indices_->Count(); ++share) {
-    const Xapian::Database& database = indices_->Database(share);
-    Places places(database);
-    Matching(database, compiled, [this] { LookUp(); }).ForEach([&](DocumentId id) {
-      const Place place = places.Of(id);
-      const bool seen = !eyes_[share] || eyes_[share]->SeesDocument(id, [&] { return place; });
-      if (seen && place.kind < kKinds) ++counts[place.kind];
-    });
+    places.emplace_back(indices_->Database(share));
   }
+  ForEachSeen(plan, nullptr,
+              [&](std::size_t share, const MatchBlock& block, std::size_t i, Bits seen) {
+                ForEachBit(block.first / 64 + i, seen, [&](DocumentId id) {
+                  const Place place = places[share].Of(id);
+                  if (place.kind < kKinds) ++counts[place.kind];
+                });
+              });
   return counts;
 }
 
-Xapian::Enquire EngineReader::Enquire(Xapian::Query compiled, const SearchOptions& options) {
+EngineReader::Found EngineReader::Best(const Plan& plan, const SearchOptions& options) const {
+  Found found;
+  const std::size_t wanted = std::size_t{options.from} + options.size;
+  // Of equals the first document is the better one, as for the engine.
+  const auto better = [](const Weighed& a, const Weighed& b) {
+    return a.weight != b.weight ? a.weight > b.weight : a.id < b.id;
+  };
+  std::vector<Weighed>& best = found.best;
+  const auto take = [&](const Weighed& match) {
+    if (best.size() == wanted) {
+      if (wanted == 0 || !better(match, best.front())) return;
+      std::pop_heap(best.begin(), best.end(), better);
+      best.pop_back();
+    }
+    best.push_back(match);
+    std::push_heap(best.begin(), best.end(), better);
+  };
+  const Weighing weighing(indices_->All());
+  auto boost = options.boosts.begin();
+  ForEachSeen(plan, &weighing,
+              [&](std::size_t share, const MatchBlock& block, std::size_t i, Bits seen) {
+                found.total += CountBits(seen);
+                ForEachBit(i, seen, [&](DocumentId offset) {
+                  const DocumentId id = block.first + offset;
+                  double weight = block.weights[offset];
+                  const std::pair key(share, id);
+                  while (boost != options.boosts.end() && boost->first < key) ++boost;
+                  if (boost != options.boosts.end() && boost->first == key) {
+                    weight += kBoostWeight * boost->second;
+                  }
+                  take({indices_->IdOf(share, id), weight});
+                });
+              });
+  std::sort_heap(best.begin(), best.end(), better);
+  best.erase(best.begin(), best.begin() + static_cast<std::ptrdiff_t>(
+                                              std::min<std::size_t>(options.from, best.size())));
+  return found;
+}
+
+Xapian::Enquire EngineReader::Enquire(const Plan& plan, const SearchOptions& options) {
+  Xapian::Query compiled = plan.ForEngine();
   if (!options.boosts.empty()) {
     auto boosts = std::make_shared<BoostSource::Boosts>(options.boosts);
     for (auto& [place, boost] : *boosts) boost *= kBoostWeight;
@@ -254,17 +309,31 @@ Hit EngineReader::HitOf(std::size_t share, DocumentId id, Stored stored) const {
   return hit;
 }
 
+EngineReader::Found EngineReader::Enquired(const Plan& plan, const SearchOptions& options) {
+  const bool of_terms = plan.IsOfTerms();
+  const Xapian::MSet set =
+      Enquire(plan, options)
+          .get_mset(options.from, options.size, of_terms ? 0 : indices_->All().get_doccount());
+  Found found;
+  for (auto match = set.begin(); match != set.end(); ++match) {
+    found.best.push_back({*match, match.get_weight()});
+  }
+  found.total = of_terms ? CountOf(plan) : set.get_matches_estimated();
+  return found;
+}
+
 /// Documents are read in their own order, in which the engine reads each block once.
-std::vector<Hit> EngineReader::HitsOf(const Xapian::MSet& matches) const {
-  std::vector<Xapian::doccount> order(matches.size());
+std::vector<Hit> EngineReader::HitsOf(const std::vector<Weighed>& matches) const {
+  std::vector<std::size_t> order(matches.size());
   std::iota(order.begin(), order.end(), 0);
-  std::sort(order.begin(), order.end(), [&](auto a, auto b) { return *matches[a] < *matches[b]; });
+  std::sort(order.begin(), order.end(),
+            [&](auto a, auto b) { return matches[a].id < matches[b].id; });
   std::vector<Hit> hits(matches.size());
-  for (const Xapian::doccount rank : order) {
-    const auto match = matches[rank];
-    hits[rank] = HitOf(indices_->ShareOf(*match), indices_->DocumentOf(*match),
-                       Stored::Decode(match.get_document().get_data()));
-    hits[rank].score = match.get_weight();
+  for (const std::size_t rank : order) {
+    const Xapian::docid id = matches[rank].id;
+    hits[rank] = HitOf(indices_->ShareOf(id), indices_->DocumentOf(id),
+                       Stored::Decode(indices_->All().get_document(id).get_data()));
+    hits[rank].score = matches[rank].weight;
   }
   return hits;
 }
@@ -273,16 +342,11 @@ SearchResult EngineReader::Search(const Query& query, const SearchOptions& optio
   return OnOneState("Cannot search", [&] {
     SearchResult result;
     if (indices_->Count() == 0) return result;
-    const Xapian::Query compiled = Compile(query, options);
-    const bool of_terms = IsOfTerms(compiled);
-    const Xapian::MSet matches =
-        Enquire(compiled, options)
-            .get_mset(options.from, options.size, of_terms ? 0 : indices_->All().get_doccount());
-    const bool last_page = matches.size() < options.size && (options.from == 0 || !matches.empty());
-    result.total = last_page  ? options.from + matches.size()
-                   : of_terms ? CountOf(compiled)
-                              : matches.get_matches_estimated();
-    result.hits = HitsOf(matches);
+    const Plan plan = Compile(query, options);
+    const bool by_weight = plan.IsOfTerms() && options.sort_field.empty();
+    const Found found = by_weight ? Best(plan, options) : Enquired(plan, options);
+    result.total = found.total;
+    result.hits = HitsOf(found.best);
     return result;
   });
 }
@@ -297,9 +361,9 @@ std::vector<std::uint64_t> EngineReader::Count(const Query& query,
   const auto counts = OnOneState("Cannot count", [&] {
     KindSpy spy;
     if (indices_->Count() == 0) return spy.counts;
-    const Xapian::Query compiled = Compile(query, options);
-    if (IsOfTerms(compiled)) return KindsOf(compiled);
-    Xapian::Enquire enquire = Enquire(compiled, options);
+    const Plan plan = Compile(query, options);
+    if (plan.IsOfTerms()) return KindsOf(plan);
+    Xapian::Enquire enquire = Enquire(plan, options);
     enquire.set_weighting_scheme(Xapian::BoolWeight());
     enquire.add_matchspy(&spy);
     enquire.get_mset(0, 0, indices_->All().get_doccount());

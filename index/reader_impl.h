@@ -51,17 +51,35 @@ class EngineReader : public Reader, private Sources {
 
   /// The query as these eyes may ask it.
   Xapian::Query Gated(const Xapian::Query& query);
-  Xapian::Query Compile(const Query& query, const SearchOptions& options);
-  Xapian::Enquire Enquire(Xapian::Query compiled, const SearchOptions& options);
+  Plan Compile(const Query& query, const SearchOptions& options);
+  Xapian::Enquire Enquire(const Plan& plan, const SearchOptions& options);
   /// Throws Cancelled when nobody waits any more.
   void LookUp() const;
-  /// How many matches of a query of terms these eyes see; the same by kind.
-  std::uint64_t CountOf(const Xapian::Query& compiled) const;
-  KindCounts KindsOf(const Xapian::Query& compiled) const;
+
+  /// A result: its id in all databases together.
+  struct Weighed {
+    Xapian::docid id;
+    double weight;
+  };
+  /// The best matches, best first, and how many there are in all.
+  struct Found {
+    std::vector<Weighed> best;
+    std::uint64_t total = 0;
+  };
+  /// Of a plan of terms, by weight.
+  Found Best(const Plan& plan, const SearchOptions& options) const;
+  /// Of any plan, in the order that the options ask for.
+  Found Enquired(const Plan& plan, const SearchOptions& options);
+  /// Calls `use(share, block, word of the block, those of its documents that these eyes see)` for
+  /// the matches of a plan of terms.
+  template <class Use>
+  void ForEachSeen(const Plan& plan, const Weighing* weighing, Use&& use) const;
+  std::uint64_t CountOf(const Plan& plan) const;
+  KindCounts KindsOf(const Plan& plan) const;
   bool Sees(std::size_t share, const Place& place) const;
   bool SomeDocumentSeen(const std::string& term) const;
   Hit HitOf(std::size_t share, DocumentId id, Stored stored) const;
-  std::vector<Hit> HitsOf(const Xapian::MSet& matches) const;
+  std::vector<Hit> HitsOf(const std::vector<Weighed>& matches) const;
   const std::vector<MarkGroup>& MarksOf(const Query& query);
   std::vector<MarkGroup> InDocument(std::size_t share, DocumentId document,
                                     const std::vector<MarkGroup>& groups) const;

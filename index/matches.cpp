@@ -1,0 +1,298 @@
+#include "index/matches.h"
+
+#include <algorithm>
+#include <cmath>
+#include <limits>
+#include <stdexcept>
+#include <utility>
+
+namespace maru::index {
+namespace {
+
+constexpr std::size_t kWords = MatchBlock::kWords;
+constexpr DocumentId kNone = std::numeric_limits<DocumentId>::max();
+/// A term with so many times the documents of a set is looked up for each of the set.
+constexpr std::uint64_t kMuchMore = 8;
+
+using Set = std::array<Bits, kWords>;
+
+std::uint64_t Count(const Set& set) {
+  std::uint64_t count = 0;
+  for (const Bits bits : set) count += CountBits(bits);
+  return count;
+}
+
+}  // namespace
+
+const std::uint32_t* Lengths::Of(DocumentId first, const Xapian::Database& database) const {
+  const std::size_t number = first / MatchBlock::kDocuments;
+  std::call_once(read_[number], [&] {
+    std::vector<std::uint32_t> lengths(MatchBlock::kDocuments);
+    auto at = database.postlist_begin({});
+    const auto end = database.postlist_end({});
+    if (at != end) at.skip_to(std::max<DocumentId>(first, 1));
+    for (; at != end && *at - first < MatchBlock::kDocuments; ++at) {
+      lengths[*at - first] = at.get_doclength();
+    }
+    blocks_[number] = std::move(lengths);
+  });
+  return blocks_[number].data();
+}
+
+Weighing::Weighing(const Xapian::Database& all) : all_(all), documents_(all.get_doccount()) {
+  const double average = all.get_average_length();
+  if (average > 0) per_average_ = 1 / average;
+}
+
+double Weighing::Of(const std::string& term) const {
+  const double frequency = all_.get_termfreq(term);
+  double rarity = (documents_ - frequency + 0.5) / (frequency + 0.5);
+  if (rarity < 2) rarity = rarity * 0.5 + 1;
+  return 2 * std::log(rarity);
+}
+
+/// Adds to blocks, which it is asked for in ascending order.
+class Matches::Node {
+ public:
+  /// The block that is being filled in.
+  struct Place {
+    MatchBlock& block;
+    const std::uint32_t* lengths;
+    const Weighing* weighing;
+  };
+
+  virtual ~Node() = default;
+  /// No match that has not been asked for lies before it.
+  virtual DocumentId Bound() const = 0;
+  /// Of the number of matches, from above.
+  virtual std::uint64_t Most() const = 0;
+  /// Adds the matches to `set`, only those in `within` when that is given, and weights to the
+  /// place's block, also to documents that do not match.
+  virtual void Add(const Place& place, const Set* within, Set& set) = 0;
+};
+
+namespace {
+
+using Node = Matches::Node;
+using NodePtr = std::unique_ptr<Node>;
+
+class TermNode : public Node {
+ public:
+  /// An empty term is in every document.
+  TermNode(const Xapian::Database& database, const std::string& term, double weight)
+      : at_(database.postlist_begin(term)),
+        end_(database.postlist_end(term)),
+        documents_(term.empty() ? database.get_doccount() : database.get_termfreq(term)),
+        per_block_(documents_ * MatchBlock::kDocuments / (database.get_lastdocid() + 1)),
+        weight_(weight) {
+    Look();
+  }
+
+  DocumentId Bound() const override { return id_; }
+  std::uint64_t Most() const override { return documents_; }
+
+  void Add(const Place& place, const Set* within, Set& set) override {
+    const DocumentId first = place.block.first;
+    if (id_ < first) SkipTo(first);
+    if (within && Count(*within) * kMuchMore < per_block_) {
+      for (std::size_t i = 0; i < kWords; ++i) {
+        ForEachBit(i, (*within)[i], [&](DocumentId offset) {
+          if (id_ < first + offset) SkipTo(first + offset);
+          if (id_ == first + offset) Take(place, offset, set);
+        });
+      }
+      return;
+    }
+    for (; id_ - first < MatchBlock::kDocuments; Step()) {
+      const DocumentId offset = id_ - first;
+      if (!within || (*within)[offset / 64] >> (offset % 64) & 1) Take(place, offset, set);
+    }
+  }
+
+ private:
+  void Take(const Place& place, DocumentId offset, Set& set) {
+    set[offset / 64] |= Bits{1} << (offset % 64);
+    if (weight_ == 0) return;
+    place.block.weights[offset] +=
+        weight_ * place.weighing->Part(at_.get_wdf(), place.lengths[offset]);
+  }
+  void Look() { id_ = at_ == end_ ? kNone : *at_; }
+  void Step() {
+    ++at_;
+    Look();
+  }
+  void SkipTo(DocumentId id) {
+    if (id_ == kNone) return;
+    at_.skip_to(id);
+    Look();
+  }
+
+  Xapian::PostingIterator at_, end_;
+  std::uint64_t documents_, per_block_;
+  double weight_;
+  DocumentId id_ = kNone;
+};
+
+class OrNode : public Node {
+ public:
+  explicit OrNode(std::vector<NodePtr> parts, std::vector<NodePtr> mixed)
+      : parts_(std::move(parts)), mixed_(std::move(mixed)) {
+    if (!mixed_.empty()) own_ = std::make_unique<MatchBlock>();
+  }
+
+  DocumentId Bound() const override {
+    DocumentId bound = kNone;
+    for (const auto* list : {&parts_, &mixed_}) {
+      for (const NodePtr& part : *list) bound = std::min(bound, part->Bound());
+    }
+    return bound;
+  }
+  std::uint64_t Most() const override {
+    std::uint64_t most = 0;
+    for (const auto* list : {&parts_, &mixed_}) {
+      for (const NodePtr& part : *list) most += part->Most();
+    }
+    return most;
+  }
+  void Add(const Place& place, const Set* within, Set& set) override {
+    for (const NodePtr& part : parts_) part->Add(place, within, set);
+    for (const NodePtr& part : mixed_) {
+      own_->Begin(place.block.first);
+      part->Add({*own_, place.lengths, place.weighing}, within, own_->bits);
+      for (std::size_t i = 0; i < kWords; ++i) {
+        set[i] |= own_->bits[i];
+        ForEachBit(i, own_->bits[i], [&](DocumentId offset) {
+          place.block.weights[offset] += own_->weights[offset];
+        });
+      }
+    }
+  }
+
+ private:
+  std::vector<NodePtr> parts_;
+  /// Those that weigh documents which they do not match.
+  std::vector<NodePtr> mixed_;
+  std::unique_ptr<MatchBlock> own_;
+};
+
+class AndNode : public Node {
+ public:
+  /// The rarest first, so that the others are asked about little.
+  explicit AndNode(std::vector<NodePtr> parts) : parts_(std::move(parts)) {
+    std::sort(parts_.begin(), parts_.end(),
+              [](const NodePtr& a, const NodePtr& b) { return a->Most() < b->Most(); });
+  }
+
+  DocumentId Bound() const override {
+    DocumentId bound = 0;
+    for (const NodePtr& part : parts_) bound = std::max(bound, part->Bound());
+    return bound;
+  }
+  std::uint64_t Most() const override { return parts_.front()->Most(); }
+  void Add(const Place& place, const Set* within, Set& set) override {
+    Set so_far{}, next;
+    for (const NodePtr& part : parts_) {
+      next.fill(0);
+      part->Add(place, within, next);
+      so_far = next;
+      within = &so_far;
+      if (Count(so_far) == 0) return;
+    }
+    for (std::size_t i = 0; i < kWords; ++i) set[i] |= so_far[i];
+  }
+
+ private:
+  std::vector<NodePtr> parts_;
+};
+
+class AndNotNode : public Node {
+ public:
+  AndNotNode(NodePtr wanted, NodePtr unwanted)
+      : wanted_(std::move(wanted)), unwanted_(std::move(unwanted)) {}
+
+  DocumentId Bound() const override { return wanted_->Bound(); }
+  std::uint64_t Most() const override { return wanted_->Most(); }
+  void Add(const Place& place, const Set* within, Set& set) override {
+    Set wanted{}, unwanted{};
+    wanted_->Add(place, within, wanted);
+    unwanted_->Add(place, &wanted, unwanted);
+    for (std::size_t i = 0; i < kWords; ++i) set[i] |= wanted[i] & ~unwanted[i];
+  }
+
+ private:
+  NodePtr wanted_, unwanted_;
+};
+
+class Builder {
+ public:
+  Builder(const Xapian::Database& database, const Weighing* weighing)
+      : database_(database), weighing_(weighing) {}
+
+  NodePtr Build(const Plan& plan, double factor) const {
+    factor *= plan.factor;
+    switch (plan.kind) {
+      case Plan::Kind::kNothing:
+        return Any({}, factor);
+      case Plan::Kind::kEverything:
+        return std::make_unique<TermNode>(database_, std::string(), 0);
+      case Plan::Kind::kTerm:
+        return std::make_unique<TermNode>(
+            database_, plan.term, weighing_ && factor != 0 ? factor * weighing_->Of(plan.term) : 0);
+      case Plan::Kind::kOr:
+        return Any(plan.parts, factor);
+      case Plan::Kind::kAnd:
+        return All(plan.parts, factor, factor);
+      case Plan::Kind::kFilter:
+        return All(plan.parts, factor, 0);
+      case Plan::Kind::kAndNot:
+        return std::make_unique<AndNotNode>(Build(plan.parts.at(0), factor),
+                                            Any({plan.parts.begin() + 1, plan.parts.end()}, 0));
+      case Plan::Kind::kOther:
+        break;
+    }
+    throw std::logic_error("a plan that terms do not answer");
+  }
+
+ private:
+  NodePtr Any(const std::vector<Plan>& plans, double factor) const {
+    std::vector<NodePtr> parts, mixed;
+    for (const Plan& plan : plans) {
+      const bool simple = plan.kind == Plan::Kind::kTerm || plan.kind == Plan::Kind::kOr;
+      (simple || factor == 0 ? parts : mixed).push_back(Build(plan, factor));
+    }
+    return std::make_unique<OrNode>(std::move(parts), std::move(mixed));
+  }
+  NodePtr All(const std::vector<Plan>& plans, double first, double others) const {
+    std::vector<NodePtr> parts;
+    for (const Plan& plan : plans) parts.push_back(Build(plan, parts.empty() ? first : others));
+    if (parts.empty()) return Any({}, 0);
+    return std::make_unique<AndNode>(std::move(parts));
+  }
+
+  const Xapian::Database& database_;
+  const Weighing* weighing_;
+};
+
+}  // namespace
+
+Matches::Matches(const Xapian::Database& database, const Plan& plan, const Weighing* weighing,
+                 const Lengths* lengths)
+    : database_(database),
+      weighing_(weighing),
+      lengths_(lengths),
+      root_(Builder(database, weighing).Build(plan, 1)),
+      last_(database.get_lastdocid()) {}
+
+Matches::~Matches() = default;
+
+bool Matches::Next(MatchBlock& block) {
+  const DocumentId bound = std::max(root_->Bound(), next_);
+  if (bound > last_) return false;
+  block.Begin(bound / MatchBlock::kDocuments * MatchBlock::kDocuments);
+  next_ = block.first + MatchBlock::kDocuments;
+  const std::uint32_t* lengths = weighing_ ? lengths_->Of(block.first, database_) : nullptr;
+  root_->Add({block, lengths, weighing_}, nullptr, block.bits);
+  return true;
+}
+
+}  // namespace maru::index
