@@ -24,24 +24,19 @@ std::uint64_t Count(const Set& set) {
 
 }  // namespace
 
-const std::uint32_t* Lengths::Of(DocumentId first, const Xapian::Database& database) const {
+const double* Lengths::Of(DocumentId first, const Xapian::Database& database) const {
   const std::size_t number = first / MatchBlock::kDocuments;
   std::call_once(read_[number], [&] {
-    std::vector<std::uint32_t> lengths(MatchBlock::kDocuments);
+    std::vector<double> lengths(MatchBlock::kDocuments);
     auto at = database.postlist_begin({});
     const auto end = database.postlist_end({});
     if (at != end) at.skip_to(std::max<DocumentId>(first, 1));
     for (; at != end && *at - first < MatchBlock::kDocuments; ++at) {
-      lengths[*at - first] = at.get_doclength();
+      lengths[*at - first] = std::max(at.get_doclength() / average_, 0.5) * 0.5 + 0.5;
     }
     blocks_[number] = std::move(lengths);
   });
   return blocks_[number].data();
-}
-
-Weighing::Weighing(const Xapian::Database& all) : all_(all), documents_(all.get_doccount()) {
-  const double average = all.get_average_length();
-  if (average > 0) per_average_ = 1 / average;
 }
 
 double Weighing::Of(const std::string& term) const {
@@ -57,8 +52,7 @@ class Matches::Node {
   /// The block that is being filled in.
   struct Place {
     MatchBlock& block;
-    const std::uint32_t* lengths;
-    const Weighing* weighing;
+    const double* lengths;
   };
 
   virtual ~Node() = default;
@@ -113,8 +107,8 @@ class TermNode : public Node {
   void Take(const Place& place, DocumentId offset, Set& set) {
     set[offset / 64] |= Bits{1} << (offset % 64);
     if (weight_ == 0) return;
-    place.block.weights[offset] +=
-        weight_ * place.weighing->Part(at_.get_wdf(), place.lengths[offset]);
+    const double count = at_.get_wdf();
+    place.block.weights[offset] += weight_ * count / (place.lengths[offset] + count);
   }
   void Look() { id_ = at_ == end_ ? kNone : *at_; }
   void Step() {
@@ -158,7 +152,7 @@ class OrNode : public Node {
     for (const NodePtr& part : parts_) part->Add(place, within, set);
     for (const NodePtr& part : mixed_) {
       own_->Begin(place.block.first);
-      part->Add({*own_, place.lengths, place.weighing}, within, own_->bits);
+      part->Add({*own_, place.lengths}, within, own_->bits);
       for (std::size_t i = 0; i < kWords; ++i) {
         set[i] |= own_->bits[i];
         ForEachBit(i, own_->bits[i], [&](DocumentId offset) {
@@ -278,7 +272,6 @@ class Builder {
 Matches::Matches(const Xapian::Database& database, const Plan& plan, const Weighing* weighing,
                  const Lengths* lengths)
     : database_(database),
-      weighing_(weighing),
       lengths_(lengths),
       root_(Builder(database, weighing).Build(plan, 1)),
       last_(database.get_lastdocid()) {}
@@ -290,8 +283,8 @@ bool Matches::Next(MatchBlock& block) {
   if (bound > last_) return false;
   block.Begin(bound / MatchBlock::kDocuments * MatchBlock::kDocuments);
   next_ = block.first + MatchBlock::kDocuments;
-  const std::uint32_t* lengths = weighing_ ? lengths_->Of(block.first, database_) : nullptr;
-  root_->Add({block, lengths, weighing_}, nullptr, block.bits);
+  root_->Add({block, lengths_ ? lengths_->Of(block.first, database_) : nullptr}, nullptr,
+             block.bits);
   return true;
 }
 

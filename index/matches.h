@@ -2,7 +2,6 @@
 
 #include <xapian.h>
 
-#include <algorithm>
 #include <array>
 #include <cstddef>
 #include <cstdint>
@@ -36,19 +35,24 @@ struct MatchBlock {
   }
 };
 
-/// How many words each document of one database has, at one state; read when asked for.
-/// Thread-safe.
+/// How long the documents of one database are at one state, as the weighing needs it; read when
+/// asked for. Thread-safe.
 class Lengths {
  public:
-  explicit Lengths(DocumentId last)
-      : blocks_(last / MatchBlock::kDocuments + 1),
+  /// `average` is that of all databases that are searched together, in words.
+  Lengths(DocumentId last, double average)
+      : average_(average),
+        blocks_(last / MatchBlock::kDocuments + 1),
         read_(std::make_unique<std::once_flag[]>(blocks_.size())) {}
 
-  /// Those of the block from `first` on; `database` is at that state.
-  const std::uint32_t* Of(DocumentId first, const Xapian::Database& database) const;
+  double Average() const { return average_; }
+  /// What the count of a term is set against, for each document of the block from `first` on;
+  /// `database` is at that state.
+  const double* Of(DocumentId first, const Xapian::Database& database) const;
 
  private:
-  mutable std::vector<std::vector<std::uint32_t>> blocks_;
+  const double average_;
+  mutable std::vector<std::vector<double>> blocks_;
   std::unique_ptr<std::once_flag[]> read_;
 };
 
@@ -57,20 +61,14 @@ class Lengths {
 class Weighing {
  public:
   /// `all` are the databases that are searched together.
-  explicit Weighing(const Xapian::Database& all);
+  explicit Weighing(const Xapian::Database& all) : all_(all), documents_(all.get_doccount()) {}
 
   /// What a document could at most get for the term.
   double Of(const std::string& term) const;
-  /// The part of it that a document of `length` words with so many of the term gets.
-  double Part(std::uint32_t count, std::uint32_t length) const {
-    const double normal = std::max(length * per_average_, 0.5) * 0.5 + 0.5;
-    return count / (normal + count);
-  }
 
  private:
   const Xapian::Database& all_;
   double documents_;
-  double per_average_ = 0;
 };
 
 /// The matches of a plan of terms in one database.
@@ -89,7 +87,6 @@ class Matches {
 
  private:
   const Xapian::Database& database_;
-  const Weighing* weighing_;
   const Lengths* lengths_;
   std::unique_ptr<Node> root_;
   DocumentId last_;
