@@ -1,6 +1,7 @@
 #include "daemon/hit.h"
 
 #include <algorithm>
+#include <cmath>
 #include <limits>
 
 namespace maru::daemon {
@@ -69,7 +70,7 @@ Json::Value HitMessage(const Place& place, const Hit& hit,
   message[std::string(index::kOwner)] = std::to_string(hit.owner);
   message["doc_id"] = hit.document;
   message["id"] = place.id;
-  message["score"] = hit.score;
+  message["score"] = Json::Int64{std::llround(hit.score * 1000)};
   return message;
 }
 

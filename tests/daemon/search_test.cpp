@@ -30,7 +30,7 @@ TEST_F(SearchTest, AnswersTotalThenHitsThenSuccess) {
   EXPECT_EQ(json::ToString(messages[0]), R"({"total":1})");
   EXPECT_EQ(json::ToString(messages[2]), R"({"success":true})");
   Json::Value hit = messages[1];
-  EXPECT_GT(hit["score"].asDouble(), 0);
+  EXPECT_GT(hit["score"].asInt64(), 0);
   hit.removeMember("score");
   EXPECT_TRUE(hit["doc_id"].isUInt());
   hit.removeMember("doc_id");
