@@ -117,6 +117,7 @@ Plan Compiler::CompileWord(const Query& query) {
                         .Scaled(where.weight * (other_form ? kFormWeight : 1)));
     }
   }
+  if ((terms_ += any.size()) > Query::kMaxTerms) throw BadQuery("The query is too large");
   return Plan(Plan::Kind::kOr, std::move(any));
 }
 
@@ -220,6 +221,7 @@ Plan Compiler::Compile(const Query& query, unsigned depth) {
 
 Plan Compiler::Compile(const Query& query) {
   nodes_ = 0;
+  terms_ = 0;
   return Compile(query, 0);
 }
 

@@ -78,6 +78,7 @@ class Compiler {
   Sources& sources_;
   Expansions& expansions_;
   unsigned nodes_ = 0;
+  std::size_t terms_ = 0;
 };
 
 }  // namespace maru::index

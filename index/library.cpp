@@ -56,10 +56,10 @@ std::shared_ptr<const Eyes> SharedIndex::EyesOf(const std::shared_ptr<const Dire
 }
 
 std::shared_ptr<const Lengths> SharedIndex::LengthsOf(
-    const std::shared_ptr<const DirectoryTable>& table, DocumentId last, double average) {
+    const std::shared_ptr<const DirectoryTable>& table, DocumentId last) {
   const std::lock_guard lock(mutex_);
-  if (lengths_table_ == table && lengths_->Average() == average) return lengths_;
-  auto lengths = std::make_shared<const Lengths>(last, average);
+  if (lengths_table_ == table) return lengths_;
+  auto lengths = std::make_shared<const Lengths>(last);
   if (table == table_) {
     lengths_table_ = table;
     lengths_ = lengths;

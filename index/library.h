@@ -32,9 +32,9 @@ class SharedIndex {
   std::shared_ptr<const Eyes> EyesOf(const std::shared_ptr<const DirectoryTable>& table,
                                      const Identity& who, DocumentId last);
 
-  /// Of the documents of the state that the table belongs to; the last ones of the newest are kept.
+  /// Of the documents of the state that the table belongs to; those of the newest are kept.
   std::shared_ptr<const Lengths> LengthsOf(const std::shared_ptr<const DirectoryTable>& table,
-                                           DocumentId last, double average);
+                                           DocumentId last);
 
   TextReader texts;
 
@@ -81,8 +81,8 @@ class OpenIndices {
                                         shares_[share].database.get_lastdocid());
   }
   std::shared_ptr<const Lengths> LengthsOf(std::size_t share) const {
-    return shares_[share].index->LengthsOf(
-        shares_[share].table, shares_[share].database.get_lastdocid(), all_.get_average_length());
+    return shares_[share].index->LengthsOf(shares_[share].table,
+                                           shares_[share].database.get_lastdocid());
   }
   const std::shared_ptr<const ShareNumbers>& Numbers() const { return numbers_; }
   /// Of the state the handles are at.

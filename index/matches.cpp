@@ -14,6 +14,10 @@ constexpr DocumentId kNone = std::numeric_limits<DocumentId>::max();
 /// A term with so many times the documents of a set is looked up for each of the set.
 constexpr std::uint64_t kMuchMore = 8;
 
+constexpr std::size_t kPartsBetweenLooks = 64;
+/// Where a block may have so many matches, all its lengths are looked at together.
+constexpr std::uint64_t kManyMatches = 256;
+
 using Set = std::array<Bits, kWords>;
 
 std::uint64_t Count(const Set& set) {
@@ -24,26 +28,36 @@ std::uint64_t Count(const Set& set) {
 
 }  // namespace
 
-const double* Lengths::Of(DocumentId first, const Xapian::Database& database) const {
+const std::uint32_t* Lengths::Of(DocumentId first, const Xapian::Database& database) const {
   const std::size_t number = first / MatchBlock::kDocuments;
-  std::call_once(read_[number], [&] {
-    std::vector<double> lengths(MatchBlock::kDocuments);
-    auto at = database.postlist_begin({});
-    const auto end = database.postlist_end({});
-    if (at != end) at.skip_to(std::max<DocumentId>(first, 1));
-    for (; at != end && *at - first < MatchBlock::kDocuments; ++at) {
-      lengths[*at - first] = std::max(at.get_doclength() / average_, 0.5) * 0.5 + 0.5;
-    }
+  if (read_[number].load(std::memory_order_acquire)) return blocks_[number].data();
+  std::vector<std::uint32_t> lengths(MatchBlock::kDocuments);
+  auto at = database.postlist_begin({});
+  const auto end = database.postlist_end({});
+  if (at != end) at.skip_to(std::max<DocumentId>(first, 1));
+  for (; at != end && *at - first < MatchBlock::kDocuments; ++at) {
+    lengths[*at - first] = at.get_doclength();
+  }
+  const std::lock_guard lock(mutex_);
+  if (!read_[number].load(std::memory_order_relaxed)) {
     blocks_[number] = std::move(lengths);
-  });
+    read_[number].store(true, std::memory_order_release);
+  }
   return blocks_[number].data();
 }
 
+Weighing::Weighing(const Xapian::Database& all) : all_(all), documents_(all.get_doccount()) {
+  const double average = all.get_average_length();
+  if (average > 0) per_average_ = 1 / average;
+}
+
 double Weighing::Of(const std::string& term) const {
+  const auto known = known_.find(term);
+  if (known != known_.end()) return known->second;
   const double frequency = all_.get_termfreq(term);
   double rarity = (documents_ - frequency + 0.5) / (frequency + 0.5);
   if (rarity < 2) rarity = rarity * 0.5 + 1;
-  return 2 * std::log(rarity);
+  return known_[term] = 2 * std::log(rarity);
 }
 
 /// Adds to blocks, which it is asked for in ascending order.
@@ -52,7 +66,10 @@ class Matches::Node {
   /// The block that is being filled in.
   struct Place {
     MatchBlock& block;
-    const double* lengths;
+    const Weighing* weighing;
+    /// For each document what counts are set against; null where few may match.
+    const double* against;
+    const std::function<void()>& look;
   };
 
   virtual ~Node() = default;
@@ -108,7 +125,9 @@ class TermNode : public Node {
     set[offset / 64] |= Bits{1} << (offset % 64);
     if (weight_ == 0) return;
     const double count = at_.get_wdf();
-    place.block.weights[offset] += weight_ * count / (place.lengths[offset] + count);
+    const double against =
+        place.against ? place.against[offset] : place.weighing->Against(at_.get_doclength());
+    place.block.weights[offset] += weight_ * count / (against + count);
   }
   void Look() { id_ = at_ == end_ ? kNone : *at_; }
   void Step() {
@@ -149,10 +168,13 @@ class OrNode : public Node {
     return most;
   }
   void Add(const Place& place, const Set* within, Set& set) override {
-    for (const NodePtr& part : parts_) part->Add(place, within, set);
+    for (std::size_t i = 0; i < parts_.size(); ++i) {
+      if (i % kPartsBetweenLooks == 0) place.look();
+      parts_[i]->Add(place, within, set);
+    }
     for (const NodePtr& part : mixed_) {
       own_->Begin(place.block.first);
-      part->Add({*own_, place.lengths}, within, own_->bits);
+      part->Add({*own_, place.weighing, place.against, place.look}, within, own_->bits);
       for (std::size_t i = 0; i < kWords; ++i) {
         set[i] |= own_->bits[i];
         ForEachBit(i, own_->bits[i], [&](DocumentId offset) {
@@ -219,8 +241,9 @@ class AndNotNode : public Node {
 
 class Builder {
  public:
-  Builder(const Xapian::Database& database, const Weighing* weighing)
-      : database_(database), weighing_(weighing) {}
+  Builder(const Xapian::Database& database, const Weighing* weighing,
+          const std::function<void()>& look)
+      : database_(database), weighing_(weighing), look_(look) {}
 
   NodePtr Build(const Plan& plan, double factor) const {
     factor *= plan.factor;
@@ -248,9 +271,14 @@ class Builder {
   }
 
  private:
+  NodePtr Term(const std::string& term, double factor) const {
+    const bool weighs = weighing_ && factor != 0 && database_.term_exists(term);
+    return std::make_unique<TermNode>(database_, term, weighs ? factor * weighing_->Of(term) : 0);
+  }
   NodePtr Any(const std::vector<Plan>& plans, double factor) const {
     std::vector<NodePtr> parts, mixed;
     for (const Plan& plan : plans) {
+      if (parts.size() % kPartsBetweenLooks == 0) look_();
       const bool simple = plan.kind == Plan::Kind::kTerm || plan.kind == Plan::Kind::kOr;
       (simple || factor == 0 ? parts : mixed).push_back(Build(plan, factor));
     }
@@ -265,25 +293,37 @@ class Builder {
 
   const Xapian::Database& database_;
   const Weighing* weighing_;
+  const std::function<void()>& look_;
 };
 
 }  // namespace
 
 Matches::Matches(const Xapian::Database& database, const Plan& plan, const Weighing* weighing,
-                 const Lengths* lengths)
+                 const Lengths* lengths, const std::function<void()>& look)
     : database_(database),
+      weighing_(weighing),
       lengths_(lengths),
-      root_(Builder(database, weighing).Build(plan, 1)),
-      last_(database.get_lastdocid()) {}
+      look_(look),
+      root_(Builder(database, weighing, look).Build(plan, 1)),
+      last_(database.get_lastdocid()) {
+  const bool many = root_->Most() * MatchBlock::kDocuments > kManyMatches * (last_ + 1ull);
+  if (weighing_ && many) against_.resize(MatchBlock::kDocuments);
+}
 
 Matches::~Matches() = default;
 
 bool Matches::Next(MatchBlock& block) {
   const DocumentId bound = std::max(root_->Bound(), next_);
   if (bound > last_) return false;
+  look_();
   block.Begin(bound / MatchBlock::kDocuments * MatchBlock::kDocuments);
   next_ = block.first + MatchBlock::kDocuments;
-  root_->Add({block, lengths_ ? lengths_->Of(block.first, database_) : nullptr}, nullptr,
+  if (!against_.empty()) {
+    const std::uint32_t* lengths = lengths_->Of(block.first, database_);
+    std::transform(lengths, lengths + MatchBlock::kDocuments, against_.begin(),
+                   [&](std::uint32_t length) { return weighing_->Against(length); });
+  }
+  root_->Add({block, weighing_, against_.empty() ? nullptr : against_.data(), look_}, nullptr,
              block.bits);
   return true;
 }

@@ -2,12 +2,16 @@
 
 #include <xapian.h>
 
+#include <algorithm>
 #include <array>
+#include <atomic>
 #include <cstddef>
 #include <cstdint>
+#include <functional>
 #include <memory>
 #include <mutex>
 #include <string>
+#include <unordered_map>
 #include <vector>
 
 #include "index/bits.h"
@@ -35,49 +39,51 @@ struct MatchBlock {
   }
 };
 
-/// How long the documents of one database are at one state, as the weighing needs it; read when
-/// asked for. Thread-safe.
+/// How many words each document of one database has, at one state; read when asked for.
+/// Thread-safe.
 class Lengths {
  public:
-  /// `average` is that of all databases that are searched together, in words.
-  Lengths(DocumentId last, double average)
-      : average_(average),
-        blocks_(last / MatchBlock::kDocuments + 1),
-        read_(std::make_unique<std::once_flag[]>(blocks_.size())) {}
+  explicit Lengths(DocumentId last)
+      : blocks_(last / MatchBlock::kDocuments + 1), read_(blocks_.size()) {}
 
-  double Average() const { return average_; }
-  /// What the count of a term is set against, for each document of the block from `first` on;
-  /// `database` is at that state.
-  const double* Of(DocumentId first, const Xapian::Database& database) const;
+  /// Those of the block from `first` on; `database` is at that state.
+  const std::uint32_t* Of(DocumentId first, const Xapian::Database& database) const;
 
  private:
-  const double average_;
-  mutable std::vector<std::vector<double>> blocks_;
-  std::unique_ptr<std::once_flag[]> read_;
+  mutable std::mutex mutex_;
+  mutable std::vector<std::vector<std::uint32_t>> blocks_;
+  /// Which of them stand.
+  mutable std::vector<std::atomic<bool>> read_;
 };
 
 /// Weighs terms as the engine does by default: BM25 with k1 = 1, k3 = 1, b = 0.5 and lengths of at
-/// least half the average. Robertson et al., "Okapi at TREC-3", 1994.
+/// least half the average. Robertson et al., "Okapi at TREC-3", 1994. One thread.
 class Weighing {
  public:
   /// `all` are the databases that are searched together.
-  explicit Weighing(const Xapian::Database& all) : all_(all), documents_(all.get_doccount()) {}
+  explicit Weighing(const Xapian::Database& all);
 
   /// What a document could at most get for the term.
   double Of(const std::string& term) const;
+  /// What the count of a term is set against in a document of so many words.
+  double Against(std::uint32_t length) const {
+    return std::max(length * per_average_, 0.5) * 0.5 + 0.5;
+  }
 
  private:
   const Xapian::Database& all_;
   double documents_;
+  double per_average_ = 0;
+  mutable std::unordered_map<std::string, double> known_;
 };
 
 /// The matches of a plan of terms in one database.
 class Matches {
  public:
-  /// Without `weighing` all weights are 0; with it `lengths` are the database's. All outlive this
-  /// object.
-  Matches(const Xapian::Database& database, const Plan& plan, const Weighing* weighing = nullptr,
-          const Lengths* lengths = nullptr);
+  /// Without `weighing` all weights are 0; with it `lengths` are the database's. `look` is called
+  /// now and then and may throw. All outlive this object.
+  Matches(const Xapian::Database& database, const Plan& plan, const Weighing* weighing,
+          const Lengths* lengths, const std::function<void()>& look);
   ~Matches();
 
   /// Fills in the next block that may have matches; false when there are no more.
@@ -87,9 +93,13 @@ class Matches {
 
  private:
   const Xapian::Database& database_;
+  const Weighing* weighing_;
   const Lengths* lengths_;
+  const std::function<void()>& look_;
   std::unique_ptr<Node> root_;
   DocumentId last_;
+  /// Of the block, where most documents may match.
+  std::vector<double> against_;
   /// The block to come begins here or later.
   DocumentId next_ = 0;
 };

@@ -44,9 +44,11 @@ struct Query {
 
   friend bool operator==(const Query&, const Query&) = default;
 
-  /// Deepest tree and most nodes the index takes; a larger one is refused with an Error.
+  /// Deepest tree, most nodes and, with all words widened, most terms the index takes; a larger one
+  /// is refused with an Error.
   static constexpr unsigned kMaxDepth = 32;
   static constexpr unsigned kMaxNodes = 4096;
+  static constexpr std::size_t kMaxTerms = 32'768;
 };
 
 }  // namespace maru::index

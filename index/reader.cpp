@@ -195,14 +195,14 @@ template <class Use>
 void EngineReader::ForEachSeen(const Plan& plan, const Weighing* weighing, Use&& use) const {
   if (blind_) return;
   const auto block = std::make_unique<MatchBlock>();
+  const std::function<void()> look = [this] { LookUp(); };
   for (std::size_t share = 0; share < indices_->Count(); ++share) {
     const Xapian::Database& database = indices_->Database(share);
     const auto lengths = weighing ? indices_->LengthsOf(share) : nullptr;
-    Matches matches(database, plan, weighing, lengths.get());
+    Matches matches(database, plan, weighing, lengths.get(), look);
     Places places(database);
     const auto place = [&](DocumentId id) { return places.Of(id); };
     while (matches.Next(*block)) {
-      LookUp();
       for (std::size_t i = 0; i < MatchBlock::kWords; ++i) {
         const std::size_t word = block->first / 64 + i;
         const Bits bits = block->bits[i];

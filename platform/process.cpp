@@ -13,7 +13,7 @@ namespace {
 constexpr int kFollowUpNice = 10;
 
 thread_local int last_error = 0;
-bool ends_with_request = false;
+int reasons_to_end = 0;
 
 }  // namespace
 
@@ -40,11 +40,11 @@ void MLIBCErrSet(int code) {
 namespace maru {
 
 void EndWithRequest(bool must) {
-  ends_with_request = must;
+  reasons_to_end += must ? 1 : -1;
 }
 
 bool EndsWithRequest() {
-  return ends_with_request;
+  return reasons_to_end > 0;
 }
 
 void GiveWay() {

@@ -19,8 +19,8 @@ constexpr int kErrSystem = 0x2a00;
 namespace maru {
 
 /// Whether this process has to end with the request that it serves: something that outlasts the
-/// request names it by its process id, or would not stand another request beside it. False at
-/// first.
+/// request names it by its process id, or would not stand another request beside it. Each reason
+/// is told once, and once again when it is gone.
 void EndWithRequest(bool must);
 bool EndsWithRequest();
 

@@ -30,6 +30,8 @@ namespace {
 
 /// Then a new child takes over, and what a method may have left in memory is gone.
 constexpr int kMostRequests = 1000;
+/// After a longer answer (bytes) a child ends instead of keeping the memory that it took.
+constexpr std::size_t kLongAnswer = 4u << 20;
 /// How soon a process that a request has left behind is reaped.
 constexpr int kReapMilliseconds = 100;
 
@@ -83,11 +85,13 @@ class Reply {
       answer = Unknown();
     }
     const KeepErrno keep;
+    if (answer.body.size() > kLongAnswer) EndWithRequest(true);
     Say(host_, kAnswered);
-    SendAnswer(front_.Get(), answer, Wait::kYes);
+    sent_ = SendAnswer(front_.Get(), answer, Wait::kYes);
   }
 
-  bool IsGiven() const { return given_; }
+  /// All of an answer has gone out.
+  bool IsSent() const { return sent_; }
 
   static Answer Unknown() { return Failure(maruseeker::kErrorUnknown, Json::Value()); }
 
@@ -95,6 +99,7 @@ class Reply {
   const Descriptor& front_;
   const Descriptor& host_;
   bool given_ = false;
+  bool sent_ = false;
 };
 
 void RunMethod(const Plugin::Method& method, MARU::APIRequest& request, Reply& reply) {
@@ -177,7 +182,7 @@ int ServeOne(const Descriptor& tasks, Packet& packet, const Plugin& plugin) {
     MARU_LOG("Failed to serve a request: %s", exception.what());
     return 1;
   }
-  return reply.IsGiven() ? 0 : 1;
+  return reply.IsSent() ? 0 : 1;
 }
 
 /// Until there is a task, or nothing is left of what the requests before have forked.
@@ -211,14 +216,15 @@ void RunRequestChild(Descriptor tasks, const Plugin& plugin) {
   ShareTable::Freeze();
   WarmUp();
   Packet packet;
-  for (int served = 0; served < kMostRequests; ++served) {
+  for (int served = 0;; ++served) {
     ReapUntilAsked(tasks);
     if (ReceivePacket(tasks.Get(), packet, Wait::kYes) != ReceiveResult::kPacket) _exit(0);
     if (const int status = ServeOne(tasks, packet, plugin)) _exit(status);
-    if (EndsWithRequest() || !ResetCredentialsByName("root", true)) _exit(0);
+    // Who says that the request is over is about to wait for the next one.
+    const bool last = served + 1 == kMostRequests || EndsWithRequest();
+    if (last || !ResetCredentialsByName("root", true)) _exit(0);
     Say(tasks, kRequestOver);
   }
-  _exit(0);
 }
 
 }  // namespace maru::server

@@ -5,6 +5,7 @@
 #include <sys/wait.h>
 
 #include <algorithm>
+#include <system_error>
 #include <utility>
 
 #include "platform/log.h"
@@ -39,14 +40,16 @@ void Children::Renew() {
   renewed_ = next_number_;
 }
 
-/// A request that was under way when a child's own ended may have read of that child's process id
-/// and be about to end it. So a child works again only when all those requests are over.
-std::optional<Children::Child> Children::TakeRested(uid_t uid) {
+/// A request of the user that was under way when a child's own ended may have read of that child's
+/// process id and be about to end it. So a child works again only when all those are over.
+std::optional<Children::Child> Children::TakeRested(const std::string& user) {
   std::uint64_t oldest = next_number_;
-  for (const auto& [pid, child] : busy_) oldest = std::min(oldest, child.number);
+  for (const auto& [pid, child] : busy_) {
+    if (child.user == user) oldest = std::min(oldest, child.number);
+  }
   // The last one first: the others may go when there is less to do.
   const auto found = std::find_if(rested_.rbegin(), rested_.rend(), [&](const RestedChild& rested) {
-    return rested.uid == uid && rested.first <= oldest;
+    return rested.user == user && rested.first <= oldest;
   });
   if (found == rested_.rend()) return std::nullopt;
   Child child = std::move(found->child);
@@ -58,7 +61,7 @@ Children::Start Children::Hand(const Task& task, Descriptor& request, Seconds no
   if (busy_.size() >= kMaxBusy) return Start::kTooMany;
   const std::string packet = Pack(task);
   for (;;) {
-    std::optional<Child> child = TakeRested(task.uid);
+    std::optional<Child> child = TakeRested(task.user);
     if (!child && !fresh_.empty()) {
       child = std::move(fresh_.front());
       fresh_.pop_front();
@@ -69,7 +72,7 @@ Children::Start Children::Hand(const Task& task, Descriptor& request, Seconds no
     if (SendPacket(child->tasks.Get(), packet, Wait::kNo, request.Get()) == SendResult::kDone) {
       poller_.Add(request.Get(), static_cast<Poller::Key>(child->pid), 0);
       busy_.insert_or_assign(child->pid,
-                             BusyChild{task.session_id, task.uid, std::move(child->tasks),
+                             BusyChild{task.session_id, task.user, std::move(child->tasks),
                                        std::move(request), next_number_++, now});
       return Start::kDone;
     }
@@ -89,18 +92,28 @@ std::optional<Children::Finished> Children::Hear(pid_t pid, Seconds now) {
   if (!child.request) return std::nullopt;
   poller_.Remove(child.request.Get());
   child.request.Close();
-  if (child.answered)
-    poller_.Add(child.tasks.Get(), static_cast<Poller::Key>(pid), EPOLLIN);
-  else
-    kill(pid, SIGKILL);
+  if (!child.answered || !ListenTo(child, pid)) kill(pid, SIGKILL);
   return std::nullopt;
+}
+
+bool Children::ListenTo(const BusyChild& child, pid_t pid) {
+  try {
+    poller_.Add(child.tasks.Get(), static_cast<Poller::Key>(pid), EPOLLIN);
+    return true;
+  } catch (const std::system_error& error) {
+    MARU_LOG("Failed to listen to request child %d: %s", pid, error.what());
+    return false;
+  }
 }
 
 std::optional<Children::Finished> Children::Rest(Busy::iterator place, Seconds now) {
   BusyChild& child = place->second;
   poller_.Remove(child.request ? child.request.Get() : child.tasks.Get());
-  if (rested_.size() < kMaxRested && child.number >= renewed_)
-    rested_.push_back({{place->first, std::move(child.tasks)}, child.uid, next_number_, now});
+  if (child.number >= renewed_ && !child.overdue) {
+    if (rested_.size() >= kMaxRested) rested_.pop_front();
+    rested_.push_back(
+        {{place->first, std::move(child.tasks)}, std::move(child.user), next_number_, now});
+  }
   Finished finished{std::move(child.session_id)};
   busy_.erase(place);
   return finished;

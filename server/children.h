@@ -68,14 +68,13 @@ class Children {
   };
   struct RestedChild {
     Child child;
-    uid_t uid;
+    std::string user;
     /// The request that was handed out first of those since it rests.
     std::uint64_t first;
     Seconds since;
   };
   struct BusyChild {
-    std::string session_id;
-    uid_t uid;
+    std::string session_id, user;
     Descriptor tasks, request;
     /// Counts the requests.
     std::uint64_t number;
@@ -86,7 +85,8 @@ class Children {
   using Busy = std::unordered_map<pid_t, BusyChild>;
 
   std::optional<Child> Fork();
-  std::optional<Child> TakeRested(uid_t uid);
+  std::optional<Child> TakeRested(const std::string& user);
+  bool ListenTo(const BusyChild& child, pid_t pid);
   std::optional<Finished> Rest(Busy::iterator place, Seconds now);
 
   Poller& poller_;

@@ -59,7 +59,7 @@ void Echo(APIRequest* request, APIResponse* response) {
 /// What the process of a request looks like from within; with "last", it is to end with it.
 void Inspect(APIRequest* request, APIResponse* response) {
   Json::Value data;
-  maru::EndWithRequest(!StringOf(request, "last").empty());
+  if (!StringOf(request, "last").empty()) maru::EndWithRequest(true);
   data["pid"] = getpid();
   data["euid_before"] = geteuid();
   for (const auto& entry : std::filesystem::directory_iterator("/proc/self/fd"))

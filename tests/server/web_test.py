@@ -173,9 +173,22 @@ class CallTest(WebTest):
         second = self.call("inspect")[1]["pid"]
         third = self.call("inspect")[1]["pid"]
         self.assertEqual(len({first, second, third}), 3)
+        others = set()
+        for _ in range(3):
+            others.add(self.call("inspect", {}, self.carol)[1]["pid"])
+            wait_until(lambda: self.metric("maruweb_children_busy") == 1, "the query alone to run")
+        self.assertEqual(len(others), 1, "another user's requests end nobody of hers")
         slow.close()
         self.wait_until_idle()
         self.assertIn(self.call("inspect")[1]["pid"], (second, third))
+
+    def test_no_request_is_lost_when_a_child_has_served_its_time(self):
+        connection = self.raw()
+        for _ in range(1100):
+            connection.sendall(b"POST %secho HTTP/1.1\r\nHost: x\r\nAuthorization: Bearer %s\r\nContent-Type: "
+                               b"application/json\r\nContent-Length: 11\r\n\r\n{\"text\":\"\"}"
+                               % (CALL.encode(), self.alice.encode()))
+            self.assertEqual(responses(connection, 1)[0][0], 200)
 
     def test_slow_requests_hold_nobody_up(self):
         slow = [self.begin_call("slow", {"ms": LONG}) for _ in range(20)]
