@@ -158,14 +158,16 @@ void Follower::TakeEvents() {
 }
 
 void Follower::Note(const Watcher::Event& event) {
-  bool lost = event.mask == IN_Q_OVERFLOW;
-  if (!lost && event.name.empty()) {
-    if (event.folder != Writer::kRoot) return;
-    lost = !pending_.Add(kShareItself, {}, true, Clock::now());
-  } else if (!lost) {
-    lost = !pending_.Add(event.folder, event.name, IsComplete(event.mask), Clock::now());
-  }
-  if (!lost) return;
+  if (event.mask == IN_Q_OVERFLOW) return Lose();
+  if (!event.name.empty()) return Await(event.folder, event.name, IsComplete(event.mask));
+  if (event.folder == Writer::kRoot) Await(kShareItself, {}, true);
+}
+
+void Follower::Await(DirectoryId folder, const std::string& name, bool complete) {
+  if (!pending_.Add(folder, name, complete, Clock::now())) Lose();
+}
+
+void Follower::Lose() {
   pending_.Clear();
   CrawlBy(std::max(Clock::now() + Pending::kQuiet, last_crawl_ + settings_.lost_events_gap));
   if (std::exchange(lost_, true)) return;
@@ -200,7 +202,12 @@ void Follower::Compare(int top, const std::vector<Pending::Batch>& batches) {
   }
   crawler_->Settle(top);
   if (elsewhere.empty()) return;
-  for (const Pending::Batch* batch : elsewhere) CompareNames(top, *batch);
+  for (const Pending::Batch* batch : elsewhere) {
+    if (CompareNames(top, *batch)) continue;
+    // Its way has changed and word of that is still to be taken in: then it is where it is, or
+    // gone.
+    for (const std::string& name : batch->names) Await(batch->folder, name, false);
+  }
   crawler_->Settle(top);
 }
 

@@ -52,6 +52,10 @@ class Follower : private FolderListener {
   void Crawl();
   void TakeEvents();
   void Note(const Watcher::Event& event);
+  /// The name is looked at when it has come to rest.
+  void Await(index::DirectoryId folder, const std::string& name, bool complete);
+  /// More has changed than is known: a crawl will find it.
+  void Lose();
   void CrawlBy(Clock::time_point time);
   void ApplyPending();
   void Compare(int top, const std::vector<Pending::Batch>& batches);

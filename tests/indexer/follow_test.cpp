@@ -58,6 +58,18 @@ TEST_F(FollowTest, FindsEveryKindOfChange) {
   ExpectCaughtUp("moved in");
 }
 
+TEST_F(FollowTest, AChangeIsFoundInAFolderThatMovesBeforeItIsLookedAt) {
+  Write("here/deep/file.txt", "before");
+  Write("elsewhere/file.txt", "elsewhere");
+  Follow();
+  ExpectCaughtUp();
+  Write("here/deep/file.txt", "afterwards");
+  Write("here/deep/other.txt", "another");
+  std::this_thread::sleep_for(Pending::kMoment * 2 / 3);
+  Rename("here", "elsewhere/there");
+  ExpectCaughtUp();
+}
+
 TEST_F(FollowTest, AFileThatIsBeingWrittenIsFoundWhenItIsQuiet) {
   Follow();
   Write("x", "");
