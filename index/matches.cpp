@@ -15,8 +15,8 @@ constexpr DocumentId kNone = std::numeric_limits<DocumentId>::max();
 constexpr std::uint64_t kMuchMore = 8;
 
 constexpr std::size_t kPartsBetweenLooks = 64;
-/// Where a block may have so many matches, all its lengths are looked at together.
-constexpr std::uint64_t kManyMatches = 256;
+/// Where a block may have so many matches, its lengths are read together.
+constexpr std::uint64_t kManyMatches = 16;
 
 using Set = std::array<Bits, kWords>;
 
@@ -67,7 +67,9 @@ class Matches::Node {
   struct Place {
     MatchBlock& block;
     const Weighing* weighing;
-    /// For each document what counts are set against; null where few may match.
+    /// Of each document; null where so few may match that each is asked for by itself.
+    const std::uint32_t* lengths;
+    /// What counts are set against in each; null where fewer may match than there are documents.
     const double* against;
     const std::function<void()>& look;
   };
@@ -90,14 +92,16 @@ using NodePtr = std::unique_ptr<Node>;
 class TermNode : public Node {
  public:
   /// An empty term is in every document.
-  TermNode(const Xapian::Database& database, const std::string& term, double weight)
+  TermNode(const Xapian::Database& database, const std::string& term)
       : at_(database.postlist_begin(term)),
         end_(database.postlist_end(term)),
         documents_(term.empty() ? database.get_doccount() : database.get_termfreq(term)),
-        per_block_(documents_ * MatchBlock::kDocuments / (database.get_lastdocid() + 1)),
-        weight_(weight) {
+        per_block_(documents_ * MatchBlock::kDocuments / (database.get_lastdocid() + 1)) {
     Look();
   }
+
+  /// Until then its documents get no weight.
+  void Weigh(double weight) { weight_ = weight; }
 
   DocumentId Bound() const override { return id_; }
   std::uint64_t Most() const override { return documents_; }
@@ -126,7 +130,9 @@ class TermNode : public Node {
     if (weight_ == 0) return;
     const double count = at_.get_wdf();
     const double against =
-        place.against ? place.against[offset] : place.weighing->Against(at_.get_doclength());
+        place.against
+            ? place.against[offset]
+            : place.weighing->Against(place.lengths ? place.lengths[offset] : at_.get_doclength());
     place.block.weights[offset] += weight_ * count / (against + count);
   }
   void Look() { id_ = at_ == end_ ? kNone : *at_; }
@@ -142,7 +148,7 @@ class TermNode : public Node {
 
   Xapian::PostingIterator at_, end_;
   std::uint64_t documents_, per_block_;
-  double weight_;
+  double weight_ = 0;
   DocumentId id_ = kNone;
 };
 
@@ -169,12 +175,13 @@ class OrNode : public Node {
   }
   void Add(const Place& place, const Set* within, Set& set) override {
     for (std::size_t i = 0; i < parts_.size(); ++i) {
-      if (i % kPartsBetweenLooks == 0) place.look();
+      if (i % kPartsBetweenLooks == kPartsBetweenLooks - 1) place.look();
       parts_[i]->Add(place, within, set);
     }
     for (const NodePtr& part : mixed_) {
       own_->Begin(place.block.first);
-      part->Add({*own_, place.weighing, place.against, place.look}, within, own_->bits);
+      part->Add({*own_, place.weighing, place.lengths, place.against, place.look}, within,
+                own_->bits);
       for (std::size_t i = 0; i < kWords; ++i) {
         set[i] |= own_->bits[i];
         ForEachBit(i, own_->bits[i], [&](DocumentId offset) {
@@ -251,10 +258,9 @@ class Builder {
       case Plan::Kind::kNothing:
         return Any({}, factor);
       case Plan::Kind::kEverything:
-        return std::make_unique<TermNode>(database_, std::string(), 0);
+        return std::make_unique<TermNode>(database_, std::string());
       case Plan::Kind::kTerm:
-        return std::make_unique<TermNode>(
-            database_, plan.term, weighing_ && factor != 0 ? factor * weighing_->Of(plan.term) : 0);
+        return Term(plan.term, factor);
       case Plan::Kind::kOr:
         return Any(plan.parts, factor);
       case Plan::Kind::kAnd:
@@ -272,13 +278,14 @@ class Builder {
 
  private:
   NodePtr Term(const std::string& term, double factor) const {
-    const bool weighs = weighing_ && factor != 0 && database_.term_exists(term);
-    return std::make_unique<TermNode>(database_, term, weighs ? factor * weighing_->Of(term) : 0);
+    auto node = std::make_unique<TermNode>(database_, term);
+    if (weighing_ && factor != 0 && node->Most() > 0) node->Weigh(factor * weighing_->Of(term));
+    return node;
   }
   NodePtr Any(const std::vector<Plan>& plans, double factor) const {
     std::vector<NodePtr> parts, mixed;
     for (const Plan& plan : plans) {
-      if (parts.size() % kPartsBetweenLooks == 0) look_();
+      if (parts.size() % kPartsBetweenLooks == kPartsBetweenLooks - 1) look_();
       const bool simple = plan.kind == Plan::Kind::kTerm || plan.kind == Plan::Kind::kOr;
       (simple || factor == 0 ? parts : mixed).push_back(Build(plan, factor));
     }
@@ -306,8 +313,8 @@ Matches::Matches(const Xapian::Database& database, const Plan& plan, const Weigh
       look_(look),
       root_(Builder(database, weighing, look).Build(plan, 1)),
       last_(database.get_lastdocid()) {
-  const bool many = root_->Most() * MatchBlock::kDocuments > kManyMatches * (last_ + 1ull);
-  if (weighing_ && many) against_.resize(MatchBlock::kDocuments);
+  if (root_->Most() * MatchBlock::kDocuments < kManyMatches * (last_ + 1ull)) lengths_ = nullptr;
+  if (lengths_ && root_->Most() > last_) against_.resize(MatchBlock::kDocuments);
 }
 
 Matches::~Matches() = default;
@@ -318,13 +325,13 @@ bool Matches::Next(MatchBlock& block) {
   look_();
   block.Begin(bound / MatchBlock::kDocuments * MatchBlock::kDocuments);
   next_ = block.first + MatchBlock::kDocuments;
+  const std::uint32_t* lengths = lengths_ ? lengths_->Of(block.first, database_) : nullptr;
   if (!against_.empty()) {
-    const std::uint32_t* lengths = lengths_->Of(block.first, database_);
     std::transform(lengths, lengths + MatchBlock::kDocuments, against_.begin(),
                    [&](std::uint32_t length) { return weighing_->Against(length); });
   }
-  root_->Add({block, weighing_, against_.empty() ? nullptr : against_.data(), look_}, nullptr,
-             block.bits);
+  root_->Add({block, weighing_, lengths, against_.empty() ? nullptr : against_.data(), look_},
+             nullptr, block.bits);
   return true;
 }
 
