@@ -15,13 +15,21 @@ constexpr int kFollowUpNice = 10;
 thread_local int last_error = 0;
 int reasons_to_end = 0;
 
+/// From now on the process has a low priority: nobody waits for it.
+void GiveWay() {
+  const maru::KeepErrno keep;
+  const sched_param none{};
+  sched_setscheduler(0, SCHED_BATCH, &none);
+  setpriority(PRIO_PROCESS, 0, kFollowUpNice);
+}
+
 }  // namespace
 
 int MLIBCProcForkEx(int close_descriptors) {
   const pid_t child = fork();
   if (child < 0) MLIBCErrSet(kErrSystem);
   if (child != 0 || !close_descriptors) return child;
-  maru::GiveWay();
+  GiveWay();
   // The log's own socket goes with the rest; its number may soon be another file's.
   maru::ReopenLog();
   close_range(STDERR_FILENO + 1, ~0u, 0);
@@ -45,13 +53,6 @@ void EndWithRequest(bool must) {
 
 bool EndsWithRequest() {
   return reasons_to_end > 0;
-}
-
-void GiveWay() {
-  const KeepErrno keep;
-  const sched_param none{};
-  sched_setscheduler(0, SCHED_BATCH, &none);
-  setpriority(PRIO_PROCESS, 0, kFollowUpNice);
 }
 
 }  // namespace maru

@@ -24,7 +24,4 @@ namespace maru {
 void EndWithRequest(bool must);
 bool EndsWithRequest();
 
-/// From now on the process has a low priority: nobody waits for it.
-void GiveWay();
-
 }  // namespace maru

@@ -106,9 +106,14 @@ bool Children::ListenTo(const BusyChild& child, pid_t pid) {
   }
 }
 
+/// Until the front hangs up its socket is listened to, then the child's.
+void Children::StopListening(const BusyChild& child) {
+  poller_.Remove(child.request ? child.request.Get() : child.tasks.Get());
+}
+
 std::optional<Children::Finished> Children::Rest(Busy::iterator place, Seconds now) {
   BusyChild& child = place->second;
-  poller_.Remove(child.request ? child.request.Get() : child.tasks.Get());
+  StopListening(child);
   if (child.number >= renewed_ && !child.overdue) {
     if (rested_.size() >= kMaxRested) rested_.pop_front();
     rested_.push_back(
@@ -148,7 +153,7 @@ std::optional<Children::Finished> Children::Reaped(pid_t pid, int wait_status, S
     SendChildEnd(child.request.Get(),
                  killed && !child.overdue ? ChildEnd::kKilled : ChildEnd::kFailed);
   }
-  poller_.Remove(child.request ? child.request.Get() : child.tasks.Get());
+  StopListening(child);
   Finished finished{std::move(child.session_id),
                     WIFEXITED(wait_status) && WEXITSTATUS(wait_status) == kExitSessionOver};
   busy_.erase(found);

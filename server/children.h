@@ -87,6 +87,7 @@ class Children {
   std::optional<Child> Fork();
   std::optional<Child> TakeRested(const std::string& user);
   bool ListenTo(const BusyChild& child, pid_t pid);
+  void StopListening(const BusyChild& child);
   std::optional<Finished> Rest(Busy::iterator place, Seconds now);
 
   Poller& poller_;
