@@ -3,23 +3,19 @@
 #include <exception>
 #include <mutex>
 
+#include "platform/history_journal.h"
 #include "platform/log.h"
 #include "platform/marudbquery.h"
 
 namespace maru::daemon {
 
-void OpenHistory() {
-  try {
-    maruseeker::db::DBSession::Instance()->Open();
-  } catch (const std::exception& error) {
-    MARU_LOG("Cannot open the search history: %s", error.what());
-  }
-}
-
 std::vector<std::string> EarlierSearches(uid_t uid) {
   static std::mutex mutex;
   const std::lock_guard lock(mutex);
   std::vector<std::string> keywords;
+  for (const auto& entry : maruseeker::db::HistoryJournal::OfService().Entries()) {
+    if (entry.uid == uid) keywords.insert(keywords.begin(), entry.keyword);
+  }
   try {
     const long long user = uid;
     std::string keyword;

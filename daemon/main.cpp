@@ -61,7 +61,6 @@ void Serve(const Config& config) {
   LibraryIndices indices(config.state_dir + "/index");
   UsageStore usage(config.state_dir + "/usage.db");
   Core core{.indices = indices, .usage = usage};
-  OpenHistory();
   core.history = EarlierSearches;
   Server server(core, listener.Socket(), identity.uid, {});
   running = &server;

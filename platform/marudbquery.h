@@ -81,6 +81,9 @@ class Session {
   /// true, rolled back otherwise. False when it was not, with `error` empty
   /// when `work` itself said so; does not throw.
   bool Transaction(const std::function<bool()>& work, std::string& error);
+  /// Within a transaction's work: undoes what `work` changed when it returns false or throws, and
+  /// the transaction goes on. What `work` returned; does not throw.
+  bool Attempt(const std::function<bool()>& work);
 
   /// For the statements of this layer. Those that open the database throw when it cannot be.
   soci::session& Open();

@@ -178,6 +178,22 @@ bool Session::Transaction(const std::function<bool()>& work, std::string& error)
   return false;
 }
 
+bool Session::Attempt(const std::function<bool()>& work) {
+  std::string ignored;
+  bool agreed = false;
+  const bool done = Walled(ignored, [&] {
+    Open() << "SAVEPOINT attempt";
+    agreed = work();
+    if (agreed) Open() << "RELEASE SAVEPOINT attempt";
+  });
+  if (done && agreed) return true;
+  Walled(ignored, [&] {
+    Open() << "ROLLBACK TO SAVEPOINT attempt";
+    Open() << "RELEASE SAVEPOINT attempt";
+  });
+  return false;
+}
+
 }  // namespace marudbquery
 
 namespace maruseeker::db {

@@ -1,5 +1,11 @@
 #include "common/db/search_history.h"
 
+#include <cstring>
+#include <map>
+
+#include "platform/history_journal.h"
+#include "platform/log.h"
+
 namespace maruseeker::db {
 namespace {
 
@@ -51,11 +57,69 @@ void SearchHistory::FromValues(const soci::values& values) {
 
 SearchHistoryTable::SearchHistoryTable() : TableBase(DBSession::Instance(), "search_history") {}
 
+int SearchHistoryTable::Count(const Condition& cond) {
+  return CatchUp() ? TableBase::Count(cond) : 0;
+}
+
+bool SearchHistoryTable::GetAll(std::vector<SearchHistory>& recs, const Condition& cond,
+                                const SelectParam& param) {
+  recs.clear();
+  return CatchUp() && TableBase::GetAll(recs, cond, param);
+}
+
+bool SearchHistoryTable::Delete(const Condition& cond) {
+  return CatchUp() && TableBase::Delete(cond);
+}
+
 bool SearchHistoryTable::UpdateWithTime(SearchHistory& rec, int max) {
+  const HistoryJournal journal = HistoryJournal::OfService();
+  bool long_enough = false;
+  if (!journal.Add({rec.uid, rec.keyword, rec.create_time, max}, long_enough)) {
+    error_ = std::string("history.journal: ") + strerror(errno);
+    return false;
+  }
+  return !long_enough || CatchUp();
+}
+
+bool SearchHistoryTable::CatchUp() {
   std::string reason;
-  if (session_->Transaction([&] { return Record(rec) && Prune(rec, max); }, reason)) return true;
+  const bool done = HistoryJournal::OfService().HandOver([&](const auto& entries) {
+    return session_->Transaction([&] { return Take(entries); }, reason);
+  });
+  if (done) return true;
+  if (errno != 0) reason = std::string("history.journal: ") + strerror(errno);
   if (!reason.empty()) error_ = reason;
   return false;
+}
+
+bool SearchHistoryTable::Take(const std::vector<HistoryJournal::Entry>& entries) {
+  // What was asked for again and again is written once.
+  std::vector<SearchHistory> records;
+  std::map<std::pair<uid_t, std::string>, std::size_t> places;
+  std::map<uid_t, std::pair<std::size_t, int>> last;
+  for (const HistoryJournal::Entry& entry : entries) {
+    const auto [known, added] = places.try_emplace({entry.uid, entry.keyword}, records.size());
+    if (added) records.emplace_back();
+    SearchHistory& record = records[known->second];
+    record.uid = entry.uid;
+    record.keyword = entry.keyword;
+    record.create_time = entry.create_time;
+    last[entry.uid] = {known->second, entry.max};
+  }
+  std::size_t taken = 0;
+  for (SearchHistory& record : records) {
+    if (session_->Attempt([&] { return Record(record); })) {
+      ++taken;
+    } else {
+      MARU_LOG("A search of user %u cannot be recorded: %s", record.uid, error_.c_str());
+    }
+  }
+  // One that the database refuses must not keep back the others; all of them may come again.
+  if (taken == 0) return false;
+  for (const auto& [uid, newest] : last) {
+    if (!Prune(records[newest.first], newest.second)) return false;
+  }
+  return true;
 }
 
 bool SearchHistoryTable::Record(SearchHistory& rec) {
@@ -72,7 +136,7 @@ bool SearchHistoryTable::Record(SearchHistory& rec) {
     return false;
   }
   std::vector<SearchHistory> stored;
-  if (!GetAll(stored, rec.SameContent(), SelectParam(0, 1, "id", false))) return false;
+  if (!TableBase::GetAll(stored, rec.SameContent(), SelectParam(0, 1, "id", false))) return false;
   if (stored.empty()) return false;
   rec = stored.front();
   return true;
@@ -83,9 +147,9 @@ bool SearchHistoryTable::Prune(const SearchHistory& newest, int max) {
   const Condition others =
       newest.SameOwner() && Condition::ConditionFactory<int>("id", "!=", newest.id);
   std::vector<SearchHistory> excess;
-  if (!GetAll(excess, others, SelectParam(max - 1, 1, "create_time", false))) return false;
+  if (!TableBase::GetAll(excess, others, SelectParam(max - 1, 1, "create_time", false))) return false;
   if (excess.empty()) return true;
-  return Delete(others && excess.front().NotNewer());
+  return TableBase::Delete(others && excess.front().NotNewer());
 }
 
 }  // namespace maruseeker::db

@@ -2,10 +2,13 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <filesystem>
+
 #include "common/common.h"
 #include "common/db/search_history.h"
 #include "common/sdk/credentials.h"
 #include "platform/preference.h"
+#include "platform/whole_file.h"
 #include "plugin/plugin.h"
 #include "support/fake_daemon.h"
 
@@ -19,6 +22,7 @@ using testing::ContainsRegex;
 using testing::HasSubstr;
 
 constexpr const char* kDatabase = "/var/lib/maruseeker/history.db";
+constexpr const char* kJournal = "/var/lib/maruseeker/history.journal";
 
 class History : public PluginTest {
  protected:
@@ -26,6 +30,7 @@ class History : public PluginTest {
     PluginTest::SetUp();
     if (IsSkipped()) return;
     for (const char* end : {"", "-wal", "-shm"}) unlink((std::string(kDatabase) + end).c_str());
+    std::filesystem::remove_all(kJournal);
   }
 
   static SearchHistory Query(unsigned uid, const std::string& keyword, long time) {
@@ -53,7 +58,7 @@ class History : public PluginTest {
              long now = time;
              for (const std::string& keyword : keywords) {
                SearchHistory query = Query(uid, keyword, now++);
-               good = table.UpdateWithTime(query, max) && query.id > 0 && good;
+               good = table.UpdateWithTime(query, max) && good;
              }
              return Json::Value(good);
            })
@@ -266,21 +271,66 @@ TEST_F(History, DatabaseThatFails) {
     std::vector<SearchHistory> rows(3);
     told["all"] = history.GetAll(rows, Condition::Null(), SelectParam(0, 0, "", true));
     told["rows"] = static_cast<unsigned>(rows.size());
-    SearchHistory query;
-    told["update"] = history.UpdateWithTime(query, 5);
     return told;
   });
   EXPECT_EQ(table.value["count"], 0);
   EXPECT_THAT(table.value["why"].asString(), HasSubstr("not a database"));
   EXPECT_EQ(table.value["all"], false);
   EXPECT_EQ(table.value["rows"], 0);
-  EXPECT_EQ(table.value["update"], false);
+  // What is searched meanwhile is there when the database is.
+  EXPECT_TRUE(Record(60001, {"meanwhile"}));
+  EXPECT_EQ(Get(Alice()), "9999");
+  unlink(kDatabase);
+  EXPECT_EQ(Get(Alice()), "1: meanwhile@1000");
+}
 
+TEST_F(History, JournalThatFails) {
+  std::filesystem::create_directory(kJournal);
+  EXPECT_FALSE(Record(60001, {"nowhere"}));
+  EXPECT_EQ(Get(Alice()), "9999");
   maruseeker::pref::Preference(60001).Set<bool>("enable_history", true);
   const Answer search = Ask(
       Alice(), "search", FromText("{'search_weight_list':[],'indice':['private'],'keyword':'k'}"));
   EXPECT_TRUE(search.success);
   EXPECT_THAT(search.log, ContainsRegex("task\\.h:33 .*Failed to execute, 9999 "));
+}
+
+TEST_F(History, WhatIsNoSearchInTheJournalIsLeftOut) {
+  ASSERT_TRUE(Record(60001, {"one\ntwo", std::string("nul\0!", 5)}));
+  std::string text;
+  ASSERT_TRUE(maru::ReadWholeFile(kJournal, 1 << 20, text));
+  const std::string garbage =
+      "\n{}\n[1]\nnull\n{\"create_time\":1,\"keyword\":2,\"max\":0,\"uid\":60001}\n"
+      "{\"create_time\":1,\"keyword\":\"x\",\"max\":0,\"uid\":-1}\n" +
+      std::string(100, '\0') + "\n";
+  // A line that was cut ends the file, too.
+  WriteFile(kJournal, garbage + text + garbage + text.substr(0, 20), 0600, 60000);
+  EXPECT_EQ(Get(Alice()), "2: one\ntwo@1000 " + std::string("nul\0!", 5) + "@1001");
+}
+
+TEST_F(History, OneThatTheDatabaseRefusesKeepsBackNoOther) {
+  ASSERT_TRUE(Record(60001, {"first"}));
+  EXPECT_EQ(Get(Alice()), "1: first@1000");
+  AsService([](SearchHistoryTable&) {
+    maruseeker::db::DBSession::Instance()->Open()
+        << "CREATE TRIGGER refuse AFTER INSERT ON search_history WHEN NEW.keyword = 'no' "
+           "BEGIN SELECT RAISE(ABORT, 'refused'); END";
+    return Json::Value();
+  });
+  ASSERT_TRUE(Record(60001, {"no"}));
+  EXPECT_EQ(Get(Alice()), "9999");
+  ASSERT_TRUE(Record(60001, {"yes", "no", "last"}, 2, 2000));
+  EXPECT_EQ(Get(Alice()), "2: yes@2000 last@2002");
+}
+
+TEST_F(History, LongJournalIsTakenOverByWhoSearches) {
+  std::vector<std::string> keywords;
+  for (int i = 0; i < 300; ++i) keywords.push_back("keyword number " + std::to_string(i));
+  ASSERT_TRUE(Record(60001, keywords, 250));
+  EXPECT_TRUE(std::filesystem::exists(kDatabase));
+  EXPECT_LT(std::filesystem::file_size(kJournal), 16u << 10);
+  EXPECT_EQ(Ask(Alice(), "get", FromText("{'limit':1}")).data["total"], 250);
+  EXPECT_EQ(std::filesystem::file_size(kJournal), 0u);
 }
 
 }  // namespace

@@ -1,7 +1,6 @@
 #!/usr/bin/python3
 """Bursts of queries, of which the newest wins, and the history, which no answer waits for."""
 
-import contextlib
 import pathlib
 import pwd
 import sqlite3
@@ -117,31 +116,43 @@ class HistoryTest(road.RoadTest):
         services.start_web()
         cls.token = services.sign_in("alice")
         road.search(services, cls.token, "first keyword")
-        road.wait_until(HISTORY.exists, "the history's database")
+        road.wait_until(cls.keywords, "the history")
 
-    @staticmethod
-    def keywords(uid=ALICE):
-        database = sqlite3.connect(HISTORY, timeout=road.PATIENCE)
-        with contextlib.closing(database):
-            rows = database.execute("SELECT keyword FROM search_history WHERE uid = ?"
-                                    " ORDER BY create_time, id", (uid,)).fetchall()
-        return [row[0] for row in rows]
+    @classmethod
+    def get(cls, token=None):
+        return cls.services.http("POST", "/webapi/MARU.Seeker.Elastic.SearchHistory/1/get",
+                                 {"limit": 0}, token or cls.token)
+
+    @classmethod
+    def keywords(cls, token=None):
+        status, answer = cls.get(token)
+        assert status == 200, answer
+        return [row["keyword"] for row in answer["data"]["historys"]]
 
     def test_the_service_writes_it(self):
         road.wait_until(lambda: "first keyword" in self.keywords(), "the keyword in the history")
-        self.assertEqual(pwd.getpwnam("MaruSeeker").pw_uid, HISTORY.stat().st_uid)
-        road.search(self.services, self.services.sign_in("bob"), "  of bob  ")
-        road.wait_until(lambda: self.keywords(60002) == ["of bob"], "bob's keyword, trimmed")
+        for file in (HISTORY, HISTORY.with_suffix(".journal")):
+            self.assertEqual(pwd.getpwnam("MaruSeeker").pw_uid, file.stat().st_uid)
+            self.assertEqual(0, file.stat().st_mode & 0o077)
+        bob = self.services.sign_in("bob")
+        road.search(self.services, bob, "  of bob  ")
+        road.wait_until(lambda: self.keywords(bob) == ["of bob"], "bob's keyword, trimmed")
         self.assertNotIn("of bob", self.keywords())
 
     def test_a_locked_database_delays_no_answer(self):
         database = sqlite3.connect(HISTORY, timeout=road.PATIENCE, isolation_level=None)
         database.execute("BEGIN EXCLUSIVE")
-        # While the lock is held nothing can be written; the answer comes all the same.
+        # While the lock is held nothing can be written; the answer comes all the same, and who asks
+        # for the history waits.
         road.search(self.services, self.token, "while locked")
+        asking = threading.Thread(target=self.get)
+        asking.start()
+        road.search(self.services, self.token, "while somebody waits")
         database.execute("ROLLBACK")
         database.close()
-        road.wait_until(lambda: "while locked" in self.keywords(), "the keyword after the lock")
+        asking.join()
+        road.wait_until(lambda: {"while locked", "while somebody waits"} <= set(self.keywords()),
+                        "the keywords after the lock")
 
     def test_none_is_lost_and_none_is_doubled(self):
         words = [f"word {number}" for number in range(12)]

@@ -2,9 +2,11 @@
 
 #include <cstdint>
 #include <string>
+#include <vector>
 
 #include "common/db/base_record.h"
 #include "common/db/table_base.h"
+#include "platform/history_journal.h"
 
 namespace maruseeker::db {
 
@@ -26,17 +28,27 @@ class SearchHistory : public BaseRecord {
   marudbquery::Condition SameContent() const override;
 };
 
+/// The table, which each operation first brings up to date with what was recorded.
 class SearchHistoryTable : public TableBase<SearchHistory> {
  public:
   SearchHistoryTable();
 
+  /// As TableBase has them.
+  int Count(const marudbquery::Condition& cond);
+  bool GetAll(std::vector<SearchHistory>& recs, const marudbquery::Condition& cond,
+              const SelectParam& param);
+  bool Delete(const marudbquery::Condition& cond);
+
   /// Records a query: a keyword that the user has in the table already becomes the newest one under
-  /// its old id, any other is added; `rec.id` is then the row's. Of the user's rows the newest
-  /// `max` stay, this one always among them; 0 or less: all stay. All of it happens or nothing
-  /// does, and then the result is false.
+  /// its old id, any other is added. Of the user's rows the newest `max` stay, this one always
+  /// among them; 0 or less: all stay. It is kept in a journal, and a database that fails just now
+  /// does not lose it.
   bool UpdateWithTime(SearchHistory& rec, int max);
 
  private:
+  /// Takes the journal's searches into the table; all of it happens or nothing does.
+  bool CatchUp();
+  bool Take(const std::vector<HistoryJournal::Entry>& entries);
   bool Record(SearchHistory& rec);
   bool Prune(const SearchHistory& newest, int max);
 };

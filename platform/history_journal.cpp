@@ -1,0 +1,130 @@
+#include "platform/history_journal.h"
+
+#include <errno.h>
+#include <fcntl.h>
+#include <sys/file.h>
+#include <sys/stat.h>
+
+#include <string_view>
+
+#include "platform/config.h"
+#include "platform/json.h"
+#include "platform/unique_fd.h"
+
+namespace maruseeker::db {
+namespace {
+
+// A hundred or two searches: taken over in a few milliseconds.
+constexpr off_t kLongEnough = off_t{16} << 10;
+constexpr off_t kMost = off_t{4} << 20;
+constexpr int kHow = O_RDWR | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC;
+
+/// The file's size once nobody else has it locked; below 0 with errno.
+off_t Locked(const maru::UniqueFd& file) {
+  while (flock(file.Get(), LOCK_EX) != 0) {
+    if (errno != EINTR) return -1;
+  }
+  struct stat status;
+  return fstat(file.Get(), &status) == 0 ? status.st_size : -1;
+}
+
+std::string LineOf(const HistoryJournal::Entry& entry) {
+  Json::Value line(Json::objectValue);
+  line["uid"] = entry.uid;
+  line["keyword"] = entry.keyword;
+  line["create_time"] = static_cast<Json::Int64>(entry.create_time);
+  line["max"] = entry.max;
+  return maru::json::ToString(line) + "\n";
+}
+
+bool ReadLine(const std::string& text, HistoryJournal::Entry& entry) {
+  Json::Value line;
+  if (!maru::json::FromString(text, line) || !line.isObject()) return false;
+  const Json::Value& uid = line["uid"];
+  const Json::Value& time = line["create_time"];
+  if (!uid.isUInt() || !line["keyword"].isString() || !time.isInt64() || !line["max"].isInt()) {
+    return false;
+  }
+  entry = {uid.asUInt(), line["keyword"].asString(), time.asInt64(), line["max"].asInt()};
+  return true;
+}
+
+std::vector<HistoryJournal::Entry> EntriesOf(std::string_view text) {
+  std::vector<HistoryJournal::Entry> entries;
+  HistoryJournal::Entry entry;
+  while (!text.empty()) {
+    const std::string line(text.substr(0, text.find('\n')));
+    text.remove_prefix(std::min(text.size(), line.size() + 1));
+    if (ReadLine(line, entry)) entries.push_back(entry);
+  }
+  return entries;
+}
+
+bool ReadAll(const maru::UniqueFd& file, off_t size, std::string& text) {
+  text.resize(static_cast<std::size_t>(size));
+  std::size_t got = 0;
+  while (got < text.size()) {
+    const ssize_t count =
+        pread(file.Get(), text.data() + got, text.size() - got, static_cast<off_t>(got));
+    if (count < 0 && errno == EINTR) continue;
+    if (count < 0) return false;
+    if (count == 0) break;
+    got += static_cast<std::size_t>(count);
+  }
+  text.resize(got);
+  return true;
+}
+
+}  // namespace
+
+HistoryJournal HistoryJournal::OfService() {
+  return HistoryJournal(maru::Config::Get().state_dir + "/history.journal");
+}
+
+bool HistoryJournal::Add(const Entry& entry, bool& long_enough) const {
+  const std::string line = LineOf(entry);
+  const maru::UniqueFd file(open(path_.c_str(), kHow | O_CREAT | O_APPEND, 0600));
+  if (!file) return false;
+  const off_t before = Locked(file);
+  if (before < 0) return false;
+  if (before > kMost) {
+    errno = EFBIG;
+    return false;
+  }
+  const ssize_t written = write(file.Get(), line.data(), line.size());
+  if (written == static_cast<ssize_t>(line.size())) {
+    long_enough = before + written > kLongEnough;
+    return true;
+  }
+  // Half a line would spoil the next one.
+  const int error = written < 0 ? errno : ENOSPC;
+  static_cast<void>(!ftruncate(file.Get(), before));
+  errno = error;
+  return false;
+}
+
+std::vector<HistoryJournal::Entry> HistoryJournal::Entries() const {
+  const maru::UniqueFd file(open(path_.c_str(), kHow));
+  struct stat status;
+  std::string text;
+  if (!file || fstat(file.Get(), &status) != 0 || !ReadAll(file, status.st_size, text)) return {};
+  return EntriesOf(text);
+}
+
+bool HistoryJournal::HandOver(const std::function<bool(const std::vector<Entry>&)>& take) const {
+  const maru::UniqueFd file(open(path_.c_str(), kHow));
+  if (!file) return errno == ENOENT;
+  struct stat status;
+  if (fstat(file.Get(), &status) == 0 && status.st_size == 0) return true;
+  const off_t size = Locked(file);
+  std::string text;
+  if (size < 0 || !ReadAll(file, size, text)) return false;
+  const std::vector<Entry> entries = EntriesOf(text);
+  if (!entries.empty() && !take(entries)) {
+    errno = 0;
+    return false;
+  }
+  return ftruncate(file.Get(), 0) == 0;
+}
+
+}  // namespace maruseeker::db

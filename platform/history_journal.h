@@ -1,0 +1,47 @@
+#pragma once
+
+#include <sys/types.h>
+
+#include <cstdint>
+#include <functional>
+#include <string>
+#include <vector>
+
+namespace maruseeker::db {
+
+/// Searches that are not in the history's table yet. Whoever searched adds a line to a file, which
+/// costs a few calls of the system; whoever reads the table takes them into it first. Safe among
+/// any number of processes, and a line survives the end of each of them.
+class HistoryJournal {
+ public:
+  struct Entry {
+    uid_t uid = 0;
+    std::string keyword;
+    /// Seconds since the epoch.
+    std::int64_t create_time = 0;
+    /// Of the user's searches so many are kept; 0 or less: all.
+    int max = 0;
+  };
+
+  explicit HistoryJournal(std::string path) : path_(std::move(path)) {}
+  /// The service's own, in the state folder.
+  static HistoryJournal OfService();
+
+  /// Adds an entry; waits while another process takes the entries over. `long_enough` tells whether
+  /// they should be taken over now. False with errno; EFBIG when nobody could for too long.
+  bool Add(const Entry& entry, bool& long_enough) const;
+
+  /// What is there now, in the order of adding. A file that cannot be read is empty, with errno;
+  /// lines that are none of ours are left out.
+  std::vector<Entry> Entries() const;
+
+  /// Gives all entries to `take` and forgets them when it returns true; nobody adds any meanwhile.
+  /// Without entries `take` is not called and the result is true. False with errno when the file
+  /// cannot be read or written, with errno 0 when `take` returned false.
+  bool HandOver(const std::function<bool(const std::vector<Entry>&)>& take) const;
+
+ private:
+  std::string path_;
+};
+
+}  // namespace maruseeker::db
