@@ -16,9 +16,9 @@ sys.path.insert(0, str(TOP / "tests/road"))
 
 import road  # noqa: E402  the services, as the road tests start them
 
-# Groups of processes; maruwebd's first process counts as its host.
-PROGRAMS = {"maruelasticd": "daemon", "maruindexd": "indexer"}
-WEB_GROUPS = {"maruweb-front": "front", "maruweb-request": "children"}
+# Groups of processes by what a process calls itself; maruwebd's first process counts as its host.
+GROUPS = {"maruelasticd": "daemon", "maruindexd": "indexer", "maruwebd": "host", "maruweb-host": "host",
+          "maruweb-front": "front", "maruweb-request": "children"}
 INDEX = road.STATE / "index"
 
 
@@ -108,18 +108,15 @@ def processes():
     for entry in pathlib.Path("/proc").iterdir():
         if entry.name.isdigit():
             with contextlib.suppress(OSError):
-                program_name = os.path.basename(os.readlink(entry / "exe"))
-                if program_name == "maruwebd":
-                    name = (entry / "comm").read_text(encoding="utf-8").strip()
-                    yield int(entry.name), WEB_GROUPS.get(name, "host")
-                elif program_name in PROGRAMS:
-                    yield int(entry.name), PROGRAMS[program_name]
+                name = (entry / "comm").read_text(encoding="utf-8").strip()
+                if name in GROUPS:
+                    yield int(entry.name), GROUPS[name]
 
 
 def cpu_seconds():
     """CPU used so far by each group of processes."""
     ticks = os.sysconf("SC_CLK_TCK")
-    used = dict.fromkeys((*PROGRAMS.values(), "front", "host", "children"), 0.0)
+    used = dict.fromkeys(GROUPS.values(), 0.0)
     for pid, group in processes():
         with contextlib.suppress(OSError):
             text = pathlib.Path(f"/proc/{pid}/stat").read_text(encoding="utf-8", errors="replace")

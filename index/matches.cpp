@@ -20,11 +20,16 @@ constexpr std::uint64_t kManyMatches = 16;
 
 using Set = std::array<Bits, kWords>;
 
-std::uint64_t Count(const Set& set) {
+/// Documents of a block, and how many they are.
+struct Counted {
+  Set set{};
   std::uint64_t count = 0;
-  for (const Bits bits : set) count += CountBits(bits);
-  return count;
-}
+
+  void Count() {
+    count = 0;
+    for (const Bits bits : set) count += CountBits(bits);
+  }
+};
 
 }  // namespace
 
@@ -81,7 +86,7 @@ class Matches::Node {
   virtual std::uint64_t Most() const = 0;
   /// Adds the matches to `set`, only those in `within` when that is given, and weights to the
   /// place's block, also to documents that do not match.
-  virtual void Add(const Place& place, const Set* within, Set& set) = 0;
+  virtual void Add(const Place& place, const Counted* within, Set& set) = 0;
 };
 
 namespace {
@@ -106,12 +111,12 @@ class TermNode : public Node {
   DocumentId Bound() const override { return id_; }
   std::uint64_t Most() const override { return documents_; }
 
-  void Add(const Place& place, const Set* within, Set& set) override {
+  void Add(const Place& place, const Counted* within, Set& set) override {
     const DocumentId first = place.block.first;
     if (id_ < first) SkipTo(first);
-    if (within && Count(*within) * kMuchMore < per_block_) {
+    if (within && within->count * kMuchMore < per_block_) {
       for (std::size_t i = 0; i < kWords; ++i) {
-        ForEachBit(i, (*within)[i], [&](DocumentId offset) {
+        ForEachBit(i, within->set[i], [&](DocumentId offset) {
           if (id_ < first + offset) SkipTo(first + offset);
           if (id_ == first + offset) Take(place, offset, set);
         });
@@ -120,7 +125,7 @@ class TermNode : public Node {
     }
     for (; id_ - first < MatchBlock::kDocuments; Step()) {
       const DocumentId offset = id_ - first;
-      if (!within || (*within)[offset / 64] >> (offset % 64) & 1) Take(place, offset, set);
+      if (!within || within->set[offset / 64] >> (offset % 64) & 1) Take(place, offset, set);
     }
   }
 
@@ -173,7 +178,7 @@ class OrNode : public Node {
     }
     return most;
   }
-  void Add(const Place& place, const Set* within, Set& set) override {
+  void Add(const Place& place, const Counted* within, Set& set) override {
     for (std::size_t i = 0; i < parts_.size(); ++i) {
       if (i % kPartsBetweenLooks == kPartsBetweenLooks - 1) place.look();
       parts_[i]->Add(place, within, set);
@@ -212,16 +217,18 @@ class AndNode : public Node {
     return bound;
   }
   std::uint64_t Most() const override { return parts_.front()->Most(); }
-  void Add(const Place& place, const Set* within, Set& set) override {
-    Set so_far{}, next;
+  void Add(const Place& place, const Counted* within, Set& set) override {
+    Counted so_far;
+    Set next;
     for (const NodePtr& part : parts_) {
       next.fill(0);
       part->Add(place, within, next);
-      so_far = next;
+      so_far.set = next;
+      so_far.Count();
       within = &so_far;
-      if (Count(so_far) == 0) return;
+      if (so_far.count == 0) return;
     }
-    for (std::size_t i = 0; i < kWords; ++i) set[i] |= so_far[i];
+    for (std::size_t i = 0; i < kWords; ++i) set[i] |= so_far.set[i];
   }
 
  private:
@@ -235,11 +242,13 @@ class AndNotNode : public Node {
 
   DocumentId Bound() const override { return wanted_->Bound(); }
   std::uint64_t Most() const override { return wanted_->Most(); }
-  void Add(const Place& place, const Set* within, Set& set) override {
-    Set wanted{}, unwanted{};
-    wanted_->Add(place, within, wanted);
+  void Add(const Place& place, const Counted* within, Set& set) override {
+    Counted wanted;
+    Set unwanted{};
+    wanted_->Add(place, within, wanted.set);
+    wanted.Count();
     unwanted_->Add(place, &wanted, unwanted);
-    for (std::size_t i = 0; i < kWords; ++i) set[i] |= wanted[i] & ~unwanted[i];
+    for (std::size_t i = 0; i < kWords; ++i) set[i] |= wanted.set[i] & ~unwanted[i];
   }
 
  private:

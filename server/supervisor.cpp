@@ -15,13 +15,14 @@
 #include <cstdlib>
 #include <cstring>
 #include <functional>
+#include <string>
 #include <system_error>
+#include <vector>
 
 #include "platform/log.h"
 #include "platform/share_table.h"
 #include "server/frames.h"
 #include "server/front.h"
-#include "server/host.h"
 #include "server/listener.h"
 #include "server/mounts.h"
 #include "server/signals.h"
@@ -63,8 +64,9 @@ void NotifyReady() {
 
 class Supervisor {
  public:
-  explicit Supervisor(const Config& config)
+  Supervisor(const Config& config, std::vector<std::string> host_command)
       : config_(config),
+        host_command_(std::move(host_command)),
         listener_(OpenListener(config)),
         signals_(OpenSignals({SIGCHLD, SIGTERM, SIGINT, SIGHUP})) {
     shares_ = ShareTable::Current();
@@ -76,6 +78,7 @@ class Supervisor {
  private:
   void StartParts();
   void Start(Part& part, const std::function<int(Descriptor lifeline)>& body);
+  int BecomeHost(Descriptor control, Descriptor lifeline);
   void Watch();
   void TakeSignals();
   void TakeLifeline(Part& part);
@@ -84,6 +87,7 @@ class Supervisor {
   bool Reap(Part& part);
 
   const Config& config_;
+  std::vector<std::string> host_command_;
   Descriptor listener_;
   Descriptor signals_;
   ShareMounts mounts_;
@@ -116,7 +120,7 @@ void Supervisor::StartParts() {
   Start(host, [&](Descriptor lifeline) {
     control.first.Close();
     listener_.Close();
-    return RunHost(config_, std::move(control.second), std::move(lifeline));
+    return BecomeHost(std::move(control.second), std::move(lifeline));
   });
   Demand(setns(own.Get(), CLONE_NEWPID) == 0, "setns");
   listener_.Close();
@@ -140,6 +144,21 @@ void Supervisor::Start(Part& part, const std::function<int(Descriptor)>& body) {
   for (Part& other : parts_) other.lifeline.Close();
   ReopenLog();
   _exit(body(std::move(lifeline.second)));
+}
+
+/// Request children are forked off the host all the time: it is a program of its own, without what
+/// the front and this process have in memory.
+int Supervisor::BecomeHost(Descriptor control, Descriptor lifeline) {
+  for (const Descriptor* kept : {&control, &lifeline}) {
+    fcntl(kept->Get(), F_SETFD, 0);
+    host_command_.push_back(std::to_string(kept->Get()));
+  }
+  std::vector<char*> words;
+  for (std::string& word : host_command_) words.push_back(word.data());
+  words.push_back(nullptr);
+  execv(words[0], words.data());
+  MARU_LOG("Failed to start %s", words[0]);
+  return 1;
 }
 
 void Supervisor::Watch() {
@@ -215,9 +234,9 @@ void Supervisor::End(Part& part) {
 
 }  // namespace
 
-int RunSupervisor(const Config& config) {
+int RunSupervisor(const Config& config, std::vector<std::string> host_command) {
   if (geteuid() != 0) throw std::runtime_error("the web server must be started by root");
-  return Supervisor(config).Run();
+  return Supervisor(config, std::move(host_command)).Run();
 }
 
 }  // namespace maru::server

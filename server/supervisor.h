@@ -1,5 +1,8 @@
 #pragma once
 
+#include <string>
+#include <vector>
+
 #include "platform/config.h"
 
 namespace maru::server {
@@ -8,7 +11,8 @@ namespace maru::server {
 /// own, starts the front and the host and stays with them. Ends, with everything it started, on
 /// SIGTERM and SIGINT (returns 0), and when one of the two ends by itself (logs that and returns
 /// 1). SIGHUP: looks at the shares at once and passes it on. Needs root. Throws std::runtime_error
-/// when it cannot start.
-int RunSupervisor(const Config& config);
+/// when it cannot start. `host_command` is the host's program, an absolute path, and its arguments,
+/// to which the two sockets are added.
+int RunSupervisor(const Config& config, std::vector<std::string> host_command);
 
 }  // namespace maru::server
