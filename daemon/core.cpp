@@ -81,7 +81,7 @@ void Answer(Core& core, const Identity& caller, const std::string& line, const O
   } catch (...) {
     reply = Internal("unknown exception");
   }
-  output(reply);
+  output(json::ToString(reply), true);
 }
 
 }  // namespace maru::daemon

@@ -53,7 +53,8 @@ struct Core {
   std::chrono::steady_clock::time_point started = std::chrono::steady_clock::now();
 };
 
-using Output = std::function<void(const Json::Value&)>;
+/// Takes one message, a line without its end; `last` is told with the one that has "success".
+using Output = std::function<void(std::string_view message, bool last)>;
 /// True when nobody waits for the answer any more, or it takes too long.
 using Cancelled = std::function<bool()>;
 

@@ -3,6 +3,9 @@
 #include <algorithm>
 #include <cmath>
 #include <limits>
+#include <map>
+
+#include "platform/json.h"
 
 namespace maru::daemon {
 namespace {
@@ -27,18 +30,22 @@ Json::Value AuthorsOf(const Hit& hit) {
   return authors;
 }
 
-Json::Value ValueOf(const Place& place, const Hit& hit, std::string_view field) {
-  if (field == index::kPath) return FullPath(place, hit.path);
-  if (field == index::kName) return hit.record.name;
-  if (field == index::kExtension) return index::ExtensionOf(hit.record.name);
-  if (field == index::kIsDir) return hit.record.is_dir;
-  if (field == index::kSize) return Json::UInt64{hit.record.size};
-  if (field == index::kOwner) return std::to_string(hit.owner);
-  if (field == index::kModTime) return Json::Int64{hit.record.mtime};
-  if (field == index::kKind) return KindOf(hit);
-  if (field == index::kTitle) return hit.record.title;
-  if (field == index::kAuthors) return AuthorsOf(hit);
-  return {};
+void AddField(json::ObjectWriter& message, const Place& place, const Hit& hit,
+              std::string_view field) {
+  if (field == index::kPath) return message.AddText(field, FullPath(place, hit.path));
+  if (field == index::kName) return message.AddText(field, hit.record.name);
+  if (field == index::kExtension) {
+    return message.AddText(field, index::ExtensionOf(hit.record.name));
+  }
+  if (field == index::kIsDir) return message.AddFlag(field, hit.record.is_dir);
+  if (field == index::kSize) {
+    return message.AddNumber(field, static_cast<std::int64_t>(hit.record.size));
+  }
+  if (field == index::kOwner) return message.AddText(field, std::to_string(hit.owner));
+  if (field == index::kModTime) return message.AddNumber(field, hit.record.mtime);
+  if (field == index::kKind) return message.AddText(field, KindOf(hit));
+  if (field == index::kTitle) return message.AddText(field, hit.record.title);
+  message.AddValue(field, field == index::kAuthors ? AuthorsOf(hit) : Json::Value());
 }
 
 std::size_t Bounded(std::int64_t number, std::int64_t least, std::int64_t most,
@@ -49,29 +56,29 @@ std::size_t Bounded(std::int64_t number, std::int64_t least, std::int64_t most,
 }  // namespace
 
 std::vector<const Field*> ReadFields(const Arguments& arguments) {
-  std::vector<const Field*> fields;
+  std::map<std::string_view, const Field*> fields = {
+      {index::kOwner, index::FindField(index::kOwner)}};
   for (const char* list : {"load_field", "fields"}) {
     for (const std::string& name : arguments.Strings(list, kMaxFieldNames, kMaxFieldName)) {
       const Field* field = index::FindField(name);
       if (!field) arguments.Refuse(list, "names an unknown field, " + Quoted(name));
-      if (field->name == index::kText) continue;
-      if (std::find(fields.begin(), fields.end(), field) == fields.end()) fields.push_back(field);
+      if (field->name != index::kText) fields[field->name] = field;
     }
   }
-  return fields;
+  std::vector<const Field*> in_order;
+  for (const auto& [name, field] : fields) in_order.push_back(field);
+  return in_order;
 }
 
-Json::Value HitMessage(const Place& place, const Hit& hit,
-                       const std::vector<const Field*>& fields) {
-  Json::Value message(Json::objectValue);
-  for (const Field* field : fields) {
-    message[std::string(field->name)] = ValueOf(place, hit, field->name);
-  }
-  message[std::string(index::kOwner)] = std::to_string(hit.owner);
-  message["doc_id"] = hit.document;
-  message["id"] = place.id;
-  message["score"] = Json::Int64{std::llround(hit.score * 1000)};
-  return message;
+std::string HitMessage(const Place& place, const Hit& hit, const std::vector<const Field*>& fields,
+                       const Json::Value& highlight) {
+  json::ObjectWriter message;
+  for (const Field* field : fields) AddField(message, place, hit, field->name);
+  message.AddNumber("doc_id", hit.document);
+  if (!highlight.isNull()) message.AddValue("highlight", highlight);
+  message.AddText("id", place.id);
+  message.AddNumber("score", std::llround(hit.score * 1000));
+  return message.Take();
 }
 
 index::FragmentOptions ReadFragmentOptions(const Arguments& arguments) {

@@ -10,13 +10,15 @@
 
 namespace maru::daemon {
 
-/// The fields named by the lists "load_field" and "fields", each once. MARUMDTextContent is taken
-/// and left out: texts are shown in fragments only. Throws Error (120) for an unknown name.
+/// The fields that a hit's message has: those named by the lists "load_field" and "fields" and the
+/// owner, in the order of their names. MARUMDTextContent is taken and left out: texts are shown in
+/// fragments only. Throws Error (120) for an unknown name.
 std::vector<const index::Field*> ReadFields(const Arguments& arguments);
 
-/// A hit's message: the fields, and what every hit has (owner, doc_id, id, score).
-Json::Value HitMessage(const Place& place, const index::Hit& hit,
-                       const std::vector<const index::Field*>& fields);
+/// A hit's message: the fields, doc_id, "highlight" unless that is null, id and score.
+std::string HitMessage(const Place& place, const index::Hit& hit,
+                       const std::vector<const index::Field*>& fields,
+                       const Json::Value& highlight);
 
 /// What a highlight asks for, of one field.
 index::FragmentOptions ReadFragmentOptions(const Arguments& arguments);

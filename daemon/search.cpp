@@ -5,6 +5,7 @@
 #include "daemon/hit.h"
 #include "daemon/page_check.h"
 #include "daemon/question.h"
+#include "platform/json.h"
 
 namespace maru::daemon {
 namespace {
@@ -160,16 +161,16 @@ Json::Value SearchCommand(const Request& request) {
     }
     page = CheckedPage(wish, *reader);
   }
-  Json::Value total;
-  total["total"] = Json::UInt64{page.total};
-  request.output(total);
+  json::ObjectWriter total;
+  total.AddNumber("total", static_cast<std::int64_t>(page.total));
+  request.output(total.Take(), false);
   for (const index::Hit& hit : page.hits) {
-    Json::Value message = HitMessage(wish.scope.places[hit.share], hit, wish.fields);
+    Json::Value highlight;
     if (!wish.highlights.empty()) {
       if (request.cancelled()) throw index::Cancelled();
-      message["highlight"] = FragmentsOf(*reader, hit, wish.query, wish.highlights);
+      highlight = FragmentsOf(*reader, hit, wish.query, wish.highlights);
     }
-    request.output(message);
+    request.output(HitMessage(wish.scope.places[hit.share], hit, wish.fields, highlight), false);
   }
   return {};
 }

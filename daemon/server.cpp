@@ -211,12 +211,12 @@ void Server::Carry(Connection& connection, const std::string& line) noexcept {
   if (cancelled()) return;
   ++carried_;
   std::string reply;
-  const Output output = [&](const Json::Value& message) {
-    if (reply.size() > kMaxReply && !message.isMember("success")) {
+  const Output output = [&](std::string_view message, bool last) {
+    if (reply.size() > kMaxReply && !last) {
       throw maruseeker::Error(maruseeker::kErrorBadParameter,
                               "The page is too large; ask for a smaller one");
     }
-    reply += LineOf(message);
+    reply.append(message).append(1, '\n');
   };
   try {
     Answer(core_, connection.Caller(), line, output, cancelled);

@@ -177,6 +177,60 @@ std::string ToString(const Json::Value& value) {
   return std::move(stream).str();
 }
 
+void ObjectWriter::AddText(std::string_view key, std::string_view text) {
+  BeginMember(key);
+  Write(text);
+}
+
+void ObjectWriter::AddNumber(std::string_view key, std::int64_t number) {
+  BeginMember(key);
+  text_ += std::to_string(number);
+}
+
+void ObjectWriter::AddFlag(std::string_view key, bool flag) {
+  BeginMember(key);
+  text_ += flag ? "true" : "false";
+}
+
+void ObjectWriter::AddValue(std::string_view key, const Json::Value& value) {
+  BeginMember(key);
+  text_ += ToString(value);
+}
+
+std::string ObjectWriter::Take() {
+  text_ += '}';
+  return std::move(text_);
+}
+
+void ObjectWriter::BeginMember(std::string_view key) {
+  if (text_.size() > 1) text_ += ',';
+  Write(key);
+  text_ += ':';
+}
+
+void ObjectWriter::Write(std::string_view text) {
+  constexpr std::string_view kNamed = "\b\f\n\r\t";
+  constexpr std::string_view kNames = "bfnrt";
+  constexpr std::string_view kDigits = "0123456789abcdef";
+  text_ += '"';
+  std::size_t run = 0;  // the start of what is not written yet
+  for (std::size_t at = 0; at < text.size(); ++at) {
+    const auto c = static_cast<unsigned char>(text[at]);
+    if (c >= ' ' && c != '"' && c != '\\') continue;
+    text_.append(text, run, at - run);
+    run = at + 1;
+    text_ += '\\';
+    if (const std::size_t named = kNamed.find(text[at]); named != std::string_view::npos) {
+      text_ += kNames[named];
+    } else if (c >= ' ') {
+      text_ += text[at];
+    } else {
+      text_.append("u00").append({kDigits[c / 16], kDigits[c % 16]});
+    }
+  }
+  text_.append(text, run).append("\"");
+}
+
 bool FromFile(const std::string& path, Json::Value& value) {
   std::string text;
   if (!ReadWholeFile(path, kMaxSize, text)) return false;

@@ -2,7 +2,9 @@
 
 #include <json/value.h>
 
+#include <cstdint>
 #include <string>
+#include <string_view>
 
 /// Text and file operations on JSON values that stock JsonCpp lacks.
 ///
@@ -24,6 +26,24 @@ bool FromString(const std::string& text, Json::Value& value, std::string* error 
 /// One line, no line breaks, keys sorted. Bytes of strings are kept as they are, also where they
 /// are not UTF-8 (file names may be anything).
 std::string ToString(const Json::Value& value);
+
+/// An object written member by member, as ToString would write it: for messages that are many, and
+/// whose values nobody needs. Members come in the order of adding; the caller adds each key once.
+class ObjectWriter {
+ public:
+  void AddText(std::string_view key, std::string_view text);
+  void AddNumber(std::string_view key, std::int64_t number);
+  void AddFlag(std::string_view key, bool flag);
+  void AddValue(std::string_view key, const Json::Value& value);
+  /// Ends the object and hands it over; nothing can be added after that.
+  std::string Take();
+
+ private:
+  void BeginMember(std::string_view key);
+  void Write(std::string_view text);
+
+  std::string text_ = "{";
+};
 
 /// Reads and parses a regular file, without following a symbolic link in the last component. On
 /// false `value` is unchanged; `errno` tells of the file, or is 0 when the text was at fault.

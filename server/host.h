@@ -5,8 +5,9 @@
 
 namespace maru::server {
 
-/// The host's whole life, in a process of its own, the first of a new PID namespace. `control` leads to the front; `lifeline` to the supervisor: one byte is written when
-/// the host is ready, and the host ends when the other end is closed. Returns the exit status.
+/// The host's whole life, in a process of its own, the first of a new PID namespace. `control`
+/// leads to the front; `lifeline` to the supervisor: one byte is written when the host is ready,
+/// and the host ends when the other end is closed. Returns the exit status.
 int RunHost(const Config& config, Descriptor control, Descriptor lifeline);
 
 }  // namespace maru::server

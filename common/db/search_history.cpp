@@ -147,7 +147,8 @@ bool SearchHistoryTable::Prune(const SearchHistory& newest, int max) {
   const Condition others =
       newest.SameOwner() && Condition::ConditionFactory<int>("id", "!=", newest.id);
   std::vector<SearchHistory> excess;
-  if (!TableBase::GetAll(excess, others, SelectParam(max - 1, 1, "create_time", false))) return false;
+  if (!TableBase::GetAll(excess, others, SelectParam(max - 1, 1, "create_time", false)))
+    return false;
   if (excess.empty()) return true;
   return TableBase::Delete(others && excess.front().NotNewer());
 }

@@ -79,7 +79,13 @@ class DaemonTest : public testing::Test {
   std::vector<Json::Value> Say(const Identity& who, const std::string& line) {
     std::vector<Json::Value> messages;
     Answer(
-        core_, who, line, [&](const Json::Value& message) { messages.push_back(message); },
+        core_, who, line,
+        [&](std::string_view message, bool last) {
+          Json::Value value;
+          EXPECT_TRUE(json::FromString(std::string(message), value)) << message;
+          EXPECT_EQ(value.isMember("success"), last);
+          messages.push_back(value);
+        },
         cancelled_);
     return messages;
   }

@@ -139,6 +139,28 @@ TEST(Json, KeepsBytesThatAreNotUTF8) {
   EXPECT_EQ(Parse(text)["path"].asString(), name);
 }
 
+TEST(Json, ObjectWriterWritesAsToStringDoes) {
+  std::string every;
+  for (int c = 0; c < 256; ++c) every += static_cast<char>(c);
+  for (const std::string& text : {std::string(), every, every + "é日本\\", std::string("\0", 1)}) {
+    for (const std::int64_t number : {std::int64_t{0}, INT64_MIN, INT64_MAX}) {
+      Json::Value value, list;
+      list.append(text);
+      json::ObjectWriter writer;
+      writer.AddFlag("a\n", text.empty());
+      writer.AddNumber("b", number);
+      writer.AddText("c", text);
+      writer.AddValue("d", list);
+      value["a\n"] = text.empty();
+      value["b"] = Json::Int64{number};
+      value["c"] = text;
+      value["d"] = list;
+      EXPECT_EQ(writer.Take(), json::ToString(value));
+    }
+  }
+  EXPECT_EQ(json::ObjectWriter().Take(), "{}");
+}
+
 TEST(Json, ReadsRegularFilesOnly) {
   const TempFolder folder;
   Json::Value value = "before";
