@@ -34,8 +34,8 @@ std::shared_ptr<const DirectoryTable> SharedIndex::Table(const Xapian::Database&
   if (ahead) return table;
   table_ = table;
   engine_name_ = engine_name;
-  lengths_table_ = nullptr;
-  lengths_ = nullptr;
+  decoded_table_ = nullptr;
+  decoded_ = nullptr;
   std::erase_if(known_, [](const Known& known) { return known.table.use_count() <= 1; });
   return table_;
 }
@@ -55,16 +55,16 @@ std::shared_ptr<const Eyes> SharedIndex::EyesOf(const std::shared_ptr<const Dire
   return eyes;
 }
 
-std::shared_ptr<const Lengths> SharedIndex::LengthsOf(
+std::shared_ptr<const Decoded> SharedIndex::DecodedOf(
     const std::shared_ptr<const DirectoryTable>& table, DocumentId last) {
   const std::lock_guard lock(mutex_);
-  if (lengths_table_ == table) return lengths_;
-  auto lengths = std::make_shared<const Lengths>(last);
+  if (decoded_table_ == table) return decoded_;
+  auto decoded = std::make_shared<const Decoded>(last);
   if (table == table_) {
-    lengths_table_ = table;
-    lengths_ = lengths;
+    decoded_table_ = table;
+    decoded_ = decoded;
   }
-  return lengths;
+  return decoded;
 }
 
 FileIdentity FileIdentity::Of(const std::string& path) {

@@ -33,7 +33,7 @@ class SharedIndex {
                                      const Identity& who, DocumentId last);
 
   /// Of the documents of the state that the table belongs to; those of the newest are kept.
-  std::shared_ptr<const Lengths> LengthsOf(const std::shared_ptr<const DirectoryTable>& table,
+  std::shared_ptr<const Decoded> DecodedOf(const std::shared_ptr<const DirectoryTable>& table,
                                            DocumentId last);
 
   TextReader texts;
@@ -49,8 +49,8 @@ class SharedIndex {
     std::shared_ptr<const Eyes> eyes;
   };
   std::vector<Known> known_;
-  std::shared_ptr<const DirectoryTable> lengths_table_;
-  std::shared_ptr<const Lengths> lengths_;
+  std::shared_ptr<const DirectoryTable> decoded_table_;
+  std::shared_ptr<const Decoded> decoded_;
 };
 
 /// Tells a file from the one that took its place.
@@ -80,8 +80,8 @@ class OpenIndices {
     return shares_[share].index->EyesOf(shares_[share].table, who,
                                         shares_[share].database.get_lastdocid());
   }
-  std::shared_ptr<const Lengths> LengthsOf(std::size_t share) const {
-    return shares_[share].index->LengthsOf(shares_[share].table,
+  std::shared_ptr<const Decoded> DecodedOf(std::size_t share) const {
+    return shares_[share].index->DecodedOf(shares_[share].table,
                                            shares_[share].database.get_lastdocid());
   }
   const std::shared_ptr<const ShareNumbers>& Numbers() const { return numbers_; }

@@ -33,24 +33,6 @@ struct Counted {
 
 }  // namespace
 
-const std::uint32_t* Lengths::Of(DocumentId first, const Xapian::Database& database) const {
-  const std::size_t number = first / MatchBlock::kDocuments;
-  if (read_[number].load(std::memory_order_acquire)) return blocks_[number].data();
-  std::vector<std::uint32_t> lengths(MatchBlock::kDocuments);
-  auto at = database.postlist_begin({});
-  const auto end = database.postlist_end({});
-  if (at != end) at.skip_to(std::max<DocumentId>(first, 1));
-  for (; at != end && *at - first < MatchBlock::kDocuments; ++at) {
-    lengths[*at - first] = at.get_doclength();
-  }
-  const std::lock_guard lock(mutex_);
-  if (!read_[number].load(std::memory_order_relaxed)) {
-    blocks_[number] = std::move(lengths);
-    read_[number].store(true, std::memory_order_release);
-  }
-  return blocks_[number].data();
-}
-
 Weighing::Weighing(const Xapian::Database& all) : all_(all), documents_(all.get_doccount()) {
   const double average = all.get_average_length();
   if (average > 0) per_average_ = 1 / average;
@@ -94,52 +76,80 @@ namespace {
 using Node = Matches::Node;
 using NodePtr = std::unique_ptr<Node>;
 
+/// What the two kinds of terms have in common.
 class TermNode : public Node {
  public:
+  /// Until then its documents get no weight.
+  void Weigh(double weight) { weight_ = weight; }
+  std::uint64_t Most() const override { return documents_; }
+
+ protected:
+  TermNode(std::uint64_t documents, DocumentId last)
+      : documents_(documents), per_block_(documents * MatchBlock::kDocuments / (last + 1ull)) {}
+
+  /// Whether the term is better looked up for each document of the set.
+  bool IsMuchMoreThan(const Counted* within) const {
+    return within && within->count * kMuchMore < per_block_;
+  }
+  static bool IsIn(const Counted* within, DocumentId offset) {
+    return !within || within->set[offset / 64] >> (offset % 64) & 1;
+  }
+
+  /// Takes a document; `count` and `length` are asked for what they say when that is needed.
+  template <class CountOf, class LengthOf>
+  void Take(const Place& place, DocumentId offset, Set& set, CountOf&& count_of,
+            LengthOf&& length_of) const {
+    set[offset / 64] |= Bits{1} << (offset % 64);
+    if (weight_ == 0) return;
+    const double count = count_of();
+    const double against =
+        place.against
+            ? place.against[offset]
+            : place.weighing->Against(place.lengths ? place.lengths[offset] : length_of());
+    place.block.weights[offset] += weight_ * count / (against + count);
+  }
+
+ private:
+  std::uint64_t documents_, per_block_;
+  double weight_ = 0;
+};
+
+/// A term whose postings the engine decodes.
+class EngineTerm : public TermNode {
+ public:
   /// An empty term is in every document.
-  TermNode(const Xapian::Database& database, const std::string& term)
-      : at_(database.postlist_begin(term)),
-        end_(database.postlist_end(term)),
-        documents_(term.empty() ? database.get_doccount() : database.get_termfreq(term)),
-        per_block_(documents_ * MatchBlock::kDocuments / (database.get_lastdocid() + 1)) {
+  EngineTerm(const Xapian::Database& database, const std::string& term)
+      : TermNode(term.empty() ? database.get_doccount() : database.get_termfreq(term),
+                 database.get_lastdocid()),
+        at_(database.postlist_begin(term)),
+        end_(database.postlist_end(term)) {
     Look();
   }
 
-  /// Until then its documents get no weight.
-  void Weigh(double weight) { weight_ = weight; }
-
   DocumentId Bound() const override { return id_; }
-  std::uint64_t Most() const override { return documents_; }
 
   void Add(const Place& place, const Counted* within, Set& set) override {
     const DocumentId first = place.block.first;
+    const auto take = [&](DocumentId offset) {
+      Take(
+          place, offset, set, [&] { return at_.get_wdf(); }, [&] { return at_.get_doclength(); });
+    };
     if (id_ < first) SkipTo(first);
-    if (within && within->count * kMuchMore < per_block_) {
+    if (IsMuchMoreThan(within)) {
       for (std::size_t i = 0; i < kWords; ++i) {
         ForEachBit(i, within->set[i], [&](DocumentId offset) {
           if (id_ < first + offset) SkipTo(first + offset);
-          if (id_ == first + offset) Take(place, offset, set);
+          if (id_ == first + offset) take(offset);
         });
       }
       return;
     }
     for (; id_ - first < MatchBlock::kDocuments; Step()) {
-      const DocumentId offset = id_ - first;
-      if (!within || within->set[offset / 64] >> (offset % 64) & 1) Take(place, offset, set);
+      if (IsIn(within, id_ - first)) take(id_ - first);
     }
   }
 
  private:
-  void Take(const Place& place, DocumentId offset, Set& set) {
-    set[offset / 64] |= Bits{1} << (offset % 64);
-    if (weight_ == 0) return;
-    const double count = at_.get_wdf();
-    const double against =
-        place.against
-            ? place.against[offset]
-            : place.weighing->Against(place.lengths ? place.lengths[offset] : at_.get_doclength());
-    place.block.weights[offset] += weight_ * count / (against + count);
-  }
   void Look() { id_ = at_ == end_ ? kNone : *at_; }
   void Step() {
     ++at_;
@@ -152,9 +162,51 @@ class TermNode : public Node {
   }
 
   Xapian::PostingIterator at_, end_;
-  std::uint64_t documents_, per_block_;
-  double weight_ = 0;
   DocumentId id_ = kNone;
+};
+
+/// A term whose postings are kept decoded.
+class KnownTerm : public TermNode {
+ public:
+  KnownTerm(const Xapian::Database& database, std::shared_ptr<const Postings> postings)
+      : TermNode(postings->ids.size(), database.get_lastdocid()),
+        database_(database),
+        postings_(std::move(postings)),
+        at_(postings_->ids.begin()) {}
+
+  DocumentId Bound() const override { return at_ == postings_->ids.end() ? kNone : *at_; }
+
+  void Add(const Place& place, const Counted* within, Set& set) override {
+    const DocumentId first = place.block.first;
+    const auto begin = postings_->ids.begin();
+    at_ = std::lower_bound(at_, postings_->ids.end(), first);
+    const auto end =
+        std::lower_bound(at_, postings_->ids.end(), first + DocumentId{MatchBlock::kDocuments});
+    const auto take = [&] {
+      Take(
+          place, *at_ - first, set,
+          [&] { return postings_->counts[static_cast<std::size_t>(at_ - begin)]; },
+          [&] { return database_.get_doclength(*at_); });
+    };
+    if (IsMuchMoreThan(within)) {
+      for (std::size_t i = 0; i < kWords; ++i) {
+        ForEachBit(i, within->set[i], [&](DocumentId offset) {
+          at_ = std::lower_bound(at_, end, first + offset);
+          if (at_ != end && *at_ == first + offset) take();
+        });
+      }
+      at_ = end;
+      return;
+    }
+    for (; at_ != end; ++at_) {
+      if (IsIn(within, *at_ - first)) take();
+    }
+  }
+
+ private:
+  const Xapian::Database& database_;
+  std::shared_ptr<const Postings> postings_;
+  std::vector<DocumentId>::const_iterator at_;
 };
 
 class OrNode : public Node {
@@ -257,9 +309,9 @@ class AndNotNode : public Node {
 
 class Builder {
  public:
-  Builder(const Xapian::Database& database, const Weighing* weighing,
+  Builder(const Xapian::Database& database, const Decoded& decoded, const Weighing* weighing,
           const std::function<void()>& look)
-      : database_(database), weighing_(weighing), look_(look) {}
+      : database_(database), decoded_(decoded), weighing_(weighing), look_(look) {}
 
   NodePtr Build(const Plan& plan, double factor) const {
     factor *= plan.factor;
@@ -267,7 +319,7 @@ class Builder {
       case Plan::Kind::kNothing:
         return Any({}, factor);
       case Plan::Kind::kEverything:
-        return std::make_unique<TermNode>(database_, std::string());
+        return std::make_unique<EngineTerm>(database_, std::string());
       case Plan::Kind::kTerm:
         return Term(plan.term, factor);
       case Plan::Kind::kOr:
@@ -287,7 +339,12 @@ class Builder {
 
  private:
   NodePtr Term(const std::string& term, double factor) const {
-    auto node = std::make_unique<TermNode>(database_, term);
+    std::unique_ptr<TermNode> node;
+    if (auto postings = decoded_.Of(term, database_)) {
+      node = std::make_unique<KnownTerm>(database_, std::move(postings));
+    } else {
+      node = std::make_unique<EngineTerm>(database_, term);
+    }
     if (weighing_ && factor != 0 && node->Most() > 0) node->Weigh(factor * weighing_->Of(term));
     return node;
   }
@@ -308,22 +365,24 @@ class Builder {
   }
 
   const Xapian::Database& database_;
+  const Decoded& decoded_;
   const Weighing* weighing_;
   const std::function<void()>& look_;
 };
 
 }  // namespace
 
-Matches::Matches(const Xapian::Database& database, const Plan& plan, const Weighing* weighing,
-                 const Lengths* lengths, const std::function<void()>& look)
+Matches::Matches(const Xapian::Database& database, const Decoded& decoded, const Plan& plan,
+                 const Weighing* weighing, const std::function<void()>& look)
     : database_(database),
+      decoded_(decoded),
       weighing_(weighing),
-      lengths_(lengths),
       look_(look),
-      root_(Builder(database, weighing, look).Build(plan, 1)),
+      root_(Builder(database, decoded, weighing, look).Build(plan, 1)),
       last_(database.get_lastdocid()) {
-  if (root_->Most() * MatchBlock::kDocuments < kManyMatches * (last_ + 1ull)) lengths_ = nullptr;
-  if (lengths_ && root_->Most() > last_) against_.resize(MatchBlock::kDocuments);
+  if (!weighing) return;
+  many_ = root_->Most() * MatchBlock::kDocuments >= kManyMatches * (last_ + 1ull);
+  if (root_->Most() > last_) against_.resize(MatchBlock::kDocuments);
 }
 
 Matches::~Matches() = default;
@@ -334,7 +393,8 @@ bool Matches::Next(MatchBlock& block) {
   look_();
   block.Begin(bound / MatchBlock::kDocuments * MatchBlock::kDocuments);
   next_ = block.first + MatchBlock::kDocuments;
-  const std::uint32_t* lengths = lengths_ ? lengths_->Of(block.first, database_) : nullptr;
+  const std::uint32_t* lengths =
+      many_ ? decoded_.Lengths(block.first, database_) : decoded_.KnownLengths(block.first);
   if (!against_.empty()) {
     std::transform(lengths, lengths + MatchBlock::kDocuments, against_.begin(),
                    [&](std::uint32_t length) { return weighing_->Against(length); });

@@ -4,17 +4,16 @@
 
 #include <algorithm>
 #include <array>
-#include <atomic>
 #include <cstddef>
 #include <cstdint>
 #include <functional>
 #include <memory>
-#include <mutex>
 #include <string>
 #include <unordered_map>
 #include <vector>
 
 #include "index/bits.h"
+#include "index/decoded.h"
 #include "index/plan.h"
 
 /// What matches a plan of terms, all of it, in one pass over the postings: a total has to look at
@@ -24,7 +23,7 @@ namespace maru::index {
 
 /// The matches among kDocuments documents from `first` on, which is a multiple of that.
 struct MatchBlock {
-  static constexpr std::size_t kDocuments = 4096;
+  static constexpr std::size_t kDocuments = kBlockDocuments;
   static constexpr std::size_t kWords = kDocuments / 64;
 
   DocumentId first = 0;
@@ -37,23 +36,6 @@ struct MatchBlock {
     bits.fill(0);
     weights.fill(0);
   }
-};
-
-/// How many words each document of one database has, at one state; read when asked for.
-/// Thread-safe.
-class Lengths {
- public:
-  explicit Lengths(DocumentId last)
-      : blocks_(last / MatchBlock::kDocuments + 1), read_(blocks_.size()) {}
-
-  /// Those of the block from `first` on; `database` is at that state.
-  const std::uint32_t* Of(DocumentId first, const Xapian::Database& database) const;
-
- private:
-  mutable std::mutex mutex_;
-  mutable std::vector<std::vector<std::uint32_t>> blocks_;
-  /// Which of them stand.
-  mutable std::vector<std::atomic<bool>> read_;
 };
 
 /// Weighs terms as the engine does by default: BM25 with k1 = 1, k3 = 1, b = 0.5 and lengths of at
@@ -80,10 +62,10 @@ class Weighing {
 /// The matches of a plan of terms in one database.
 class Matches {
  public:
-  /// Without `weighing` all weights are 0; with it `lengths` are the database's. `look` is called
-  /// now and then and may throw. All outlive this object.
-  Matches(const Xapian::Database& database, const Plan& plan, const Weighing* weighing,
-          const Lengths* lengths, const std::function<void()>& look);
+  /// `decoded` is the database's. Without `weighing` all weights are 0. `look` is called now and
+  /// then and may throw. All outlive this object.
+  Matches(const Xapian::Database& database, const Decoded& decoded, const Plan& plan,
+          const Weighing* weighing, const std::function<void()>& look);
   ~Matches();
 
   /// Fills in the next block that may have matches; false when there are no more.
@@ -93,11 +75,13 @@ class Matches {
 
  private:
   const Xapian::Database& database_;
+  const Decoded& decoded_;
   const Weighing* weighing_;
-  const Lengths* lengths_;
   const std::function<void()>& look_;
   std::unique_ptr<Node> root_;
   DocumentId last_;
+  /// Whether so many match that the lengths of a block are worth reading.
+  bool many_ = false;
   /// Of the block, where most documents may match.
   std::vector<double> against_;
   /// The block to come begins here or later.

@@ -198,8 +198,8 @@ void EngineReader::ForEachSeen(const Plan& plan, const Weighing* weighing, Use&&
   const std::function<void()> look = [this] { LookUp(); };
   for (std::size_t share = 0; share < indices_->Count(); ++share) {
     const Xapian::Database& database = indices_->Database(share);
-    const auto lengths = weighing ? indices_->LengthsOf(share) : nullptr;
-    Matches matches(database, plan, weighing, lengths.get(), look);
+    const auto decoded = indices_->DecodedOf(share);
+    Matches matches(database, *decoded, plan, weighing, look);
     Places places(database);
     const auto place = [&](DocumentId id) { return places.Of(id); };
     while (matches.Next(*block)) {
