@@ -25,6 +25,9 @@ constexpr int kAcceptsAtOnce = 64;
 /// A connection that has been silent for less is left alone when others need its place.
 constexpr std::chrono::milliseconds kSilence{250};
 
+/// A request may ask whether it is still wanted far more often than the kernel need be.
+constexpr std::chrono::milliseconds kBetweenLooks{1};
+
 std::string LineOf(const Json::Value& message) {
   return json::ToString(message) + "\n";
 }
@@ -205,8 +208,13 @@ void Server::Start(Connection& connection, std::string line) {
 /// In a worker. What cannot be sent at once is left to the loop.
 void Server::Carry(Connection& connection, const std::string& line) noexcept {
   const auto deadline = Clock::now() + limits_.answer;
+  auto next_look = Clock::time_point::min();
   const Cancelled cancelled = [&] {
-    return stopped_ || Clock::now() > deadline || HasHungUp(connection.Socket());
+    const auto now = Clock::now();
+    if (stopped_ || now > deadline) return true;
+    if (now < next_look) return false;
+    next_look = now + kBetweenLooks;
+    return HasHungUp(connection.Socket());
   };
   if (cancelled()) return;
   ++carried_;
