@@ -96,41 +96,6 @@ void AppendEscaped(std::string& html, std::string_view text) {
   }
 }
 
-/// How many groups a chunk may hold.
-unsigned Promise(const StoredText& text, std::size_t chunk, const std::vector<MarkGroup>& groups,
-                 const std::vector<PhraseFinder>& phrases) {
-  unsigned promise = 0;
-  for (std::size_t i = 0; i < groups.size(); ++i) {
-    if (groups[i].phrase) {
-      promise += phrases[i].MayBegin(text, chunk);
-      continue;
-    }
-    promise +=
-        std::any_of(groups[i].words.begin(), groups[i].words.end(),
-                    [&](const std::string& word) { return text.MayHold(chunk, HashWord(word)); });
-  }
-  return promise;
-}
-
-/// The chunks that promise the most, in that order.
-std::vector<std::size_t> Promising(const StoredText& text, const std::vector<MarkGroup>& groups) {
-  std::vector<std::size_t> chunks;
-  if (text.Chunks() == 1) return {0};
-  std::vector<PhraseFinder> phrases;
-  for (const MarkGroup& group : groups) {
-    phrases.emplace_back(group.phrase ? group.words : std::vector<std::string>{});
-  }
-  std::vector<unsigned> promises;
-  for (std::size_t chunk = 0; chunk < text.Chunks(); ++chunk) {
-    promises.push_back(Promise(text, chunk, groups, phrases));
-    if (promises.back() > 0) chunks.push_back(chunk);
-  }
-  std::stable_sort(chunks.begin(), chunks.end(),
-                   [&](std::size_t a, std::size_t b) { return promises[a] > promises[b]; });
-  if (chunks.size() > kMaxChunks) chunks.resize(kMaxChunks);
-  return chunks;
-}
-
 struct Found {
   Window window;
   std::string html;
@@ -201,24 +166,62 @@ std::string RenderWindow(std::string_view text, const Window& window,
   return begin < end ? html.substr(begin, end - begin) : std::string();
 }
 
-std::vector<Fragment> FragmentsOf(StoredText& text, const std::vector<MarkGroup>& groups,
-                                  const FragmentOptions& options) {
-  const Matcher matcher(groups);
+FragmentFinder::FragmentFinder(std::vector<MarkGroup> groups)
+    : groups_(std::move(groups)), matcher_(groups_) {
+  for (MarkGroup& group : groups_) {
+    if (!group.phrase) std::sort(group.words.begin(), group.words.end());
+    phrases_.emplace_back(group.phrase ? group.words : std::vector<std::string>());
+    std::vector<std::uint64_t>& hashes = all_.emplace_back();
+    for (const std::string& word : group.words) hashes.push_back(HashWord(word));
+  }
+}
+
+/// How many groups a chunk may hold.
+unsigned FragmentFinder::Promise(const StoredText& text, std::size_t chunk,
+                                 const PresentWords& present) const {
+  unsigned promise = 0;
+  for (std::size_t i = 0; i < groups_.size(); ++i) {
+    const auto may_hold = [&](std::uint64_t hash) { return text.MayHold(chunk, hash); };
+    promise += groups_[i].phrase ? phrases_[i].MayBegin(text, chunk)
+                                 : std::any_of(present[i].begin(), present[i].end(), may_hold);
+  }
+  return promise;
+}
+
+/// The chunks that promise the most, in that order.
+std::vector<std::size_t> FragmentFinder::Promising(const StoredText& text,
+                                                   const PresentWords& present) const {
+  std::vector<std::size_t> chunks;
+  if (text.Chunks() == 1) return {0};
+  std::vector<unsigned> promises;
+  for (std::size_t chunk = 0; chunk < text.Chunks(); ++chunk) {
+    promises.push_back(Promise(text, chunk, present));
+    if (promises.back() > 0) chunks.push_back(chunk);
+  }
+  std::stable_sort(chunks.begin(), chunks.end(),
+                   [&](std::size_t a, std::size_t b) { return promises[a] > promises[b]; });
+  if (chunks.size() > kMaxChunks) chunks.resize(kMaxChunks);
+  return chunks;
+}
+
+std::vector<Fragment> FragmentFinder::In(StoredText& text, const PresentWords& present,
+                                         const FragmentOptions& options) {
+  const auto groups = static_cast<std::size_t>(std::count_if(
+      present.begin(), present.end(), [](const auto& words) { return !words.empty(); }));
   std::vector<Found> found;
-  std::string piece;
   std::size_t matching = 0;
-  for (const std::size_t chunk : Promising(text, groups)) {
-    piece.clear();
-    if (!text.Append(chunk, piece)) continue;
-    std::vector<Match> matches = matcher.MatchesIn(piece);
+  for (const std::size_t chunk : Promising(text, present)) {
+    piece_.clear();
+    if (!text.Append(chunk, piece_)) continue;
+    std::vector<Match> matches = matcher_.MatchesIn(piece_);
     // Only a phrase can begin here and end in the next chunk.
-    if (matches.empty() && chunk + 1 < text.Chunks() && text.Append(chunk + 1, piece)) {
-      matches = matcher.MatchesIn(piece);
+    if (matches.empty() && chunk + 1 < text.Chunks() && text.Append(chunk + 1, piece_)) {
+      matches = matcher_.MatchesIn(piece_);
     }
-    for (const Window& window : BestWindows(piece, matches, options)) {
-      found.push_back({window, RenderWindow(piece, window, matches)});
+    for (const Window& window : BestWindows(piece_, matches, options)) {
+      found.push_back({window, RenderWindow(piece_, window, matches)});
     }
-    const bool enough = found.size() >= options.count && found[0].window.groups == groups.size();
+    const bool enough = found.size() >= options.count && found[0].window.groups >= groups;
     matching += !matches.empty();
     if (enough || matching == kMaxMatching) break;
   }
@@ -231,6 +234,13 @@ std::vector<Fragment> FragmentsOf(StoredText& text, const std::vector<MarkGroup>
     }
   }
   return fragments;
+}
+
+std::vector<Fragment> FragmentFinder::Whole(std::string_view text) const {
+  const std::vector<Match> matches = matcher_.MatchesIn(text);
+  if (matches.empty()) return {};
+  const Window whole{0, text.size(), 1, static_cast<unsigned>(matches.size())};
+  return {{RenderWindow(text, whole, matches), whole.matches}};
 }
 
 }  // namespace maru::index

@@ -7,8 +7,11 @@ namespace maru::index {
 namespace {
 
 constexpr std::size_t kBlock = 64;
-/// So many words are looked for block by block; more are told apart word by word.
-constexpr std::size_t kFewWords = 8;
+/// So many beginnings are looked for block by block; more are told apart word by word.
+constexpr std::size_t kFewProbes = 6;
+/// Words that have so many first letters in common are looked for together, as a word's forms are;
+/// when that leaves too many, fewer letters will do.
+constexpr std::size_t kBeginning = 3;
 
 std::uint64_t LengthBit(std::size_t length) {
   return std::uint64_t{1} << std::min<std::size_t>(length, 63);
@@ -65,21 +68,42 @@ Matcher::Matcher(const std::vector<MarkGroup>& groups) {
     }
   }
   // A longer run than the longest word is cut there: its last byte is not the word's.
-  plain_ =
-      words_.size() <= kFewWords && std::all_of(words_.begin(), words_.end(), [](const auto& row) {
+  if (std::all_of(words_.begin(), words_.end(), [](const auto& row) {
         return !row.first.empty() && row.first.size() < kMaxWord && IsAscii(row.first);
-      });
+      })) {
+    FindProbes(kBeginning);
+  }
+}
+
+void Matcher::FindProbes(std::size_t beginning) {
+  std::vector<std::string_view> beginnings;
+  for (const auto& [word, wanted] : words_) {
+    if (!beginnings.empty()) {
+      std::string_view& last = beginnings.back();
+      const auto common = static_cast<std::size_t>(
+          std::mismatch(last.begin(), last.end(), word.begin(), word.end()).first - last.begin());
+      if (common >= std::min(last.size(), beginning)) {
+        last = last.substr(0, common);
+        continue;
+      }
+    }
+    beginnings.push_back(word);
+  }
+  if (beginnings.size() > kFewProbes) {
+    if (beginning > 1) FindProbes(beginning - 1);
+    return;
+  }
+  for (const std::string_view letters : beginnings) {
+    probes_.push_back({letters.front(), letters.back(), letters.size() - 1});
+  }
 }
 
 /// Whether one of the words may begin in the block; true near the text's end.
 bool Matcher::MayBeginAt(std::string_view text, std::size_t block) const {
-  for (const auto& [word, wanted] : words_) {
-    if (block + kBlock + word.size() > text.size() ||
-        MayBeginIn(text.data() + block, word.size() - 1, word.front(), word.back())) {
-      return true;
-    }
-  }
-  return false;
+  return std::any_of(probes_.begin(), probes_.end(), [&](const Probe& probe) {
+    return block + kBlock + probe.offset >= text.size() ||
+           MayBeginIn(text.data() + block, probe.offset, probe.first, probe.last);
+  });
 }
 
 bool Matcher::MayBe(std::string_view word) const {
@@ -121,7 +145,7 @@ void Matcher::ForEachPlain(std::string_view text, Use&& use) const {
 
 template <class Use>
 void Matcher::ForEach(std::string_view text, Use&& use) const {
-  if (plain_ && IsAscii(text)) return ForEachPlain(text, use);
+  if (!probes_.empty() && IsAscii(text)) return ForEachPlain(text, use);
   Tokenizer tokenizer;
   Token token;
   char folded[kMaxWord];

@@ -47,14 +47,23 @@ class Matcher {
   void ForEach(std::string_view text, Use&& use) const;
   template <class Use>
   void ForEachPlain(std::string_view text, Use&& use) const;
+  void FindProbes(std::size_t beginning);
   bool MayBeginAt(std::string_view text, std::size_t block) const;
   bool MayBe(std::string_view word) const;
   template <class Use>
   bool Take(std::string_view text, const Token& token, Use& use) const;
 
+  /// Two bytes that words with one beginning have in common: their first, and one further on.
+  struct Probe {
+    char first;
+    char last;
+    std::size_t offset;
+  };
+
   std::map<std::string, std::vector<Wanted>, std::less<>> words_;
-  /// Few words, all ASCII: in ASCII texts, blocks where none of them begins are passed over.
-  bool plain_ = false;
+  /// When there are some, all words are ASCII, and in ASCII texts blocks where no probe fits are
+  /// passed over.
+  std::vector<Probe> probes_;
   /// By the first byte of the words: which lengths there are, one bit each.
   std::array<std::uint64_t, 256> lengths_{};
 };

@@ -17,6 +17,7 @@ namespace {
 /// The weight that a boost of 1 adds: about that of a rare word.
 constexpr double kBoostWeight = 10;
 constexpr std::size_t kFewChunks = 4;
+constexpr std::size_t kFewWords = 16;
 
 /// Sees what the eyes of each share see.
 class EyesRule : public PlaceRule {
@@ -386,45 +387,47 @@ std::vector<std::uint64_t> EngineReader::Count(const Query& query,
   return result;
 }
 
-const std::vector<MarkGroup>& EngineReader::MarksOf(const Query& query) {
-  if (!marked_ || !(marked_query_ == query)) {
-    marks_ = Compiler(indices_->All(), *this, indices_->Widened()).Marks(query);
-    marked_query_ = query;
-    marked_ = true;
+FragmentFinder& EngineReader::FinderOf(const Query& query, const std::string& field) {
+  if (!(finders_query_ == query)) {
+    finders_.clear();
+    finders_query_ = query;
   }
-  return marks_;
+  const auto known = finders_.find(field);
+  if (known != finders_.end()) return known->second;
+  auto groups = Compiler(indices_->All(), *this, indices_->Widened()).Marks(query);
+  std::erase_if(groups, [&](const MarkGroup& group) { return group.field != field; });
+  return finders_.emplace(field, FragmentFinder(std::move(groups))).first->second;
 }
 
-/// Keeps of each group the words that the document has, and the groups that have some.
-std::vector<MarkGroup> EngineReader::InDocument(std::size_t share, DocumentId document,
-                                                const std::vector<MarkGroup>& groups) const {
+/// Which words of the groups the document has; of phrases: all.
+PresentWords EngineReader::InDocument(std::size_t share, DocumentId document,
+                                      const FragmentFinder& finder) const {
   const std::string prefix(FindField(kText)->prefix);
   const Xapian::Database& database = indices_->Database(share);
-  std::vector<MarkGroup> present;
-  for (MarkGroup group : groups) {
-    if (!group.phrase && group.words.size() > 1) {
-      std::sort(group.words.begin(), group.words.end());
-      auto here = database.termlist_begin(document);
-      std::erase_if(group.words, [&](const std::string& word) {
-        const std::string term = prefix + word;
-        if (here != database.termlist_end(document)) here.skip_to(term);
-        return here == database.termlist_end(document) || *here != term;
-      });
+  const auto has_document = [&](const std::string& term) {
+    auto at = database.postlist_begin(term);
+    if (at != database.postlist_end(term)) at.skip_to(document);
+    return at != database.postlist_end(term) && *at == document;
+  };
+  PresentWords present = finder.AllWords();
+  for (std::size_t i = 0; i < present.size(); ++i) {
+    const std::vector<std::string>& words = finder.Groups()[i].words;
+    if (finder.Groups()[i].phrase || words.size() == 1) continue;
+    // Of many words, the document's list of terms tells sooner than theirs of documents.
+    const bool few = words.size() <= kFewWords;
+    auto here = few ? Xapian::TermIterator() : database.termlist_begin(document);
+    const auto in_list = [&](const std::string& term) {
+      if (here != database.termlist_end(document)) here.skip_to(term);
+      return here != database.termlist_end(document) && *here == term;
+    };
+    std::vector<std::uint64_t> there;
+    for (std::size_t word = 0; word < words.size(); ++word) {
+      const std::string term = prefix + words[word];
+      if (few ? has_document(term) : in_list(term)) there.push_back(present[i][word]);
     }
-    if (!group.words.empty()) present.push_back(std::move(group));
+    present[i] = std::move(there);
   }
   return present;
-}
-
-std::vector<Fragment> EngineReader::TextFragments(std::size_t share, DocumentId document,
-                                                  const TextPlace& place,
-                                                  const std::vector<MarkGroup>& groups,
-                                                  const FragmentOptions& options) {
-  StoredText text;
-  if (groups.empty() || !text.Open(indices_->Index(share).texts, place)) return {};
-  // A few chunks are looked through faster than the document's list of terms.
-  const bool many = text.Chunks() > kFewChunks;
-  return FragmentsOf(text, many ? InDocument(share, document, groups) : groups, options);
 }
 
 std::vector<Fragment> EngineReader::Fragments(std::size_t share, DocumentId document,
@@ -436,20 +439,21 @@ std::vector<Fragment> EngineReader::Fragments(std::size_t share, DocumentId docu
   return OnOneState("Cannot read a text", [&]() -> std::vector<Fragment> {
     const auto stored = Read(share, document);
     if (!stored) return {};
-    std::vector<MarkGroup> groups = MarksOf(query);
-    std::erase_if(groups, [&](const MarkGroup& group) { return group.field != options.field; });
+    FragmentFinder& finder = FinderOf(query, options.field);
+    if (finder.Groups().empty()) return {};
     if (options.field == kText) {
-      return TextFragments(share, document, stored->text, groups, options);
+      if (!text_.Open(indices_->Index(share).texts, stored->text)) return {};
+      // A few chunks are looked through faster than the index.
+      const bool many = text_.Chunks() > kFewChunks;
+      return finder.In(text_, many ? InDocument(share, document, finder) : finder.AllWords(),
+                       options);
     }
     const Record& record = stored->record;
     std::string text = options.field == kName ? record.name : record.title;
     if (options.field == kAuthors) {
       for (const std::string& author : record.authors) text += (text.empty() ? "" : "; ") + author;
     }
-    const std::vector<Match> matches = Matcher(groups).MatchesIn(text);
-    if (matches.empty()) return {};
-    const Window whole{0, text.size(), 1, static_cast<unsigned>(matches.size())};
-    return {{RenderWindow(text, whole, matches), whole.matches}};
+    return finder.Whole(text);
   });
 }
 

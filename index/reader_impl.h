@@ -1,6 +1,7 @@
 #pragma once
 
 #include <functional>
+#include <map>
 #include <memory>
 #include <string>
 #include <utility>
@@ -10,6 +11,7 @@
 #include "index/compile.h"
 #include "index/engine.h"
 #include "index/fields.h"
+#include "index/fragments.h"
 #include "index/library.h"
 #include "index/reader.h"
 
@@ -80,13 +82,10 @@ class EngineReader : public Reader, private Sources {
   bool SomeDocumentSeen(const std::string& term) const;
   Hit HitOf(std::size_t share, DocumentId id, Stored stored) const;
   std::vector<Hit> HitsOf(const std::vector<Weighed>& matches) const;
-  const std::vector<MarkGroup>& MarksOf(const Query& query);
-  std::vector<MarkGroup> InDocument(std::size_t share, DocumentId document,
-                                    const std::vector<MarkGroup>& groups) const;
+  FragmentFinder& FinderOf(const Query& query, const std::string& field);
+  PresentWords InDocument(std::size_t share, DocumentId document,
+                          const FragmentFinder& finder) const;
   std::optional<Stored> Read(std::size_t share, DocumentId document) const;
-  std::vector<Fragment> TextFragments(std::size_t share, DocumentId document,
-                                      const TextPlace& place, const std::vector<MarkGroup>& groups,
-                                      const FragmentOptions& options);
 
   std::unique_ptr<OpenIndices> indices_;
   GiveBack give_back_;
@@ -94,9 +93,10 @@ class EngineReader : public Reader, private Sources {
   /// One per share; empty until SetEyes. A null: sees everything.
   std::vector<std::shared_ptr<const Eyes>> eyes_;
   bool blind_ = true;
-  Query marked_query_;
-  std::vector<MarkGroup> marks_;
-  bool marked_ = false;
+  /// By field, for one query.
+  std::map<std::string, FragmentFinder> finders_;
+  Query finders_query_;
+  StoredText text_;
   /// Of the search under way.
   std::function<bool()> cancelled_;
 };
@@ -110,7 +110,7 @@ auto EngineReader::OnOneState(const char* doing, Work&& work) -> decltype(work()
       } catch (const Xapian::DatabaseModifiedError&) {
         indices_->Refresh();
         if (!blind_) SetEyes(who_);
-        marked_ = false;
+        finders_.clear();
       }
     }
     return work();
