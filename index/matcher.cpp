@@ -28,15 +28,14 @@ bool IsAscii(std::string_view text) {
   return (all & 0x8080808080808080u) == 0;
 }
 
-/// Whether some byte of a block and the one `offset` behind it may be the ends of a word. Without
-/// branches, for the compiler to make it some instructions on whole registers.
-bool MayBeginIn(const char* block, std::size_t offset, char first, char last) {
-  unsigned char any = 0;
+/// Marks the bytes of a block where both bytes of a probe stand. Without branches, for the compiler
+/// to make it some instructions on whole registers.
+void Mark(const char* __restrict block, std::size_t offset, char first, char last,
+          unsigned char* __restrict marks) {
   for (std::size_t i = 0; i < kBlock; ++i) {
-    any |= static_cast<unsigned char>((block[i] | 0x20) == first) &
-           static_cast<unsigned char>((block[i + offset] | 0x20) == last);
+    marks[i] |= static_cast<unsigned char>((block[i] | 0x20) == first) &
+                static_cast<unsigned char>((block[i + offset] | 0x20) == last);
   }
-  return any;
 }
 
 /// The end of a phrase whose first word ends at `at`; 0 when it is another text.
@@ -98,12 +97,16 @@ void Matcher::FindProbes(std::size_t beginning) {
   }
 }
 
-/// Whether one of the words may begin in the block; true near the text's end.
-bool Matcher::MayBeginAt(std::string_view text, std::size_t block) const {
-  return std::any_of(probes_.begin(), probes_.end(), [&](const Probe& probe) {
-    return block + kBlock + probe.offset >= text.size() ||
-           MayBeginIn(text.data() + block, probe.offset, probe.first, probe.last);
-  });
+/// Where in the block one of the words may begin; near the text's end: everywhere.
+void Matcher::MarkBegins(std::string_view text, std::size_t block, unsigned char* marks) const {
+  std::fill_n(marks, kBlock, 0);
+  for (const Probe& probe : probes_) {
+    if (block + kBlock + probe.offset >= text.size()) {
+      std::fill_n(marks, std::min(kBlock, text.size() - block), 1);
+      return;
+    }
+    Mark(text.data() + block, probe.offset, probe.first, probe.last, marks);
+  }
 }
 
 bool Matcher::MayBe(std::string_view word) const {
@@ -126,10 +129,14 @@ bool Matcher::Take(std::string_view text, const Token& token, Use& use) const {
 template <class Use>
 void Matcher::ForEachPlain(std::string_view text, Use&& use) const {
   char folded[kMaxWord];
+  unsigned char marks[kBlock];
   for (std::size_t block = 0; block < text.size(); block += kBlock) {
-    if (!MayBeginAt(text, block)) continue;
-    const std::size_t block_end = std::min(block + kBlock, text.size());
-    for (std::size_t begin = block; begin < block_end; ++begin) {
+    MarkBegins(text, block, marks);
+    for (std::size_t at = 0; at < kBlock; ++at) {
+      const void* mark = std::memchr(marks + at, 1, kBlock - at);
+      if (!mark) break;
+      at = static_cast<std::size_t>(static_cast<const unsigned char*>(mark) - marks);
+      const std::size_t begin = block + at;
       if (!IsWordByte(text[begin]) || (begin > 0 && IsWordByte(text[begin - 1]))) continue;
       std::size_t end = begin + 1;
       while (end < text.size() && IsWordByte(text[end])) ++end;
@@ -198,8 +205,7 @@ bool Matcher::AnyIn(std::string_view text) const {
 }
 
 PhraseFinder::PhraseFinder(const std::vector<std::string>& words)
-    : words_(words), matcher_({MarkGroup{{}, words, true}}) {
-  plain_ = !words.empty() && words[0].size() < kMaxWord && IsAscii(words[0]);
+    : matcher_({MarkGroup{{}, words, true}}) {
   for (std::size_t i = 1; i < words.size(); ++i) {
     pairs_.push_back(HashPair(HashWord(words[i - 1]), HashWord(words[i])));
   }
@@ -216,45 +222,13 @@ bool PhraseFinder::MayBegin(const StoredText& text, std::size_t chunk) const {
   return true;
 }
 
-/// Whether the phrase begins at a byte that looks like the first of its first word.
-bool PhraseFinder::IsHere(std::string_view text, std::size_t at) const {
-  const std::string& first = words_[0];
-  if (at > 0 && IsWordByte(text[at - 1])) return false;
-  for (std::size_t i = 0; i < first.size(); ++i) {
-    if (FoldAscii(text[at + i]) != first[i]) return false;
-  }
-  const std::size_t end = at + first.size();
-  if (end < text.size() && IsWordByte(text[end])) return false;
-  return EndOfPhrase(text, end, {words_.begin() + 1, words_.end()}) != 0;
-}
-
-/// Most texts are ASCII, or hold the phrase as it is: blocks of bytes without both ends of the
-/// first word are passed over at once, and only where that does not decide are all words looked at.
-bool PhraseFinder::IsIn(std::string_view text) const {
-  if (!plain_) return matcher_.AnyIn(text);
-  const std::size_t width = words_[0].size();
-  const char first = words_[0].front();
-  const char last = words_[0].back();
-  std::size_t at = 0;
-  for (; at + kBlock + width <= text.size(); at += kBlock) {
-    if (!MayBeginIn(text.data() + at, width - 1, first, last)) continue;
-    for (std::size_t i = at; i < at + kBlock; ++i) {
-      if (FoldAscii(text[i]) == first && IsHere(text, i)) return true;
-    }
-  }
-  for (; at + width <= text.size(); ++at) {
-    if (FoldAscii(text[at]) == first && IsHere(text, at)) return true;
-  }
-  return !IsAscii(text) && matcher_.AnyIn(text);
-}
-
 bool PhraseFinder::BeginsIn(StoredText& text, std::size_t chunk) {
   buffer_.clear();
   if (!text.Append(chunk, buffer_)) return false;
-  if (IsIn(std::string_view(buffer_))) return true;
+  if (matcher_.AnyIn(buffer_)) return true;
   const std::size_t end = std::min(text.Chunks(), chunk + pairs_.size() + 1);
   while (++chunk < end && text.Append(chunk, buffer_)) {
-    if (IsIn(std::string_view(buffer_))) return true;
+    if (matcher_.AnyIn(buffer_)) return true;
   }
   return false;
 }

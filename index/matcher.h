@@ -48,7 +48,7 @@ class Matcher {
   template <class Use>
   void ForEachPlain(std::string_view text, Use&& use) const;
   void FindProbes(std::size_t beginning);
-  bool MayBeginAt(std::string_view text, std::size_t block) const;
+  void MarkBegins(std::string_view text, std::size_t block, unsigned char* marks) const;
   bool MayBe(std::string_view word) const;
   template <class Use>
   bool Take(std::string_view text, const Token& token, Use& use) const;
@@ -79,12 +79,7 @@ class PhraseFinder {
 
  private:
   bool BeginsIn(StoredText& text, std::size_t chunk);
-  bool IsIn(std::string_view text) const;
-  bool IsHere(std::string_view text, std::size_t at) const;
 
-  std::vector<std::string> words_;
-  /// The first word can be looked for as it is, in both cases of its letters.
-  bool plain_ = false;
   Matcher matcher_;
   std::vector<std::uint64_t> pairs_;
   std::string buffer_;

@@ -78,9 +78,14 @@ bool Holds(const std::vector<std::string>& text, const std::vector<std::string>&
 TEST(MatcherTest, FindsWhatTheTokenizerFinds) {
   Babble babble(1);
   for (int round = 0; round < 300; ++round) {
-    const std::string text = babble.Text();
-    const std::vector<MarkGroup> groups = {{"", babble.Words(2), false},
-                                           {"", babble.Words(2), true}};
+    std::string text = babble.Text();
+    // Pure ASCII is gone through in another way.
+    if (round % 2) std::erase_if(text, [](char c) { return c < 0; });
+    // Also more words than are looked for together, and words of one beginning.
+    std::vector<std::string> words_wanted = babble.Words(1 + babble.Below(12));
+    std::sort(words_wanted.begin(), words_wanted.end());
+    words_wanted.erase(std::unique(words_wanted.begin(), words_wanted.end()), words_wanted.end());
+    const std::vector<MarkGroup> groups = {{"", words_wanted, false}, {"", babble.Words(2), true}};
     std::vector<std::pair<std::size_t, std::size_t>> expected;
     std::vector<Token> tokens;
     std::vector<std::string> words;
@@ -91,9 +96,10 @@ TEST(MatcherTest, FindsWhatTheTokenizerFinds) {
     });
     for (std::size_t i = 0; i < tokens.size(); ++i) {
       for (const MarkGroup& group : groups) {
-        const bool here = group.phrase ? i + 1 < words.size() && words[i] == group.words[0] &&
-                                             words[i + 1] == group.words[1]
-                                       : words[i] == group.words[0] || words[i] == group.words[1];
+        const bool here = group.phrase
+                              ? i + 1 < words.size() && words[i] == group.words[0] &&
+                                    words[i + 1] == group.words[1]
+                              : std::count(words_wanted.begin(), words_wanted.end(), words[i]) > 0;
         if (here) expected.emplace_back(tokens[i].begin, tokens[i + group.phrase].end);
       }
     }
@@ -103,11 +109,6 @@ TEST(MatcherTest, FindsWhatTheTokenizerFinds) {
     }
     std::sort(expected.begin(), expected.end());
     std::sort(found.begin(), found.end());
-    // A word that is in a group twice is no match more.
-    if (groups[0].words[0] == groups[0].words[1]) {
-      found.erase(std::unique(found.begin(), found.end()), found.end());
-      expected.erase(std::unique(expected.begin(), expected.end()), expected.end());
-    }
     ASSERT_EQ(found, expected) << round;
   }
 }
