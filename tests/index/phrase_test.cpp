@@ -44,6 +44,8 @@ class Babble {
                                                     "blue",
                                                     "Blue",
                                                     "blue2",
+                                                    "bluer",
+                                                    "Bluest",
                                                     "2",
                                                     "\xe6\x97\xa5",
                                                     "\xe6\x97\xa5\xe6\x9c\xac",
