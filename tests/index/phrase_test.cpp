@@ -34,6 +34,8 @@ class Babble {
  private:
   std::string Word() {
     static const std::vector<std::string> kWords = {"red",
+                                                    "bluer",
+                                                    "Bluest",
                                                     "Red",
                                                     "RED",
                                                     "r\xc3\xa9"
@@ -44,8 +46,6 @@ class Babble {
                                                     "blue",
                                                     "Blue",
                                                     "blue2",
-                                                    "bluer",
-                                                    "Bluest",
                                                     "2",
                                                     "\xe6\x97\xa5",
                                                     "\xe6\x97\xa5\xe6\x9c\xac",
@@ -61,7 +61,7 @@ class Babble {
                                                     "\xef\xbe\x8a\xef\xbe\x9f"};
     if (Below(300) == 0) return std::string(70, 'x') + (Below(2) ? "" : "y");
     // A few of them are rare, so that a phrase is not in every text.
-    return kWords[Below(8) ? Below(6) : Below(kWords.size())];
+    return kWords[Below(8) ? Below(8) : Below(kWords.size())];
   }
   std::string Blank() {
     if (Below(400) == 0) return std::string(9'000, ' ');
