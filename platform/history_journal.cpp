@@ -2,8 +2,10 @@
 
 #include <errno.h>
 #include <fcntl.h>
+#include <stdio.h>
 #include <sys/file.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <string_view>
 
@@ -19,13 +21,12 @@ constexpr off_t kLongEnough = off_t{16} << 10;
 constexpr off_t kMost = off_t{4} << 20;
 constexpr int kHow = O_RDWR | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC;
 
-/// The file's size once nobody else has it locked; below 0 with errno.
-off_t Locked(const maru::UniqueFd& file) {
+/// Waits until nobody else has the file locked. False with errno.
+bool Lock(const maru::UniqueFd& file, struct stat& status) {
   while (flock(file.Get(), LOCK_EX) != 0) {
-    if (errno != EINTR) return -1;
+    if (errno != EINTR) return false;
   }
-  struct stat status;
-  return fstat(file.Get(), &status) == 0 ? status.st_size : -1;
+  return fstat(file.Get(), &status) == 0;
 }
 
 std::string LineOf(const HistoryJournal::Entry& entry) {
@@ -75,6 +76,15 @@ bool ReadAll(const maru::UniqueFd& file, off_t size, std::string& text) {
   return true;
 }
 
+/// What stands in a file; nothing when it cannot be read, with errno.
+std::string TextOf(const std::string& path) {
+  const maru::UniqueFd file(open(path.c_str(), kHow));
+  struct stat status;
+  std::string text;
+  if (!file || fstat(file.Get(), &status) != 0 || !ReadAll(file, status.st_size, text)) return {};
+  return text;
+}
+
 }  // namespace
 
 HistoryJournal HistoryJournal::OfService() {
@@ -83,48 +93,74 @@ HistoryJournal HistoryJournal::OfService() {
 
 bool HistoryJournal::Add(const Entry& entry, bool& long_enough) const {
   const std::string line = LineOf(entry);
-  const maru::UniqueFd file(open(path_.c_str(), kHow | O_CREAT | O_APPEND, 0600));
-  if (!file) return false;
-  const off_t before = Locked(file);
-  if (before < 0) return false;
-  if (before > kMost) {
+  maru::UniqueFd file;
+  struct stat status;
+  struct stat here;
+  do {
+    file = maru::UniqueFd(open(path_.c_str(), kHow | O_CREAT | O_APPEND, 0600));
+    if (!file || !Lock(file, status)) return false;
+    // It may have been set aside meanwhile.
+  } while (lstat(path_.c_str(), &here) != 0 || here.st_ino != status.st_ino);
+  if (status.st_size > kMost) {
     errno = EFBIG;
     return false;
   }
   const ssize_t written = write(file.Get(), line.data(), line.size());
   if (written == static_cast<ssize_t>(line.size())) {
-    long_enough = before + written > kLongEnough;
+    long_enough = status.st_size + written > kLongEnough;
     return true;
   }
   // Half a line would spoil the next one.
   const int error = written < 0 ? errno : ENOSPC;
-  static_cast<void>(!ftruncate(file.Get(), before));
+  static_cast<void>(!ftruncate(file.Get(), status.st_size));
   errno = error;
   return false;
 }
 
 std::vector<HistoryJournal::Entry> HistoryJournal::Entries() const {
-  const maru::UniqueFd file(open(path_.c_str(), kHow));
-  struct stat status;
-  std::string text;
-  if (!file || fstat(file.Get(), &status) != 0 || !ReadAll(file, status.st_size, text)) return {};
-  return EntriesOf(text);
+  // What is set aside in between is seen twice, not never.
+  const std::string newer = TextOf(path_);
+  return EntriesOf(TextOf(aside_) + newer);
 }
 
 bool HistoryJournal::HandOver(const std::function<bool(const std::vector<Entry>&)>& take) const {
+  bool is_aside = false;
+  do {
+    if (!TakeAside(take)) return false;
+    is_aside = SetAside();
+    // Another process was sooner, perhaps before what was added last.
+  } while (!is_aside && errno == EEXIST);
+  return (is_aside || errno == ENOENT) && TakeAside(take);
+}
+
+/// False with errno: ENOENT when there is nothing, EEXIST when something stands aside.
+bool HistoryJournal::SetAside() const {
   const maru::UniqueFd file(open(path_.c_str(), kHow));
+  struct stat status;
+  if (!file || fstat(file.Get(), &status) != 0) return false;
+  if (status.st_size == 0) {
+    errno = ENOENT;
+    return false;
+  }
+  return renameat2(AT_FDCWD, path_.c_str(), AT_FDCWD, aside_.c_str(), RENAME_NOREPLACE) == 0;
+}
+
+/// Gives what is set aside to `take`, after whoever else does.
+bool HistoryJournal::TakeAside(const std::function<bool(const std::vector<Entry>&)>& take) const {
+  const maru::UniqueFd file(open(aside_.c_str(), kHow));
   if (!file) return errno == ENOENT;
   struct stat status;
-  if (fstat(file.Get(), &status) == 0 && status.st_size == 0) return true;
-  const off_t size = Locked(file);
   std::string text;
-  if (size < 0 || !ReadAll(file, size, text)) return false;
+  // Whoever adds a line to it at this moment has it locked.
+  if (!Lock(file, status)) return false;
+  if (status.st_nlink == 0) return true;
+  if (!ReadAll(file, status.st_size, text)) return false;
   const std::vector<Entry> entries = EntriesOf(text);
   if (!entries.empty() && !take(entries)) {
     errno = 0;
     return false;
   }
-  return ftruncate(file.Get(), 0) == 0;
+  return unlink(aside_.c_str()) == 0;
 }
 
 }  // namespace maruseeker::db

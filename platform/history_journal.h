@@ -11,7 +11,8 @@ namespace maruseeker::db {
 
 /// Searches that are not in the history's table yet. Whoever searched adds a line to a file, which
 /// costs a few calls of the system; whoever reads the table takes them into it first. Safe among
-/// any number of processes, and a line survives the end of each of them.
+/// any number of processes, and a line survives the end of each of them. While entries are taken
+/// over they stand aside in a file of their own: that may take long, and nobody who searches waits.
 class HistoryJournal {
  public:
   struct Entry {
@@ -23,25 +24,30 @@ class HistoryJournal {
     int max = 0;
   };
 
-  explicit HistoryJournal(std::string path) : path_(std::move(path)) {}
+  explicit HistoryJournal(std::string path) : path_(std::move(path)), aside_(path_ + ".taken") {}
   /// The service's own, in the state folder.
   static HistoryJournal OfService();
 
-  /// Adds an entry; waits while another process takes the entries over. `long_enough` tells whether
-  /// they should be taken over now. False with errno; EFBIG when nobody could for too long.
+  /// Adds an entry. `long_enough` tells whether it is time to take all of them over. False with
+  /// errno; EFBIG when nobody could for too long.
   bool Add(const Entry& entry, bool& long_enough) const;
 
   /// What is there now, in the order of adding. A file that cannot be read is empty, with errno;
   /// lines that are none of ours are left out.
   std::vector<Entry> Entries() const;
 
-  /// Gives all entries to `take` and forgets them when it returns true; nobody adds any meanwhile.
-  /// Without entries `take` is not called and the result is true. False with errno when the file
-  /// cannot be read or written, with errno 0 when `take` returned false.
+  /// Gives all entries that were there at the call to `take`, in one turn or more, and forgets
+  /// those of a turn when it returns true. A process that dies in between leaves them to the next
+  /// one, even when it had taken them. False with errno when a file cannot be read or written, with
+  /// errno 0 when `take` returned false.
   bool HandOver(const std::function<bool(const std::vector<Entry>&)>& take) const;
 
  private:
+  bool SetAside() const;
+  bool TakeAside(const std::function<bool(const std::vector<Entry>&)>& take) const;
+
   std::string path_;
+  std::string aside_;
 };
 
 }  // namespace maruseeker::db

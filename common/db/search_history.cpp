@@ -114,12 +114,24 @@ bool SearchHistoryTable::Take(const std::vector<HistoryJournal::Entry>& entries)
       MARU_LOG("A search of user %u cannot be recorded: %s", record.uid, error_.c_str());
     }
   }
-  // One that the database refuses must not keep back the others; all of them may come again.
-  if (taken == 0) return false;
+  // One that the database refuses must not keep back the others. When it takes nothing at all, they
+  // may come again.
+  if (taken == 0 && !TakesAny(records.back())) return false;
   for (const auto& [uid, newest] : last) {
     if (!Prune(records[newest.first], newest.second)) return false;
   }
   return true;
+}
+
+/// Whether the database would take a row that nothing speaks against. None is left behind.
+bool SearchHistoryTable::TakesAny(SearchHistory row) {
+  bool taken = false;
+  row.keyword.assign(1, 'a');
+  session_->Attempt([&] {
+    taken = Record(row);
+    return false;
+  });
+  return taken;
 }
 
 bool SearchHistoryTable::Record(SearchHistory& rec) {

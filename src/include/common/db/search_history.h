@@ -49,6 +49,7 @@ class SearchHistoryTable : public TableBase<SearchHistory> {
   /// Takes the journal's searches into the table; all of it happens or nothing does.
   bool CatchUp();
   bool Take(const std::vector<HistoryJournal::Entry>& entries);
+  bool TakesAny(SearchHistory row);
   bool Record(SearchHistory& rec);
   bool Prune(const SearchHistory& newest, int max);
 };
