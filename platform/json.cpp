@@ -1,145 +1,149 @@
 #include "platform/json.h"
 
 #include <errno.h>
-#include <rapidjson/error/en.h>
-#include <rapidjson/memorystream.h>
-#include <rapidjson/reader.h>
-#include <rapidjson/writer.h>
+#include <json/reader.h>
+#include <json/writer.h>
 
-#include <stdexcept>
+#include <memory>
+#include <sstream>
 #include <string_view>
-#include <vector>
 
 #include "platform/whole_file.h"
 
 namespace maru::json {
 namespace {
 
-/// Bytes of strings are kept as they are; only escapes are looked at.
-struct Bytes : rapidjson::UTF8<> {
-  template <class Output>
-  static void Encode(Output& output, unsigned character) {
-    // The parser has put pairs together, and refused a first half without its second.
-    if (character >= 0xdc00 && character <= 0xdfff) {
-      throw std::invalid_argument("half of a surrogate pair");
-    }
-    rapidjson::UTF8<>::Encode(output, character);
-  }
-};
-
-/// Takes what the parser reads, in its order, and makes it a value.
-class Builder : public rapidjson::BaseReaderHandler<Bytes, Builder> {
+/// Refuses what the library would let pass, or throw at: control characters in strings, numbers of
+/// other grammars, surrogates without their partner, too many levels or values. Everything else is
+/// left to the parser.
+class StrictnessCheck {
  public:
-  explicit Builder(Json::Value& root) { open_.push_back(&root); }
+  explicit StrictnessCheck(std::string_view text) : text_(text) {}
 
-  bool Null() { return Add(Json::Value()); }
-  bool Bool(bool flag) { return Add(flag); }
-  bool Int(int number) { return Add(number); }
-  bool Uint(unsigned number) { return Add(Json::Int64{number}); }
-  bool Int64(std::int64_t number) { return Add(Json::Int64{number}); }
-  bool Uint64(std::uint64_t number) {
-    if (number > std::uint64_t{Json::Value::maxInt64}) return Add(Json::UInt64{number});
-    return Add(static_cast<Json::Int64>(number));
-  }
-  bool Double(double number) { return Add(number); }
-  bool String(const char* text, unsigned size, bool) { return Add(Json::Value(text, text + size)); }
-  bool StartObject() { return Open(Json::objectValue); }
-  bool StartArray() { return Open(Json::arrayValue); }
-  bool EndObject(unsigned) { return Close(); }
-  bool EndArray(unsigned) { return Close(); }
-  bool Key(const char* text, unsigned size, bool) {
-    key_.assign(text, size);
-    return true;
+  /// Null, or what is wrong.
+  const char* Fault() {
+    while (at_ < text_.size()) {
+      const char c = text_[at_];
+      const char* fault = nullptr;
+      if (c == '"') {
+        fault = String();
+      } else if (c == '-' || c == '+' || IsDigit(c)) {
+        fault = Number();
+      } else {
+        fault = Structure(c);
+        ++at_;
+      }
+      if (fault) return fault;
+    }
+    return nullptr;
   }
 
  private:
-  bool Add(Json::Value value) {
-    Place() = std::move(value);
+  static bool IsDigit(char c) { return c >= '0' && c <= '9'; }
+  char Peek() const { return at_ < text_.size() ? text_[at_] : '\0'; }
+
+  const char* Structure(char c) {
+    if (c == '[' || c == '{') {
+      if (++depth_ > kMaxDepth) return "too many levels";
+      ++values_;
+    } else if (c == ']' || c == '}') {
+      if (depth_ > 0) --depth_;
+    } else if (c == ',') {
+      ++values_;
+    } else if (static_cast<unsigned char>(c) < 0x20 && c != '\n' && c != '\r' && c != '\t') {
+      return "a control character";  // the parser takes a NUL for the end
+    }
+    return values_ > kMaxValues ? "too many values" : nullptr;
+  }
+
+  const char* String() {
+    for (++at_; at_ < text_.size(); ++at_) {
+      const auto c = static_cast<unsigned char>(text_[at_]);
+      if (c == '"') {
+        ++at_;
+        return nullptr;
+      }
+      if (c < 0x20) return "a control character in a string";
+      if (c != '\\') continue;
+      ++at_;
+      if (Peek() == 'u' && !UnicodeEscape()) return "half of a surrogate pair";
+    }
+    return "a string without an end";
+  }
+
+  /// Stands on the u of an escape, and leaves on the last character of it, or of the pair.
+  bool UnicodeEscape() {
+    const unsigned unit = HexUnit(at_ + 1);
+    if (unit < 0xd800 || unit > 0xdfff) return true;
+    if (unit > 0xdbff || text_.substr(at_ + 5, 2) != "\\u") return false;
+    const unsigned low = HexUnit(at_ + 7);
+    if (low < 0xdc00 || low > 0xdfff) return false;
+    at_ += 10;
     return true;
   }
 
-  bool Open(Json::ValueType type) {
-    if (open_.size() > kMaxDepth) throw std::length_error("too many levels");
-    Json::Value& place = Place();
-    place = Json::Value(type);
-    open_.push_back(&place);
-    return true;
+  /// Four hexadecimal digits, or 0, which the parser then judges.
+  unsigned HexUnit(std::size_t from) const {
+    unsigned unit = 0;
+    if (from + 4 > text_.size()) return 0;
+    for (const char c : text_.substr(from, 4)) {
+      const char lower = static_cast<char>(c | 0x20);
+      if (IsDigit(c)) {
+        unit = unit * 16 + static_cast<unsigned>(c - '0');
+      } else if (lower >= 'a' && lower <= 'f') {
+        unit = unit * 16 + static_cast<unsigned>(lower - 'a') + 10;
+      } else {
+        return 0;
+      }
+    }
+    return unit;
   }
 
-  bool Close() {
-    open_.pop_back();
-    return true;
+  const char* Number() {
+    constexpr const char* malformed = "a malformed number";
+    if (Peek() == '-') ++at_;
+    const bool zero = Peek() == '0';
+    const std::size_t digits = Digits();
+    if (digits == 0 || (zero && digits > 1)) return malformed;
+    if (Peek() == '.') {
+      ++at_;
+      if (Digits() == 0) return malformed;
+    }
+    if (Peek() == 'e' || Peek() == 'E') {
+      ++at_;
+      if (Peek() == '+' || Peek() == '-') ++at_;
+      if (Digits() == 0) return malformed;
+    }
+    return nullptr;
   }
 
-  /// Where the next value belongs.
-  Json::Value& Place() {
-    if (++values_ > kMaxValues) throw std::length_error("too many values");
-    Json::Value& around = *open_.back();
-    if (around.isArray()) return around.append(Json::Value());
-    if (!around.isObject()) return around;
-    const Json::ArrayIndex size = around.size();
-    Json::Value& place = *around.demand(key_.data(), key_.data() + key_.size());
-    if (around.size() == size) throw std::invalid_argument("a key that is there twice");
-    return place;
+  std::size_t Digits() {
+    const std::size_t start = at_;
+    while (IsDigit(Peek())) ++at_;
+    return at_ - start;
   }
 
-  /// The root, and every object and array that is not at its end.
-  std::vector<Json::Value*> open_;
-  std::string key_;
+  std::string_view text_;
+  std::size_t at_ = 0;
+  std::size_t depth_ = 0;
   std::size_t values_ = 0;
 };
 
-/// What the writer writes into.
-struct Appender {
-  using Ch = char;
+std::unique_ptr<Json::CharReader> NewReader() {
+  Json::CharReaderBuilder builder;
+  Json::CharReaderBuilder::strictMode(&builder.settings_);
+  builder["strictRoot"] = false;
+  builder["skipBom"] = false;
+  builder["stackLimit"] = kMaxDepth + 1;
+  return std::unique_ptr<Json::CharReader>(builder.newCharReader());
+}
 
-  std::string& text;
-
-  void Put(char c) { text += c; }
-  void Flush() {}
-};
-
-using Writer = rapidjson::Writer<Appender, Bytes, Bytes>;
-
-void Write(const Json::Value& value, Writer& writer) {
-  switch (value.type()) {
-    case Json::nullValue:
-      writer.Null();
-      break;
-    case Json::booleanValue:
-      writer.Bool(value.asBool());
-      break;
-    case Json::intValue:
-      writer.Int64(value.asInt64());
-      break;
-    case Json::uintValue:
-      writer.Uint64(value.asUInt64());
-      break;
-    case Json::realValue:
-      if (!writer.Double(value.asDouble())) writer.Null();
-      break;
-    case Json::stringValue: {
-      const char* begin = nullptr;
-      const char* end = nullptr;
-      value.getString(&begin, &end);
-      writer.String(begin, static_cast<unsigned>(end - begin));
-      break;
-    }
-    case Json::arrayValue:
-      writer.StartArray();
-      for (const Json::Value& element : value) Write(element, writer);
-      writer.EndArray();
-      break;
-    case Json::objectValue:
-      writer.StartObject();
-      for (auto member = value.begin(); member != value.end(); ++member) {
-        const char* end = nullptr;
-        const char* begin = member.memberName(&end);
-        writer.Key(begin, static_cast<unsigned>(end - begin));
-        Write(*member, writer);
-      }
-      writer.EndObject();
-  }
+std::unique_ptr<Json::StreamWriter> NewWriter() {
+  Json::StreamWriterBuilder builder;
+  builder["indentation"] = "";
+  builder["commentStyle"] = "None";
+  builder["emitUTF8"] = true;
+  return std::unique_ptr<Json::StreamWriter>(builder.newStreamWriter());
 }
 
 bool Refuse(std::string* error, std::string reason) {
@@ -151,16 +155,14 @@ bool Refuse(std::string* error, std::string reason) {
 
 bool FromString(const std::string& text, Json::Value& value, std::string* error) {
   if (text.size() > kMaxSize) return Refuse(error, "too long");
+  if (const char* fault = StrictnessCheck(text).Fault()) return Refuse(error, fault);
   try {
+    thread_local const std::unique_ptr<Json::CharReader> reader = NewReader();
     Json::Value parsed;
-    Builder builder(parsed);
-    rapidjson::MemoryStream stream(text.data(), text.size());
-    rapidjson::GenericReader<Bytes, Bytes> reader;
-    const rapidjson::ParseResult result =
-        reader.Parse<rapidjson::kParseFullPrecisionFlag>(stream, builder);
-    if (!result) return Refuse(error, rapidjson::GetParseError_En(result.Code()));
-    // The parser takes a NUL for the end.
-    if (stream.Tell() < text.size()) return Refuse(error, "a control character");
+    std::string reason;
+    if (!reader->parse(text.data(), text.data() + text.size(), &parsed, &reason)) {
+      return Refuse(error, std::move(reason));
+    }
     value = std::move(parsed);
     return true;
   } catch (const std::exception& exception) {
@@ -169,11 +171,10 @@ bool FromString(const std::string& text, Json::Value& value, std::string* error)
 }
 
 std::string ToString(const Json::Value& value) {
-  std::string text;
-  Appender appender{text};
-  Writer writer(appender);
-  Write(value, writer);
-  return text;
+  thread_local const std::unique_ptr<Json::StreamWriter> writer = NewWriter();
+  std::ostringstream stream;
+  writer->write(value, &stream);
+  return std::move(stream).str();
 }
 
 void ObjectWriter::AddText(std::string_view key, std::string_view text) {
@@ -208,8 +209,26 @@ void ObjectWriter::BeginMember(std::string_view key) {
 }
 
 void ObjectWriter::Write(std::string_view text) {
-  Appender appender{text_};
-  Writer(appender).String(text.data(), static_cast<unsigned>(text.size()));
+  constexpr std::string_view kNamed = "\b\f\n\r\t";
+  constexpr std::string_view kNames = "bfnrt";
+  constexpr std::string_view kDigits = "0123456789abcdef";
+  text_ += '"';
+  std::size_t run = 0;  // the start of what is not written yet
+  for (std::size_t at = 0; at < text.size(); ++at) {
+    const auto c = static_cast<unsigned char>(text[at]);
+    if (c >= ' ' && c != '"' && c != '\\') continue;
+    text_.append(text, run, at - run);
+    run = at + 1;
+    text_ += '\\';
+    if (const std::size_t named = kNamed.find(text[at]); named != std::string_view::npos) {
+      text_ += kNames[named];
+    } else if (c >= ' ') {
+      text_ += text[at];
+    } else {
+      text_.append("u00").append({kDigits[c / 16], kDigits[c % 16]});
+    }
+  }
+  text_.append(text, run).append("\"");
 }
 
 bool FromFile(const std::string& path, Json::Value& value) {
