@@ -11,6 +11,7 @@
 
 #include "platform/config.h"
 #include "platform/json.h"
+#include "platform/log.h"
 #include "platform/unique_fd.h"
 
 namespace maruseeker::db {
@@ -131,6 +132,10 @@ bool HistoryJournal::HandOver(const std::function<bool(const std::vector<Entry>&
     // Another process was sooner, perhaps before what was added last.
   } while (!is_aside && errno == EEXIST);
   return (is_aside || errno == ENOENT) && TakeAside(take);
+}
+
+void HistoryJournal::TellRefused(uid_t uid, const std::string& reason) {
+  MARU_LOG("A search of user %u cannot be recorded: %s", uid, reason.c_str());
 }
 
 /// False with errno: ENOENT when there is nothing, EEXIST when something stands aside.

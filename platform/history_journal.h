@@ -42,6 +42,9 @@ class HistoryJournal {
   /// errno 0 when `take` returned false.
   bool HandOver(const std::function<bool(const std::vector<Entry>&)>& take) const;
 
+  /// Tells the log that an entry of the user was refused and is not kept.
+  static void TellRefused(uid_t uid, const std::string& reason);
+
  private:
   bool SetAside() const;
   bool TakeAside(const std::function<bool(const std::vector<Entry>&)>& take) const;

@@ -137,8 +137,8 @@ void Call(const Task& task, std::string body, const Plugin& plugin, MARU::APIReq
   RunMethod(method, request, reply);
 }
 
-int Serve(const Task& task, const Descriptor& socket, Packet& packet, const Plugin& plugin,
-          Reply& reply) {
+int Serve(const Task& task, const Descriptor& socket, const Descriptor& host, Packet& packet,
+          const Plugin& plugin, Reply& reply) {
   const auto account = FindAccount(task.user);
   if (!account || account->uid != task.uid || account->stamp != task.stamp ||
       (task.ask_pam && !IsAdmitted(task.user))) {
@@ -147,6 +147,7 @@ int Serve(const Task& task, const Descriptor& socket, Packet& packet, const Plug
   }
   const MARU::APIRequest::Login login{task.uid, task.user, task.session_id,
                                       IsAdministrator(task.user)};
+  if (!login.is_admin && task.uid != 0) Say(host, kEndsOwnOnly);
   std::string body;
   if (!ReadBody(socket.Get(), task.body_size, packet, body)) return 0;
   errno = 0;
@@ -177,7 +178,7 @@ int ServeOne(const Descriptor& tasks, Packet& packet, const Plugin& plugin) {
   if (!task || !socket) return 1;
   Reply reply(socket, tasks);
   try {
-    if (const int status = Serve(*task, socket, packet, plugin, reply)) return status;
+    if (const int status = Serve(*task, socket, tasks, packet, plugin, reply)) return status;
   } catch (const std::exception& exception) {
     MARU_LOG("Failed to serve a request: %s", exception.what());
     return 1;

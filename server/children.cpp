@@ -40,12 +40,21 @@ void Children::Renew() {
   renewed_ = next_number_;
 }
 
-/// A request of the user that was under way when a child's own ended may have read of that child's
-/// process id and be about to end it. So a child works again only when all those are over.
+/// Whether the request that the child works at can end processes of the user.
+bool Children::MayEnd(const BusyChild& child, const std::string& user) {
+  if (child.user == user) return true;
+  char said = 0;
+  return !child.ends_own_only &&
+         (recv(child.tasks.Get(), &said, sizeof(said), MSG_PEEK | MSG_DONTWAIT) < 0 ||
+          said != kEndsOwnOnly);
+}
+
+/// A request that was under way when a child's own ended may have read of that child's process id
+/// and be about to end it. So a child works again only when all those that could are over.
 std::optional<Children::Child> Children::TakeRested(const std::string& user) {
   std::uint64_t oldest = next_number_;
   for (const auto& [pid, child] : busy_) {
-    if (child.user == user) oldest = std::min(oldest, child.number);
+    if (MayEnd(child, user)) oldest = std::min(oldest, child.number);
   }
   // The last one first: the others may go when there is less to do.
   const auto found = std::find_if(rested_.rbegin(), rested_.rend(), [&](const RestedChild& rested) {
@@ -87,7 +96,11 @@ std::optional<Children::Finished> Children::Hear(pid_t pid, Seconds now) {
   char said;
   while (recv(child.tasks.Get(), &said, sizeof(said), MSG_DONTWAIT) == sizeof(said)) {
     if (said == kRequestOver) return Rest(found, now);
-    child.answered = true;
+    if (said == kEndsOwnOnly) {
+      child.ends_own_only = true;
+    } else {
+      child.answered = true;
+    }
   }
   if (!child.request) return std::nullopt;
   poller_.Remove(child.request.Get());

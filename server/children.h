@@ -79,12 +79,14 @@ class Children {
     /// Counts the requests.
     std::uint64_t number;
     Seconds since;
+    bool ends_own_only = false;
     bool answered = false;
     bool overdue = false;
   };
   using Busy = std::unordered_map<pid_t, BusyChild>;
 
   std::optional<Child> Fork();
+  static bool MayEnd(const BusyChild& child, const std::string& user);
   std::optional<Child> TakeRested(const std::string& user);
   bool ListenTo(const BusyChild& child, pid_t pid);
   void StopListening(const BusyChild& child);

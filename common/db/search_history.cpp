@@ -111,7 +111,7 @@ bool SearchHistoryTable::Take(const std::vector<HistoryJournal::Entry>& entries)
     if (session_->Attempt([&] { return Record(record); })) {
       ++taken;
     } else {
-      MARU_LOG("A search of user %u cannot be recorded: %s", record.uid, error_.c_str());
+      HistoryJournal::TellRefused(record.uid, error_);
     }
   }
   // One that the database refuses must not keep back the others. When it takes nothing at all, they

@@ -181,6 +181,11 @@ class CallTest(WebTest):
         slow.close()
         self.wait_until_idle()
         self.assertIn(self.call("inspect")[1]["pid"], (second, third))
+        slow = self.begin_call("slow", {"ms": LONG}, self.carol)
+        wait_until(lambda: self.metric("maruweb_children_busy") == 1, "the administrator's query to run")
+        fourth = self.call("inspect")[1]["pid"]
+        self.assertNotEqual(self.call("inspect")[1]["pid"], fourth, "an administrator may end anybody's")
+        slow.close()
 
     def test_no_request_is_lost_when_a_child_has_served_its_time(self):
         connection = self.raw()
