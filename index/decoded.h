@@ -19,20 +19,33 @@ namespace maru::index {
 /// Documents that are gone through together, and whose lengths are read together.
 constexpr std::size_t kBlockDocuments = 4096;
 
-/// The documents that have a term, ascending, and how often each has it.
-struct Postings {
+/// The documents that have a term, ascending, and how often each has it. All that there are in the
+/// process, in use or kept, share a bounded room.
+class Postings {
+ public:
+  /// Null when there is no room.
+  static std::shared_ptr<const Postings> Of(const std::string& term,
+                                            const Xapian::Database& database);
+  ~Postings();
+  Postings(const Postings&) = delete;
+  Postings& operator=(const Postings&) = delete;
+
   std::vector<DocumentId> ids;
-  std::vector<std::uint16_t> counts;
+  std::vector<std::uint32_t> counts;
+
+ private:
+  Postings() = default;
+
+  std::size_t room_ = 0;
 };
 
-/// Lengths of documents, read when asked for, and postings of terms that are asked for again.
-/// Thread-safe; every `database` given is at the one state.
+/// Lengths of documents, read when asked for, and postings of terms that the engine has decoded
+/// once. Thread-safe; every `database` given is at the one state.
 class Decoded {
  public:
   /// `last`: the highest id.
-  explicit Decoded(DocumentId last)
-      : lengths_(last / kBlockDocuments + 1), read_(lengths_.size()) {}
-  ~Decoded() { Forget(); }
+  explicit Decoded(DocumentId last);
+  ~Decoded();
   Decoded(const Decoded&) = delete;
   Decoded& operator=(const Decoded&) = delete;
 
@@ -44,23 +57,30 @@ class Decoded {
     return read_[number].load(std::memory_order_acquire) ? lengths_[number].data() : nullptr;
   }
 
-  /// A term's postings: null when it has not been asked for before, and when they are too many. All
-  /// that are kept, of all databases, take a bounded room.
+  /// A term's postings; null as long as the engine has walked over fewer than there are, and when
+  /// they are too many. When there is no room all that is kept, of all databases, is forgotten.
   std::shared_ptr<const Postings> Of(const std::string& term,
                                      const Xapian::Database& database) const;
+  /// To be told of how many of a term's postings, of `all` of them, the engine has walked over.
+  void Walked(const std::string& term, std::uint64_t steps, std::uint64_t all) const noexcept;
 
  private:
-  std::shared_ptr<const Postings> Find(const std::string& term, bool& asked_before) const;
-  void Keep(const std::string& term, const std::shared_ptr<const Postings>& postings) const;
-  void Forget() const;
+  struct Row {
+    std::shared_ptr<const Postings> postings;
+    /// To walk over before it is worth keeping them.
+    std::int64_t left;
+  };
+  struct Everybody;
+
+  static Everybody& All();
+  static void MakeRoom(bool all);
 
   mutable std::mutex mutex_;
   mutable std::vector<std::vector<std::uint32_t>> lengths_;
   /// Which of them stand.
   mutable std::vector<std::atomic<bool>> read_;
-  /// Null for a term that was asked for once.
-  mutable std::unordered_map<std::string, std::shared_ptr<const Postings>> postings_;
-  mutable std::size_t kept_ = 0;
+  /// With Everybody's lock.
+  mutable std::unordered_map<std::string, Row> rows_;
 };
 
 }  // namespace maru::index

@@ -36,7 +36,7 @@ std::shared_ptr<const DirectoryTable> SharedIndex::Table(const Xapian::Database&
   engine_name_ = engine_name;
   decoded_table_ = nullptr;
   decoded_ = nullptr;
-  std::erase_if(known_, [](const Known& known) { return known.table.use_count() <= 1; });
+  known_.clear();
   return table_;
 }
 

@@ -93,9 +93,6 @@ class OpenIndices {
   DocumentId DocumentOf(Xapian::docid id) const {
     return static_cast<DocumentId>((id - 1) / Count() + 1);
   }
-  Xapian::docid IdOf(std::size_t share, DocumentId document) const {
-    return static_cast<Xapian::docid>((document - 1) * Count() + share + 1);
-  }
 
  private:
   struct Share {

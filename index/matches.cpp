@@ -35,7 +35,7 @@ struct Counted {
 
 Weighing::Weighing(const Xapian::Database& all) : all_(all), documents_(all.get_doccount()) {
   const double average = all.get_average_length();
-  if (average > 0) per_average_ = 1 / average;
+  if (average > 0) half_per_average_ = 0.5 / average;
 }
 
 double Weighing::Of(const std::string& term) const {
@@ -118,12 +118,17 @@ class TermNode : public Node {
 class EngineTerm : public TermNode {
  public:
   /// An empty term is in every document.
-  EngineTerm(const Xapian::Database& database, const std::string& term)
+  EngineTerm(const Xapian::Database& database, const Decoded& decoded, const std::string& term)
       : TermNode(term.empty() ? database.get_doccount() : database.get_termfreq(term),
                  database.get_lastdocid()),
+        decoded_(decoded),
+        term_(term),
         at_(database.postlist_begin(term)),
         end_(database.postlist_end(term)) {
     Look();
+  }
+  ~EngineTerm() override {
+    if (!term_.empty()) decoded_.Walked(term_, steps_, Most());
   }
 
   DocumentId Bound() const override { return id_; }
@@ -152,15 +157,20 @@ class EngineTerm : public TermNode {
  private:
   void Look() { id_ = at_ == end_ ? kNone : *at_; }
   void Step() {
+    ++steps_;
     ++at_;
     Look();
   }
   void SkipTo(DocumentId id) {
     if (id_ == kNone) return;
+    ++steps_;
     at_.skip_to(id);
     Look();
   }
 
+  const Decoded& decoded_;
+  const std::string term_;
+  std::uint64_t steps_ = 0;
   Xapian::PostingIterator at_, end_;
   DocumentId id_ = kNone;
 };
@@ -171,42 +181,47 @@ class KnownTerm : public TermNode {
   KnownTerm(const Xapian::Database& database, std::shared_ptr<const Postings> postings)
       : TermNode(postings->ids.size(), database.get_lastdocid()),
         database_(database),
-        postings_(std::move(postings)),
-        at_(postings_->ids.begin()) {}
+        postings_(std::move(postings)) {}
 
-  DocumentId Bound() const override { return at_ == postings_->ids.end() ? kNone : *at_; }
+  DocumentId Bound() const override {
+    return at_ == postings_->ids.size() ? kNone : postings_->ids[at_];
+  }
 
   void Add(const Place& place, const Counted* within, Set& set) override {
     const DocumentId first = place.block.first;
-    const auto begin = postings_->ids.begin();
-    at_ = std::lower_bound(at_, postings_->ids.end(), first);
-    const auto end =
-        std::lower_bound(at_, postings_->ids.end(), first + DocumentId{MatchBlock::kDocuments});
+    const DocumentId* const ids = postings_->ids.data();
+    const std::size_t end = postings_->ids.size();
+    std::size_t at = at_;
+    const auto skip_to = [&](DocumentId id) {
+      if (at < end && ids[at] < id) {
+        at = static_cast<std::size_t>(std::lower_bound(ids + at, ids + end, id) - ids);
+      }
+    };
     const auto take = [&] {
       Take(
-          place, *at_ - first, set,
-          [&] { return postings_->counts[static_cast<std::size_t>(at_ - begin)]; },
-          [&] { return database_.get_doclength(*at_); });
+          place, ids[at] - first, set, [&] { return postings_->counts[at]; },
+          [&] { return database_.get_doclength(ids[at]); });
     };
+    skip_to(first);
     if (IsMuchMoreThan(within)) {
       for (std::size_t i = 0; i < kWords; ++i) {
         ForEachBit(i, within->set[i], [&](DocumentId offset) {
-          at_ = std::lower_bound(at_, end, first + offset);
-          if (at_ != end && *at_ == first + offset) take();
+          skip_to(first + offset);
+          if (at < end && ids[at] == first + offset) take();
         });
       }
-      at_ = end;
-      return;
+    } else {
+      for (; at < end && ids[at] - first < MatchBlock::kDocuments; ++at) {
+        if (IsIn(within, ids[at] - first)) take();
+      }
     }
-    for (; at_ != end; ++at_) {
-      if (IsIn(within, *at_ - first)) take();
-    }
+    at_ = at;
   }
 
  private:
   const Xapian::Database& database_;
   std::shared_ptr<const Postings> postings_;
-  std::vector<DocumentId>::const_iterator at_;
+  std::size_t at_ = 0;
 };
 
 class OrNode : public Node {
@@ -319,7 +334,7 @@ class Builder {
       case Plan::Kind::kNothing:
         return Any({}, factor);
       case Plan::Kind::kEverything:
-        return std::make_unique<EngineTerm>(database_, std::string());
+        return std::make_unique<EngineTerm>(database_, decoded_, std::string());
       case Plan::Kind::kTerm:
         return Term(plan.term, factor);
       case Plan::Kind::kOr:
@@ -339,11 +354,12 @@ class Builder {
 
  private:
   NodePtr Term(const std::string& term, double factor) const {
+    look_();
     std::unique_ptr<TermNode> node;
     if (auto postings = decoded_.Of(term, database_)) {
       node = std::make_unique<KnownTerm>(database_, std::move(postings));
     } else {
-      node = std::make_unique<EngineTerm>(database_, term);
+      node = std::make_unique<EngineTerm>(database_, decoded_, term);
     }
     if (weighing_ && factor != 0 && node->Most() > 0) node->Weigh(factor * weighing_->Of(term));
     return node;
@@ -351,7 +367,6 @@ class Builder {
   NodePtr Any(const std::vector<Plan>& plans, double factor) const {
     std::vector<NodePtr> parts, mixed;
     for (const Plan& plan : plans) {
-      if (parts.size() % kPartsBetweenLooks == kPartsBetweenLooks - 1) look_();
       const bool simple = plan.kind == Plan::Kind::kTerm || plan.kind == Plan::Kind::kOr;
       (simple || factor == 0 ? parts : mixed).push_back(Build(plan, factor));
     }

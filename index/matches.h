@@ -49,13 +49,13 @@ class Weighing {
   double Of(const std::string& term) const;
   /// What the count of a term is set against in a document of so many words.
   double Against(std::uint32_t length) const {
-    return std::max(length * per_average_, 0.5) * 0.5 + 0.5;
+    return std::max(length * half_per_average_ + 0.5, 0.75);
   }
 
  private:
   const Xapian::Database& all_;
   double documents_;
-  double per_average_ = 0;
+  double half_per_average_ = 0;
   mutable std::unordered_map<std::string, double> known_;
 };
 

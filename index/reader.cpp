@@ -1,6 +1,7 @@
 #include <algorithm>
 #include <cmath>
 #include <numeric>
+#include <tuple>
 
 #include "index/engine.h"
 #include "index/fields.h"
@@ -243,7 +244,8 @@ EngineReader::Found EngineReader::Best(const Plan& plan, const SearchOptions& op
   const std::size_t wanted = std::size_t{options.from} + options.size;
   // Of equals the first document is the better one, as for the engine.
   const auto better = [](const Weighed& a, const Weighed& b) {
-    return a.weight != b.weight ? a.weight > b.weight : a.id < b.id;
+    return a.weight != b.weight ? a.weight > b.weight
+                                : std::tie(a.document, a.share) < std::tie(b.document, b.share);
   };
   std::vector<Weighed>& best = found.best;
   const auto take = [&](const Weighed& match) {
@@ -268,7 +270,7 @@ EngineReader::Found EngineReader::Best(const Plan& plan, const SearchOptions& op
                   if (boost != options.boosts.end() && boost->first == key) {
                     weight += kBoostWeight * boost->second;
                   }
-                  take({indices_->IdOf(share, id), weight});
+                  take({share, id, weight});
                 });
               });
   std::sort_heap(best.begin(), best.end(), better);
@@ -317,7 +319,8 @@ EngineReader::Found EngineReader::Enquired(const Plan& plan, const SearchOptions
           .get_mset(options.from, options.size, of_terms ? 0 : indices_->All().get_doccount());
   Found found;
   for (auto match = set.begin(); match != set.end(); ++match) {
-    found.best.push_back({*match, match.get_weight()});
+    found.best.push_back(
+        {indices_->ShareOf(*match), indices_->DocumentOf(*match), match.get_weight()});
   }
   found.total = of_terms ? CountOf(plan) : set.get_matches_estimated();
   return found;
@@ -327,14 +330,16 @@ EngineReader::Found EngineReader::Enquired(const Plan& plan, const SearchOptions
 std::vector<Hit> EngineReader::HitsOf(const std::vector<Weighed>& matches) const {
   std::vector<std::size_t> order(matches.size());
   std::iota(order.begin(), order.end(), 0);
-  std::sort(order.begin(), order.end(),
-            [&](auto a, auto b) { return matches[a].id < matches[b].id; });
+  std::sort(order.begin(), order.end(), [&](auto a, auto b) {
+    return std::tie(matches[a].share, matches[a].document) <
+           std::tie(matches[b].share, matches[b].document);
+  });
   std::vector<Hit> hits(matches.size());
   for (const std::size_t rank : order) {
-    const Xapian::docid id = matches[rank].id;
-    hits[rank] = HitOf(indices_->ShareOf(id), indices_->DocumentOf(id),
-                       Stored::Decode(indices_->All().get_document(id).get_data()));
-    hits[rank].score = matches[rank].weight;
+    const auto& [share, document, weight] = matches[rank];
+    hits[rank] = HitOf(share, document,
+                       Stored::Decode(indices_->Database(share).get_document(document).get_data()));
+    hits[rank].score = weight;
   }
   return hits;
 }

@@ -60,7 +60,8 @@ class EngineReader : public Reader, private Sources {
 
   /// A result: its id in all databases together.
   struct Weighed {
-    Xapian::docid id;
+    std::size_t share;
+    DocumentId document;
     double weight;
   };
   /// The best matches, best first, and how many there are in all.
