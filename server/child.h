@@ -10,8 +10,8 @@ namespace maru::server {
 constexpr int kExitSessionOver = 77;
 
 /// What a child says to the host: first, unless the request may act as root, that it can end
-/// processes of its user only; that its answer is about to go to the front; and, if it stays for its
-/// user's next request, that this one is over.
+/// processes of its user only; that its answer is about to go to the front; and, if it stays for
+/// its user's next request, that this one is over.
 constexpr char kEndsOwnOnly = 'o';
 constexpr char kAnswered = 'a';
 constexpr char kRequestOver = 'd';
