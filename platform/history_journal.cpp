@@ -147,7 +147,15 @@ bool HistoryJournal::SetAside() const {
     errno = ENOENT;
     return false;
   }
-  return renameat2(AT_FDCWD, path_.c_str(), AT_FDCWD, aside_.c_str(), RENAME_NOREPLACE) == 0;
+  // Not every file system can rename without replacing: one process at a time looks and renames.
+  const std::string folder = path_.substr(0, path_.rfind('/'));
+  const maru::UniqueFd turn(open(folder.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  if (!turn || !Lock(turn, status)) return false;
+  if (lstat(aside_.c_str(), &status) == 0) {
+    errno = EEXIST;
+    return false;
+  }
+  return rename(path_.c_str(), aside_.c_str()) == 0;
 }
 
 /// Gives what is set aside to `take`, after whoever else does.

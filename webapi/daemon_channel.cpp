@@ -49,9 +49,9 @@ DaemonReply Exchange(const Json::Value& request, const ExchangeRules& rules) {
   if (!reply.body.isObject()) return Malformed(text);
   if (AsBool(maru::json::Member(reply.body, "success"))) return reply;
   const Json::Value& error = maru::json::Member(reply.body, "error");
-  const int code = maru::json::IntMember(error, "code");
-  if (code == 0) return Malformed(text);
-  throw Error(static_cast<ErrorCode>(code), maru::json::StringMember(error, "msg"));
+  const Json::Value& code = maru::json::Member(error, "code");
+  if (!code.isInt()) return Malformed(text);
+  throw Error(static_cast<ErrorCode>(code.asInt()), maru::json::StringMember(error, "msg"));
 }
 
 }  // namespace maruseeker::webapi

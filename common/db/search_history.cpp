@@ -3,8 +3,9 @@
 #include <cstring>
 #include <map>
 
+#include "platform/guard.h"
 #include "platform/history_journal.h"
-#include "platform/log.h"
+#include "platform/utf8.h"
 
 namespace maruseeker::db {
 namespace {
@@ -58,13 +59,14 @@ void SearchHistory::FromValues(const soci::values& values) {
 SearchHistoryTable::SearchHistoryTable() : TableBase(DBSession::Instance(), "search_history") {}
 
 int SearchHistoryTable::Count(const Condition& cond) {
-  return CatchUp() ? TableBase::Count(cond) : 0;
+  Settle();
+  return TableBase::Count(cond);
 }
 
 bool SearchHistoryTable::GetAll(std::vector<SearchHistory>& recs, const Condition& cond,
                                 const SelectParam& param) {
-  recs.clear();
-  return CatchUp() && TableBase::GetAll(recs, cond, param);
+  Settle();
+  return TableBase::GetAll(recs, cond, param);
 }
 
 bool SearchHistoryTable::Delete(const Condition& cond) {
@@ -72,6 +74,11 @@ bool SearchHistoryTable::Delete(const Condition& cond) {
 }
 
 bool SearchHistoryTable::UpdateWithTime(SearchHistory& rec, int max) {
+  settled_ = false;
+  // A database may refuse what is no text: the caller is told.
+  if (!maru::IsUTF8(rec.keyword) || rec.keyword.find('\0') != std::string::npos) {
+    return CatchUp() && TakeNow(rec, max);
+  }
   const HistoryJournal journal = HistoryJournal::OfService();
   bool long_enough = false;
   if (!journal.Add({rec.uid, rec.keyword, rec.create_time, max}, long_enough)) {
@@ -81,7 +88,23 @@ bool SearchHistoryTable::UpdateWithTime(SearchHistory& rec, int max) {
   return !long_enough || CatchUp();
 }
 
+/// Once for all that is read: what cannot be taken over now does not keep from reading the rest.
+void SearchHistoryTable::Settle() {
+  if (settled_) return;
+  const std::string error = error_;
+  if (!CatchUp()) error_ = error;
+  settled_ = true;
+}
+
+bool SearchHistoryTable::TakeNow(SearchHistory& rec, int max) {
+  std::string reason;
+  if (session_->Transaction([&] { return Record(rec) && Prune(rec, max); }, reason)) return true;
+  if (!reason.empty()) error_ = reason;
+  return false;
+}
+
 bool SearchHistoryTable::CatchUp() {
+  const maru::KeepErrno keep;
   std::string reason;
   const bool done = HistoryJournal::OfService().HandOver([&](const auto& entries) {
     return session_->Transaction([&] { return Take(entries); }, reason);
@@ -106,20 +129,19 @@ bool SearchHistoryTable::Take(const std::vector<HistoryJournal::Entry>& entries)
     record.create_time = entry.create_time;
     last[entry.uid] = {known->second, entry.max};
   }
-  std::size_t taken = 0;
+  std::vector<std::pair<uid_t, std::string>> refused;
   for (SearchHistory& record : records) {
-    if (session_->Attempt([&] { return Record(record); })) {
-      ++taken;
-    } else {
-      HistoryJournal::TellRefused(record.uid, error_);
-    }
+    if (!session_->Attempt([&] { return Record(record); }))
+      refused.emplace_back(record.uid, error_);
   }
   // One that the database refuses must not keep back the others. When it takes nothing at all, they
   // may come again.
-  if (taken == 0 && !TakesAny(records.back())) return false;
+  if (refused.size() == records.size() && !TakesAny(records.back())) return false;
   for (const auto& [uid, newest] : last) {
-    if (!Prune(records[newest.first], newest.second)) return false;
+    const SearchHistory& record = records[newest.first];
+    if (record.id != 0 && !Prune(record, newest.second)) return false;
   }
+  for (const auto& [uid, reason] : refused) HistoryJournal::TellRefused(uid, reason);
   return true;
 }
 

@@ -115,10 +115,10 @@ const char* ConverterOf(std::string_view charset) {
 
 /// The open converter, or null when this machine has none. They stay open for good.
 iconv_t* Converter(const std::string& name) {
-  static std::map<std::string, iconv_t> open;
-  auto place = open.find(name);
-  if (place == open.end()) {
-    place = open.emplace(name, iconv_open("UTF-8", name.c_str())).first;
+  static auto* const open = new std::map<std::string, iconv_t>;
+  auto place = open->find(name);
+  if (place == open->end()) {
+    place = open->emplace(name, iconv_open("UTF-8", name.c_str())).first;
   }
   return place->second == reinterpret_cast<iconv_t>(-1) ? nullptr : &place->second;
 }

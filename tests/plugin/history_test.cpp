@@ -23,6 +23,7 @@ using maruseeker::db::SearchHistoryTable;
 using maruseeker::db::SelectParam;
 using testing::ContainsRegex;
 using testing::HasSubstr;
+using testing::Not;
 
 constexpr const char* kDatabase = "/var/lib/maruseeker/history.db";
 constexpr const char* kJournal = "/var/lib/maruseeker/history.journal";
@@ -123,6 +124,7 @@ TEST_F(History, PagesSortedAndFiltered) {
     EXPECT_THAT(answer.log, HasSubstr("(Execute) Failed [!table.GetAll(recs, cond, "
                                       "db::SelectParam(offset_, limit_, sort_by_, asc_))], "
                                       "reason: "));
+    EXPECT_THAT(answer.log, Not(HasSubstr("[err: "))) << "no file failed";
   }
 }
 
@@ -289,9 +291,12 @@ TEST_F(History, DatabaseThatFails) {
 }
 
 TEST_F(History, JournalThatFails) {
+  ASSERT_TRUE(Record(60001, {"before"}));
+  EXPECT_EQ(Get(Alice()), "1: before@1000");
   std::filesystem::create_directory(kJournal);
   EXPECT_FALSE(Record(60001, {"nowhere"}));
-  EXPECT_EQ(Get(Alice()), "9999");
+  EXPECT_EQ(Get(Alice()), "1: before@1000");
+  EXPECT_EQ(Delete(Alice(), "1").code, 9999);
   maruseeker::pref::Preference(60001).Set<bool>("enable_history", true);
   const Answer search = Ask(
       Alice(), "search", FromText("{'search_weight_list':[],'indice':['private'],'keyword':'k'}"));
@@ -300,7 +305,7 @@ TEST_F(History, JournalThatFails) {
 }
 
 TEST_F(History, WhatIsNoSearchInTheJournalIsLeftOut) {
-  ASSERT_TRUE(Record(60001, {"one\ntwo", std::string("nul\0!", 5)}));
+  ASSERT_TRUE(Record(60001, {"one\ntwo"}));
   std::string text;
   ASSERT_TRUE(maru::ReadWholeFile(kJournal, 1 << 20, text));
   const std::string garbage =
@@ -309,7 +314,7 @@ TEST_F(History, WhatIsNoSearchInTheJournalIsLeftOut) {
       std::string(100, '\0') + "\n";
   // A line that was cut ends the file, too.
   WriteFile(kJournal, garbage + text + garbage + text.substr(0, 20), 0600, 60000);
-  EXPECT_EQ(Get(Alice()), "2: one\ntwo@1000 " + std::string("nul\0!", 5) + "@1001");
+  EXPECT_EQ(Get(Alice()), "1: one\ntwo@1000");
 }
 
 TEST_F(History, OneThatTheDatabaseRefusesKeepsBackNoOther) {
@@ -325,6 +330,23 @@ TEST_F(History, OneThatTheDatabaseRefusesKeepsBackNoOther) {
   EXPECT_EQ(Get(Alice()), "1: first@1000");
   ASSERT_TRUE(Record(60001, {"yes", "no", "last"}, 2, 2000));
   EXPECT_EQ(Get(Alice()), "2: yes@2000 last@2002");
+  ASSERT_TRUE(Record(60001, {"no"}, 1, 3000));
+  EXPECT_EQ(Get(Alice()), "2: yes@2000 last@2002");
+}
+
+TEST_F(History, WhatIsNoTextIsForTheDatabaseToJudge) {
+  const std::string nul("nul\0!", 5), byte = "\xff";
+  ASSERT_TRUE(Record(60001, {"text", nul, byte}, 2));
+  EXPECT_FALSE(std::filesystem::exists(kJournal));
+  EXPECT_EQ(Get(Alice()), "2: " + nul + "@1001 " + byte + "@1002");
+  AsService([](SearchHistoryTable&) {
+    maruseeker::db::DBSession::Instance()->Open()
+        << "CREATE TRIGGER refuse AFTER INSERT ON search_history WHEN CAST(NEW.keyword AS BLOB) = "
+           "x'ff01' "
+           "BEGIN SELECT RAISE(ABORT, 'refused'); END";
+    return Json::Value();
+  });
+  EXPECT_FALSE(Record(60001, {byte + "\x01"}));
 }
 
 TEST_F(History, LongJournalIsTakenOverByWhoSearches) {

@@ -131,11 +131,13 @@ class HistoryTest(road.RoadTest):
 
     def test_the_service_writes_it(self):
         road.wait_until(lambda: "first keyword" in self.keywords(), "the keyword in the history")
-        for file in (HISTORY, HISTORY.with_suffix(".journal")):
-            self.assertEqual(pwd.getpwnam("MaruSeeker").pw_uid, file.stat().st_uid)
-            self.assertEqual(0, file.stat().st_mode & 0o077)
         bob = self.services.sign_in("bob")
         road.search(self.services, bob, "  of bob  ")
+        journal = HISTORY.with_suffix(".journal")
+        road.wait_until(journal.exists, "a line in the journal")
+        for file in (HISTORY, journal):
+            self.assertEqual(pwd.getpwnam("MaruSeeker").pw_uid, file.stat().st_uid)
+            self.assertEqual(0, file.stat().st_mode & 0o077)
         road.wait_until(lambda: self.keywords(bob) == ["of bob"], "bob's keyword, trimmed")
         self.assertNotIn("of bob", self.keywords())
 

@@ -33,7 +33,8 @@ class SearchHistoryTable : public TableBase<SearchHistory> {
  public:
   SearchHistoryTable();
 
-  /// As TableBase has them.
+  /// As TableBase has them. The first of those that read takes over the searches that are not in
+  /// the table yet, as far as that is possible.
   int Count(const marudbquery::Condition& cond);
   bool GetAll(std::vector<SearchHistory>& recs, const marudbquery::Condition& cond,
               const SelectParam& param);
@@ -48,10 +49,15 @@ class SearchHistoryTable : public TableBase<SearchHistory> {
  private:
   /// Takes the journal's searches into the table; all of it happens or nothing does.
   bool CatchUp();
+  void Settle();
+  bool TakeNow(SearchHistory& rec, int max);
   bool Take(const std::vector<HistoryJournal::Entry>& entries);
   bool TakesAny(SearchHistory row);
   bool Record(SearchHistory& rec);
   bool Prune(const SearchHistory& newest, int max);
+
+  /// Whether the journal was taken over, or cannot be, since the last record.
+  bool settled_ = false;
 };
 
 }  // namespace maruseeker::db
