@@ -1,4 +1,4 @@
-#include <soci/sqlite3/soci-sqlite3.h>
+#include <soci/soci.h>
 #include <unistd.h>
 
 #include <map>
@@ -24,28 +24,18 @@ constexpr const char* kCheckpoint = "PRAGMA wal_autocheckpoint = 400";
 // database.
 constexpr const char* kSynchronous = "PRAGMA synchronous = NORMAL";
 
-/// Most connections live for a few statements: memory laid out ahead for many costs more than it
-/// saves.
-void KeepMemorySmall() {
-  static const bool done = [] {
-    constexpr int kNone = 0;
-    sqlite_api::sqlite3_config(SQLITE_CONFIG_LOOKASIDE, kNone, kNone);
-    sqlite_api::sqlite3_config(SQLITE_CONFIG_PAGECACHE, nullptr, kNone, kNone);
-    return true;
-  }();
-  static_cast<void>(done);
-}
-
-std::unique_ptr<soci::session> Connect(std::string_view backend, const std::string& connection) {
-  if (backend == kSQLite) KeepMemorySmall();
-  if (backend == kSQLite) return std::make_unique<soci::session>(soci::sqlite3, connection);
-  // Loaded only where it is asked for, and by name, never from the current folder.
+/// Backends are loaded only where they are asked for, by few processes, and by name, never from the
+/// current folder.
+std::unique_ptr<soci::session> Connect(const std::string& backend, const std::string& connection) {
   static const bool registered = [] {
-    soci::dynamic_backends::register_backend("postgresql", "libsoci_postgresql.so.4.0");
+    for (const std::string_view name : {kSQLite, kPostgreSQL}) {
+      soci::dynamic_backends::register_backend(std::string(name),
+                                               "libsoci_" + std::string(name) + ".so.4.0");
+    }
     return true;
   }();
   static_cast<void>(registered);
-  return std::make_unique<soci::session>(std::string(backend), connection);
+  return std::make_unique<soci::session>(backend, connection);
 }
 
 void PrepareSQLite(soci::session& database) {
