@@ -137,7 +137,9 @@ void Run(const Options& options, std::size_t first, Totals& totals) {
     totals.times.push_back(std::chrono::duration<double, std::micro>(Clock::now() - start).count());
     totals.bytes += answer.size();
     totals.hits += HitsIn(answer);
-    totals.failed += answer.find(options.expected) == std::string::npos;
+    if (answer.find(options.expected) == std::string::npos && totals.failed++ == 0) {
+      std::cerr << "instead of " + options.expected + ": " + answer.substr(0, 600) + "\n";
+    }
   }
 }
 
