@@ -4,9 +4,9 @@
 def number(value):
     if value is None:
         return "-"
-    if value >= 100:
+    if abs(value) >= 100:
         return f"{value:,.0f}"
-    return f"{value:.1f}" if value >= 10 else f"{value:.2f}"
+    return f"{value:.1f}" if abs(value) >= 10 else f"{value:.2f}"
 
 
 def ratio(ours, theirs):
