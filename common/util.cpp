@@ -57,9 +57,8 @@ bool IsDirentDir(const dirent* entry, const std::string&) {
 }
 
 bool CheckACLPerm(const std::string& path, int mask) {
-  unsigned int bits = 0;
-  if (MARUACLPermGet(path.c_str(), &bits) < 0) return false;
-  return (bits & static_cast<unsigned int>(mask)) != 0;
+  auto bits = static_cast<unsigned int>(mask);
+  return MARUACLPermGet(path.c_str(), &bits) >= 0 && bits != 0;
 }
 
 bool IsMountPoint(const std::string& path) {

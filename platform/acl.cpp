@@ -62,18 +62,24 @@ int Walk(const maru::Identity& who, const std::string& folder, std::string_view 
 }  // namespace
 
 int MARUACLPermGet(const char* path, unsigned int* bits) {
+  static_assert(kACLRead == R_OK && kACLWrite == W_OK && kACLExecute == X_OK);
   if (!path || !bits) return -1;
-  // The way to the file is gone once.
+  const int asked = static_cast<int>(*bits) & (kACLRead | kACLWrite | kACLExecute);
+  *bits = static_cast<unsigned int>(asked);
+  {
+    // One look, when the user has them all.
+    const maru::KeepErrno keep;
+    if (faccessat(AT_FDCWD, path, asked, AT_EACCESS) == 0) return 0;
+  }
   const maru::UniqueFd file(open(path, O_PATH | O_CLOEXEC));
   if (!file) return -1;
   const maru::KeepErrno keep;
-  const auto may = [&](int what) {
-    return faccessat(file.Get(), "", what, AT_EACCESS | AT_EMPTY_PATH) == 0;
-  };
   *bits = 0;
-  if (may(R_OK)) *bits |= kACLRead;
-  if (may(W_OK)) *bits |= kACLWrite;
-  if (may(X_OK)) *bits |= kACLExecute;
+  for (const int bit : {kACLRead, kACLWrite, kACLExecute}) {
+    if ((asked & bit) && faccessat(file.Get(), "", bit, AT_EACCESS | AT_EMPTY_PATH) == 0) {
+      *bits |= static_cast<unsigned int>(bit);
+    }
+  }
   return 0;
 }
 

@@ -16,8 +16,9 @@ constexpr int kACLRead = 4;
 constexpr int kACLWrite = 2;
 constexpr int kACLExecute = 1;
 
-/// Permission bits (4 read, 2 write, 1 execute) of the current effective user on the path, as the
-/// kernel judges them now. 0 with `*bits` set, or -1 with errno (no such path, or not reachable).
+/// Which of the permission bits in `*bits` (4 read, 2 write, 1 execute) the current effective user
+/// has on the path, as the kernel judges now. 0 with `*bits` set to those, or -1 with errno (no
+/// such path, or not reachable).
 int MARUACLPermGet(const char* path, unsigned int* bits);
 
 /// Permission bits of any user, computed from owners, modes and ACLs of the path and, for the way
