@@ -101,9 +101,11 @@ void OpenIndices::Refresh() {
     if (share.table && version == share.version) continue;
     share.database.reopen();
     widened_.Clear();
+    weighing_.reset();
     share.table = share.index->Table(share.database);
     share.version = version;
   }
+  if (!weighing_) weighing_.emplace(all_);
 }
 
 struct Library::State {

@@ -5,6 +5,7 @@
 #include <map>
 #include <memory>
 #include <mutex>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -87,6 +88,7 @@ class OpenIndices {
   const std::shared_ptr<const ShareNumbers>& Numbers() const { return numbers_; }
   /// Of the state the handles are at.
   Expansions& Widened() { return widened_; }
+  const Weighing& Weights() const { return *weighing_; }
 
   /// Ids in `All` and ids within a share.
   std::size_t ShareOf(Xapian::docid id) const { return (id - 1) % Count(); }
@@ -106,6 +108,7 @@ class OpenIndices {
   Xapian::Database all_;
   std::shared_ptr<const ShareNumbers> numbers_;
   Expansions widened_;
+  std::optional<Weighing> weighing_;
 };
 
 }  // namespace maru::index

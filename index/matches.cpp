@@ -17,6 +17,8 @@ constexpr std::uint64_t kMuchMore = 8;
 constexpr std::size_t kPartsBetweenLooks = 64;
 /// Where a block may have so many matches, its lengths are read together.
 constexpr std::uint64_t kManyMatches = 16;
+/// Terms whose weights are kept.
+constexpr std::size_t kMostKnown = 16384;
 
 using Set = std::array<Bits, kWords>;
 
@@ -41,6 +43,7 @@ Weighing::Weighing(const Xapian::Database& all) : all_(all), documents_(all.get_
 double Weighing::Of(const std::string& term) const {
   const auto known = known_.find(term);
   if (known != known_.end()) return known->second;
+  if (known_.size() >= kMostKnown) known_.clear();
   const double frequency = all_.get_termfreq(term);
   double rarity = (documents_ - frequency + 0.5) / (frequency + 0.5);
   if (rarity < 2) rarity = rarity * 0.5 + 1;

@@ -42,7 +42,7 @@ struct MatchBlock {
 /// least half the average. Robertson et al., "Okapi at TREC-3", 1994. One thread.
 class Weighing {
  public:
-  /// `all` are the databases that are searched together.
+  /// `all` are the databases that are searched together, at one state; they outlive this object.
   explicit Weighing(const Xapian::Database& all);
 
   /// What a document could at most get for the term.

@@ -257,9 +257,8 @@ EngineReader::Found EngineReader::Best(const Plan& plan, const SearchOptions& op
     best.push_back(match);
     std::push_heap(best.begin(), best.end(), better);
   };
-  const Weighing weighing(indices_->All());
   auto boost = options.boosts.begin();
-  ForEachSeen(plan, &weighing,
+  ForEachSeen(plan, &indices_->Weights(),
               [&](std::size_t share, const MatchBlock& block, std::size_t i, Bits seen) {
                 found.total += CountBits(seen);
                 ForEachBit(i, seen, [&](DocumentId offset) {
@@ -327,7 +326,7 @@ EngineReader::Found EngineReader::Enquired(const Plan& plan, const SearchOptions
 }
 
 /// Documents are read in their own order, in which the engine reads each block once.
-std::vector<Hit> EngineReader::HitsOf(const std::vector<Weighed>& matches) const {
+std::vector<Hit> EngineReader::HitsOf(const std::vector<Weighed>& matches) {
   std::vector<std::size_t> order(matches.size());
   std::iota(order.begin(), order.end(), 0);
   std::sort(order.begin(), order.end(), [&](auto a, auto b) {
@@ -337,9 +336,10 @@ std::vector<Hit> EngineReader::HitsOf(const std::vector<Weighed>& matches) const
   std::vector<Hit> hits(matches.size());
   for (const std::size_t rank : order) {
     const auto& [share, document, weight] = matches[rank];
-    hits[rank] = HitOf(share, document,
-                       Stored::Decode(indices_->Database(share).get_document(document).get_data()));
+    std::string data = indices_->Database(share).get_document(document).get_data();
+    hits[rank] = HitOf(share, document, Stored::Decode(data));
     hits[rank].score = weight;
+    found_.insert_or_assign({share, document}, std::move(data));
   }
   return hits;
 }
@@ -466,7 +466,10 @@ std::vector<Fragment> EngineReader::Fragments(std::size_t share, DocumentId docu
 std::optional<Stored> EngineReader::Read(std::size_t share, DocumentId document) const {
   if (share >= indices_->Count() || document == 0) return std::nullopt;
   try {
-    Stored stored = Stored::Decode(indices_->Database(share).get_document(document).get_data());
+    const auto found = found_.find({share, document});
+    Stored stored = Stored::Decode(
+        found != found_.end() ? found->second
+                              : indices_->Database(share).get_document(document).get_data());
     return Sees(share, stored.place) ? std::optional(std::move(stored)) : std::nullopt;
   } catch (const Xapian::DocNotFoundError&) {
     return std::nullopt;

@@ -82,7 +82,7 @@ class EngineReader : public Reader, private Sources {
   bool Sees(std::size_t share, const Place& place) const;
   bool SomeDocumentSeen(const std::string& term) const;
   Hit HitOf(std::size_t share, DocumentId id, Stored stored) const;
-  std::vector<Hit> HitsOf(const std::vector<Weighed>& matches) const;
+  std::vector<Hit> HitsOf(const std::vector<Weighed>& matches);
   FragmentFinder& FinderOf(const Query& query, const std::string& field);
   PresentWords InDocument(std::size_t share, DocumentId document,
                           const FragmentFinder& finder) const;
@@ -98,6 +98,8 @@ class EngineReader : public Reader, private Sources {
   std::map<std::string, FragmentFinder> finders_;
   Query finders_query_;
   StoredText text_;
+  /// What the engine has of the hits, whose fragments are asked for next.
+  std::map<std::pair<std::size_t, DocumentId>, std::string> found_;
   /// Of the search under way.
   std::function<bool()> cancelled_;
 };
@@ -112,6 +114,7 @@ auto EngineReader::OnOneState(const char* doing, Work&& work) -> decltype(work()
         indices_->Refresh();
         if (!blind_) SetEyes(who_);
         finders_.clear();
+        found_.clear();
       }
     }
     return work();
