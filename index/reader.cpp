@@ -409,7 +409,11 @@ PresentWords EngineReader::InDocument(std::size_t share, DocumentId document,
                                       const FragmentFinder& finder) const {
   const std::string prefix(FindField(kText)->prefix);
   const Xapian::Database& database = indices_->Database(share);
+  const auto decoded = indices_->DecodedOf(share);
   const auto has_document = [&](const std::string& term) {
+    if (const auto postings = decoded->Of(term, database)) {
+      return std::binary_search(postings->ids.begin(), postings->ids.end(), document);
+    }
     auto at = database.postlist_begin(term);
     if (at != database.postlist_end(term)) at.skip_to(document);
     return at != database.postlist_end(term) && *at == document;
