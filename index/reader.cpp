@@ -336,7 +336,9 @@ std::vector<Hit> EngineReader::HitsOf(const std::vector<Weighed>& matches) {
   std::vector<Hit> hits(matches.size());
   for (const std::size_t rank : order) {
     const auto& [share, document, weight] = matches[rank];
-    std::string data = indices_->Database(share).get_document(document).get_data();
+    const Xapian::Database& database = indices_->Database(share);
+    // A match is there: looking whether it is would cost as much again.
+    std::string data = database.get_document(document, Xapian::DOC_ASSUME_VALID).get_data();
     hits[rank] = HitOf(share, document, Stored::Decode(data));
     hits[rank].score = weight;
     found_.insert_or_assign({share, document}, std::move(data));
