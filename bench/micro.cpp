@@ -12,7 +12,7 @@
 #include "index/signature.h"
 #include "index/tokenizer.h"
 #include "index/writer.h"
-#include "platform/json.h"
+#include "system/json.h"
 
 namespace {
 

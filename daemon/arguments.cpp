@@ -3,7 +3,7 @@
 #include <algorithm>
 #include <cmath>
 
-#include "platform/json.h"
+#include "system/json.h"
 
 namespace maru::daemon {
 namespace {

@@ -4,8 +4,8 @@
 #include <cstddef>
 #include <string>
 
-#include "platform/acl.h"
-#include "platform/unique_fd.h"
+#include "system/rights.h"
+#include "system/unique_fd.h"
 
 namespace maru::daemon {
 

@@ -6,8 +6,8 @@
 
 #include "daemon/arguments.h"
 #include "daemon/commands.h"
-#include "platform/json.h"
-#include "platform/log.h"
+#include "system/json.h"
+#include "system/log.h"
 
 namespace maru::daemon {
 namespace {

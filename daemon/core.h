@@ -10,8 +10,8 @@
 
 #include "daemon/usage.h"
 #include "index/reader.h"
-#include "platform/acl.h"
-#include "platform/share_table.h"
+#include "system/rights.h"
+#include "system/share_table.h"
 
 /// Everything a request needs, and nothing of sockets: a request goes in as a line of text, replies
 /// come out through a callback.

@@ -6,9 +6,9 @@
 #include "daemon/keyword.h"
 #include "daemon/range.h"
 #include "index/tokenizer.h"
-#include "platform/acl.h"
-#include "platform/share_table.h"
-#include "platform/text.h"
+#include "system/rights.h"
+#include "system/share_table.h"
+#include "system/text.h"
 
 namespace maru::daemon {
 namespace {

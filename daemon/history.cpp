@@ -4,8 +4,8 @@
 #include <mutex>
 
 #include "platform/history_journal.h"
-#include "platform/log.h"
 #include "platform/marudbquery.h"
+#include "system/log.h"
 
 namespace maru::daemon {
 

@@ -5,7 +5,7 @@
 #include <limits>
 #include <map>
 
-#include "platform/json.h"
+#include "system/json.h"
 
 namespace maru::daemon {
 namespace {

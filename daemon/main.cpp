@@ -15,8 +15,8 @@
 #include "daemon/listener.h"
 #include "daemon/privilege.h"
 #include "daemon/server.h"
-#include "platform/config.h"
-#include "platform/log.h"
+#include "system/config.h"
+#include "system/log.h"
 
 namespace {
 

@@ -8,8 +8,8 @@
 #include <string>
 
 #include "daemon/privilege.h"
-#include "platform/rights_cache.h"
-#include "platform/unique_fd.h"
+#include "system/rights_cache.h"
+#include "system/unique_fd.h"
 
 namespace maru::daemon {
 namespace {

@@ -2,7 +2,7 @@
 
 #include <sys/types.h>
 
-#include "platform/acl.h"
+#include "system/rights.h"
 
 namespace maru::daemon {
 

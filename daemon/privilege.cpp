@@ -3,8 +3,8 @@
 #include <cap-ng.h>
 #include <unistd.h>
 
-#include "platform/log.h"
-#include "platform/service_identity.h"
+#include "system/log.h"
+#include "system/service_identity.h"
 
 namespace maru::daemon {
 namespace {

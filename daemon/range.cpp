@@ -7,7 +7,7 @@
 #include <limits>
 #include <string>
 
-#include "platform/text.h"
+#include "system/text.h"
 
 namespace maru::daemon {
 namespace {

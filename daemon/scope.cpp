@@ -2,27 +2,23 @@
 
 #include <algorithm>
 
-#include "platform/account.h"
-#include "platform/share.h"
+#include "system/accounts.h"
+#include "system/index_id.h"
 
 namespace maru::daemon {
 namespace {
 
 constexpr std::size_t kMaxFilters = 256;
 constexpr std::size_t kMaxFilterData = 4096;
-constexpr const char* kIndexPrefix = "fileindex_";
-/// Homes are judged by their own rights alone.
-constexpr const char* kHomes = "homes";
 
 std::string NameOfUser(uid_t uid) {
-  MARUUSER* user = nullptr;
-  if (MARUUserGetByUID(uid, &user) != 0) return {};
-  const std::unique_ptr<MARUUSER, decltype(&MARUUserFree)> owner(user, MARUUserFree);
-  return user->szName;
+  const std::optional<Account> account = AccountByUID(uid);
+  return account ? account->name : std::string();
 }
 
 bool MayUse(const Eyes& eyes, const ShareSettings& share) {
-  if (eyes.identity.unrestricted || share.name == kHomes) return true;
+  // Homes are judged by their own rights alone.
+  if (eyes.identity.unrestricted || share.name == kHomesShare) return true;
   return PrivilegeOf(share, eyes.user_name, eyes.identity) != kSharePrivNone;
 }
 
@@ -87,7 +83,7 @@ std::optional<std::string> ShareOfIndex(const std::string& id) {
       });
   if (!sound) throw BadParameter("Malformed index id " + Quoted(id));
   if (!id.starts_with(kIndexPrefix)) return std::nullopt;
-  return id.substr(std::string(kIndexPrefix).size());
+  return id.substr(kIndexPrefix.size());
 }
 
 Scope ScopeOf(const Core& core, Eyes eyes, const std::vector<std::string>& ids) {

@@ -5,7 +5,7 @@
 #include "daemon/hit.h"
 #include "daemon/page_check.h"
 #include "daemon/question.h"
-#include "platform/json.h"
+#include "system/json.h"
 
 namespace maru::daemon {
 namespace {

@@ -11,8 +11,8 @@
 
 #include "common/error.h"
 #include "daemon/peer.h"
-#include "platform/json.h"
-#include "platform/log.h"
+#include "system/json.h"
+#include "system/log.h"
 
 namespace maru::daemon {
 namespace {

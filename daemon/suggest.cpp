@@ -4,6 +4,7 @@
 #include "daemon/commands.h"
 #include "daemon/suggesters.h"
 #include "index/tokenizer.h"
+#include "system/index_id.h"
 
 namespace maru::daemon {
 namespace {
@@ -28,7 +29,7 @@ std::vector<const Suggester*> ReadSuggesters(const Arguments& data) {
 std::vector<std::string> ReadIndices(const Arguments& data) {
   std::vector<std::string> ids = data.Strings("indice", kMaxIndices, kMaxIndexId);
   for (std::string& id : ids) {
-    if (!ShareOfIndex(id)) id = "fileindex_" + id;
+    if (!ShareOfIndex(id)) id = IndexIdOf(id);
   }
   return ids;
 }

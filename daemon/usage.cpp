@@ -6,8 +6,8 @@
 #include <set>
 
 #include "common/error.h"
-#include "platform/log.h"
 #include "platform/marudbquery.h"
+#include "system/log.h"
 
 namespace maru::daemon {
 namespace {

@@ -13,7 +13,7 @@
 
 #include "index/bits.h"
 #include "index/record.h"
-#include "platform/acl.h"
+#include "system/rights.h"
 
 /// The directory table of one index: folder -> (parent, name, rights), and the distinct rights that
 /// documents and folders have. A chmod, rename or move of a folder changes one row here and no

@@ -5,7 +5,7 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/acl.h"
+#include "system/rights.h"
 
 namespace maru::index {
 

@@ -9,8 +9,8 @@
 #include "index/matches.h"
 #include "index/reader_impl.h"
 #include "index/tokenizer.h"
-#include "platform/file_index.h"
-#include "platform/share_table.h"
+#include "system/index_id.h"
+#include "system/share_table.h"
 
 namespace maru::index {
 namespace {
@@ -155,15 +155,13 @@ Xapian::Query EngineReader::Gated(const Xapian::Query& query) {
 }
 
 Xapian::Query EngineReader::Under(const std::string& full_path) {
-  static const std::string prefix = maruseeker::fileindex::elastic::GetFileIndexID("");
   std::string_view wanted = full_path;
   while (wanted.ends_with('/')) wanted.remove_suffix(1);
   std::vector<FolderRule::Share> shares(indices_->Count());
   for (std::size_t i = 0; i < shares.size(); ++i) {
     const std::string& folder = indices_->Index(i).Folder();
-    std::string_view id = std::string_view(folder).substr(folder.rfind('/') + 1);
-    if (id.starts_with(prefix)) id.remove_prefix(prefix.size());
-    const std::string share = std::string(kVolume) + "/" + std::string(id);
+    const std::string_view id = std::string_view(folder).substr(folder.rfind('/') + 1);
+    const std::string share = std::string(kVolume) + "/" + std::string(ShareOfIndexId(id));
     shares[i].whole = share == wanted || share.starts_with(std::string(wanted) + "/");
     if (shares[i].whole || !wanted.starts_with(share + "/")) continue;
     const auto entry = Resolve(indices_->Database(i), wanted.substr(share.size()));

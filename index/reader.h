@@ -10,7 +10,7 @@
 
 #include "index/document.h"
 #include "index/query.h"
-#include "platform/acl.h"
+#include "system/rights.h"
 
 namespace maru::index {
 

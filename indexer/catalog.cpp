@@ -4,7 +4,7 @@
 #include <thread>
 #include <utility>
 
-#include "platform/log.h"
+#include "system/log.h"
 
 namespace maru::indexer {
 namespace {

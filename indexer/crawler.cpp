@@ -9,8 +9,8 @@
 #include <utility>
 
 #include "indexer/extract/extractor.h"
-#include "platform/acl.h"
-#include "platform/log.h"
+#include "system/log.h"
+#include "system/rights.h"
 
 namespace maru::indexer {
 namespace {

@@ -11,7 +11,7 @@
 #include <set>
 #include <utility>
 
-#include "platform/log.h"
+#include "system/log.h"
 
 namespace maru::indexer {
 namespace {

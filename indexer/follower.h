@@ -14,7 +14,7 @@
 #include "indexer/pipeline.h"
 #include "indexer/shares.h"
 #include "indexer/watcher.h"
-#include "platform/unique_fd.h"
+#include "system/unique_fd.h"
 
 namespace maru::indexer {
 

@@ -8,7 +8,7 @@
 #include <vector>
 
 #include "index/document.h"
-#include "platform/unique_fd.h"
+#include "system/unique_fd.h"
 
 /// What lies in a folder, seen through its descriptor: paths are never put together, so names may
 /// be any bytes, trees any depth, and nothing follows a symbolic link.

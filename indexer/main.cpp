@@ -18,8 +18,8 @@
 #include "indexer/once.h"
 #include "indexer/privileges.h"
 #include "indexer/service.h"
-#include "platform/config.h"
-#include "platform/log.h"
+#include "system/config.h"
+#include "system/log.h"
 
 namespace maru::indexer {
 namespace {

@@ -8,7 +8,7 @@
 #include <thread>
 
 #include "indexer/crawler.h"
-#include "platform/log.h"
+#include "system/log.h"
 
 namespace maru::indexer {
 namespace {

@@ -6,7 +6,7 @@
 
 #include "indexer/extract/charset.h"
 #include "indexer/extract/extractor.h"
-#include "platform/log.h"
+#include "system/log.h"
 
 namespace maru::indexer {
 namespace {

@@ -12,7 +12,7 @@
 #include "index/writer.h"
 #include "indexer/counts.h"
 #include "indexer/extract/processes.h"
-#include "platform/unique_fd.h"
+#include "system/unique_fd.h"
 
 /// Reading, extracting and preparing on all cores, beside the one thread that writes an index.
 namespace maru::indexer {

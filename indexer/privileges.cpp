@@ -6,30 +6,23 @@
 
 #include <cerrno>
 #include <cstring>
-#include <memory>
 #include <stdexcept>
 #include <string>
 
-#include "platform/account.h"
-#include "platform/config.h"
-#include "platform/service_identity.h"
+#include "system/accounts.h"
+#include "system/config.h"
+#include "system/service_identity.h"
 
 namespace maru::indexer {
 namespace {
 
-struct Account {
-  uid_t uid;
-  gid_t gid;
-};
-
 Account ServiceAccount() {
   const std::string& name = Config::Get().service_account;
-  MARUUSER* found = nullptr;
-  if (MARUUserGet(name.c_str(), &found) != 0) {
+  const std::optional<Account> account = AccountByName(name);
+  if (!account) {
     throw std::runtime_error("There is no account " + name + " (setting service_account)");
   }
-  const std::unique_ptr<MARUUSER, void (*)(MARUUSER*)> user(found, MARUUserFree);
-  return {user->nUid, user->nGid};
+  return *account;
 }
 
 /// Others may pass through, to ask whether a share has an index, but not look around.

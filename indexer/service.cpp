@@ -7,8 +7,8 @@
 #include <cerrno>
 
 #include "indexer/shares.h"
-#include "platform/log.h"
-#include "platform/share_table.h"
+#include "system/log.h"
+#include "system/share_table.h"
 
 namespace maru::indexer {
 namespace {

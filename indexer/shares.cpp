@@ -7,16 +7,14 @@
 #include <filesystem>
 #include <system_error>
 
-#include "platform/config.h"
-#include "platform/file_index.h"
-#include "platform/log.h"
+#include "system/config.h"
+#include "system/index_id.h"
+#include "system/log.h"
 
 namespace maru::indexer {
 namespace {
 
 namespace fs = std::filesystem;
-
-constexpr const char* kIndexPrefix = "fileindex_";
 
 }  // namespace
 
@@ -33,7 +31,7 @@ Targets FindTargets(const ShareTable& table) {
       targets.missing.push_back(share.name);
       continue;
     }
-    const std::string id = maruseeker::fileindex::elastic::GetFileIndexID(share.name);
+    const std::string id = IndexIdOf(share.name);
     targets.present.push_back(
         {share.name, share.path, IndexHome() + "/" + id, {status.st_dev, status.st_ino}});
   }
@@ -53,7 +51,7 @@ void RemoveForeignIndices(const ShareTable& table, const std::vector<std::string
   for (const fs::directory_entry& entry : fs::directory_iterator(IndexHome(), error)) {
     const std::string name = entry.path().filename();
     if (!name.starts_with(kIndexPrefix)) continue;
-    const ShareSettings* share = table.Find(name.substr(std::string(kIndexPrefix).size()));
+    const ShareSettings* share = table.Find(name.substr(kIndexPrefix.size()));
     const bool wanted = share && share->index;
     const bool in_use = std::find(used.begin(), used.end(), entry.path()) != used.end();
     const bool is_folder = entry.symlink_status(error).type() == fs::file_type::directory;

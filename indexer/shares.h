@@ -4,7 +4,7 @@
 #include <vector>
 
 #include "indexer/listing.h"
-#include "platform/share_table.h"
+#include "system/share_table.h"
 
 namespace maru::indexer {
 

@@ -6,7 +6,7 @@
 
 #include "index/document.h"
 #include "indexer/listing.h"
-#include "platform/unique_fd.h"
+#include "system/unique_fd.h"
 
 namespace maru::indexer {
 

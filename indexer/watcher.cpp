@@ -7,7 +7,7 @@
 #include <utility>
 
 #include "indexer/listing.h"
-#include "platform/log.h"
+#include "system/log.h"
 
 namespace maru::indexer {
 namespace {

@@ -7,7 +7,7 @@
 #include <vector>
 
 #include "index/document.h"
-#include "platform/unique_fd.h"
+#include "system/unique_fd.h"
 
 namespace maru::indexer {
 

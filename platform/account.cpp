@@ -8,19 +8,16 @@
 #include <new>
 #include <string_view>
 
-#include "platform/config.h"
 #include "platform/guard.h"
-#include "platform/name_service.h"
-#include "platform/share_table.h"
+#include "system/accounts.h"
+#include "system/config.h"
+#include "system/share_table.h"
 
 using maru::Account;
 using maru::Fail;
 using maru::Guarded;
 
 namespace {
-
-// The share that holds the home folders.
-constexpr const char* kHomes = "homes";
 
 int LookupError() {
   return errno == 0 ? kErrNotFound : kErrSystem;
@@ -67,7 +64,7 @@ void MARUUserFree(MARUUSER* user) {
 bool MARUServiceUserHomeIsEnabled(int, const char*) {
   return Guarded("MARUServiceUserHomeIsEnabled", false, [] {
     const auto table = maru::ShareTable::Current();
-    const maru::ShareSettings* homes = table->Find(kHomes);
+    const maru::ShareSettings* homes = table->Find(maru::kHomesShare);
     return homes && homes->available;
   });
 }
@@ -78,7 +75,7 @@ int MARUServiceHomePathGet(const char* user_name, char* path, std::size_t size) 
     const std::optional<Account> account = maru::AccountByName(user_name);
     if (!account) return Fail(LookupError(), -1);
     const auto table = maru::ShareTable::Current();
-    const maru::ShareSettings* homes = table->Find(kHomes);
+    const maru::ShareSettings* homes = table->Find(maru::kHomesShare);
     if (!homes || !homes->available) return Fail(kErrNotFound, -1);
     const std::string home = homes->VolumePath() + "/" + HomeFolder(*account, homes->path);
     if (home.size() >= size) return Fail(kErrBadParameter, -1);

@@ -11,12 +11,12 @@
 #include <string_view>
 
 #include "platform/account.h"
-#include "platform/config.h"
 #include "platform/guard.h"
-#include "platform/name_service.h"
-#include "platform/share_table.h"
-#include "platform/unique_fd.h"
-#include "platform/volume_path.h"
+#include "system/accounts.h"
+#include "system/config.h"
+#include "system/share_table.h"
+#include "system/unique_fd.h"
+#include "system/volume_path.h"
 
 namespace {
 

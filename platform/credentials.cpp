@@ -7,7 +7,7 @@
 
 #include "platform/account.h"
 #include "platform/guard.h"
-#include "platform/name_service.h"
+#include "system/accounts.h"
 
 namespace {
 

@@ -14,8 +14,8 @@
 #include <vector>
 
 #include "platform/guard.h"
-#include "platform/unique_fd.h"
-#include "platform/whole_file.h"
+#include "system/unique_fd.h"
+#include "system/whole_file.h"
 
 namespace {
 

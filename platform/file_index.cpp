@@ -3,14 +3,13 @@
 #include <string.h>
 #include <sys/stat.h>
 
-#include "platform/config.h"
 #include "platform/guard.h"
-#include "platform/share_table.h"
-#include "platform/volume_path.h"
+#include "system/config.h"
+#include "system/index_id.h"
+#include "system/share_table.h"
+#include "system/volume_path.h"
 
 namespace {
-
-constexpr const char* kPrefix = "fileindex_";
 
 int CopyOut(const std::string& text, char* buffer, std::size_t size) {
   if (!buffer || text.size() >= size) return maru::Fail(kErrBadParameter, -1);
@@ -19,7 +18,7 @@ int CopyOut(const std::string& text, char* buffer, std::size_t size) {
 }
 
 std::string IndexFolder(const std::string& share_name) {
-  return maru::Config::Get().state_dir + "/index/" + kPrefix + share_name;
+  return maru::Config::Get().state_dir + "/index/" + maru::IndexIdOf(share_name);
 }
 
 /// The name of the share whose own volume path this is; empty when it is none.
@@ -51,7 +50,7 @@ std::set<std::string> FolderMgr::GetIndexedShares() const {
 }
 
 std::string elastic::GetFileIndexID(const std::string& share_name) {
-  return kPrefix + share_name;
+  return maru::IndexIdOf(share_name);
 }
 
 int GetShareNamePathByFullPath(std::string& share_name, std::string& share_path,
@@ -75,7 +74,7 @@ int FILEIDXQueuePathCompose(const char* share_path, char* path, std::size_t size
   return maru::Guarded("FILEIDXQueuePathCompose", -1, [&] {
     const std::string name = NameOfShare(share_path);
     if (name.empty()) return maru::Fail(kErrBadParameter, -1);
-    return CopyOut(maru::Config::Get().state_dir + "/queue/" + kPrefix + name, path, size);
+    return CopyOut(maru::Config::Get().state_dir + "/queue/" + maru::IndexIdOf(name), path, size);
   });
 }
 
@@ -90,5 +89,5 @@ int FILEIDXDBPathCompose(const char* share_path, char* path, std::size_t size) {
 int FILEIDXGetIndexID(const char* share_name, char* id, std::size_t size) {
   if (!IsName(share_name)) return maru::Fail(kErrBadParameter, -1);
   return maru::Guarded("FILEIDXGetIndexID", -1,
-                       [&] { return CopyOut(kPrefix + std::string(share_name), id, size); });
+                       [&] { return CopyOut(maru::IndexIdOf(share_name), id, size); });
 }

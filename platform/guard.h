@@ -1,26 +1,12 @@
 #pragma once
 
-#include <errno.h>
-
 #include <exception>
 
-#include "platform/log.h"
 #include "platform/process.h"
+#include "system/keep_errno.h"
+#include "system/log.h"
 
 namespace maru {
-
-/// Leaves errno as it was: what a function tried on its way to success is nobody's failure, and the
-/// next log line would name it.
-class KeepErrno {
- public:
-  KeepErrno() = default;
-  ~KeepErrno() { errno = before_; }
-  KeepErrno(const KeepErrno&) = delete;
-  KeepErrno& operator=(const KeepErrno&) = delete;
-
- private:
-  const int before_ = errno;
-};
 
 /// The one wall of the functions that must not throw: the result of `body`, or `failure` when it
 /// throws, which is logged and set as the last error. For this room.

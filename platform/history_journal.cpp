@@ -9,10 +9,10 @@
 
 #include <string_view>
 
-#include "platform/config.h"
-#include "platform/json.h"
-#include "platform/log.h"
-#include "platform/unique_fd.h"
+#include "system/config.h"
+#include "system/json.h"
+#include "system/log.h"
+#include "system/unique_fd.h"
 
 namespace maruseeker::db {
 namespace {

@@ -5,9 +5,9 @@
 #include <set>
 #include <string_view>
 
-#include "platform/config.h"
 #include "platform/marudbquery_impl.h"
 #include "platform/process.h"
+#include "system/config.h"
 
 namespace marudbquery {
 namespace {

@@ -6,7 +6,7 @@
 #include <unistd.h>
 
 #include "platform/guard.h"
-#include "platform/log.h"
+#include "system/log.h"
 
 namespace {
 

@@ -8,7 +8,7 @@
 
 #include "platform/guard.h"
 #include "platform/share.h"
-#include "platform/unique_fd.h"
+#include "system/unique_fd.h"
 
 namespace {
 

@@ -12,8 +12,8 @@
 
 #include "platform/account.h"
 #include "platform/guard.h"
-#include "platform/share_table.h"
-#include "platform/volume_path.h"
+#include "system/share_table.h"
+#include "system/volume_path.h"
 
 using maru::Fail;
 using maru::Guarded;
@@ -75,6 +75,9 @@ void MARUShareFree(MARUSHARE* share) {
 
 int MARUShareUserPrivGet(const char* user_name, const MARUSHARE* share) {
   if (!user_name || !share) return Fail(kErrBadParameter, -1);
+  static_assert(int{kSharePrivReadWrite} == maru::kSharePrivReadWrite &&
+                int{kSharePrivReadOnly} == maru::kSharePrivReadOnly &&
+                int{kSharePrivNone} == maru::kSharePrivNone);
   return Guarded("MARUShareUserPrivGet", -1, [&] {
     maru::Identity identity;
     const auto table = ShareTable::Current();

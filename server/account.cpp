@@ -13,7 +13,7 @@
 #include <vector>
 
 #include "platform/account.h"
-#include "platform/log.h"
+#include "system/log.h"
 
 namespace maru::server {
 namespace {

@@ -1,7 +1,7 @@
 #include "server/answer.h"
 
 #include "common/error.h"
-#include "platform/json.h"
+#include "system/json.h"
 
 namespace maru::server {
 namespace {

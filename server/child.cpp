@@ -15,16 +15,16 @@
 
 #include "common/error.h"
 #include "platform/account.h"
-#include "platform/guard.h"
-#include "platform/json.h"
-#include "platform/log.h"
-#include "platform/name_service.h"
 #include "platform/process.h"
-#include "platform/share_table.h"
 #include "server/account.h"
 #include "server/answer.h"
 #include "server/frames.h"
 #include "server/names.h"
+#include "system/accounts.h"
+#include "system/json.h"
+#include "system/keep_errno.h"
+#include "system/log.h"
+#include "system/share_table.h"
 
 namespace maru::server {
 namespace {

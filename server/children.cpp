@@ -8,10 +8,10 @@
 #include <system_error>
 #include <utility>
 
-#include "platform/log.h"
 #include "server/answer.h"
 #include "server/child.h"
 #include "server/frames.h"
+#include "system/log.h"
 
 namespace maru::server {
 

@@ -13,8 +13,8 @@
 #include <memory>
 #include <system_error>
 
-#include "platform/log.h"
-#include "platform/service_identity.h"
+#include "system/log.h"
+#include "system/service_identity.h"
 
 namespace maru::server {
 namespace {

@@ -25,8 +25,6 @@
 #include <string>
 
 #include "common/error.h"
-#include "platform/config.h"
-#include "platform/json.h"
 #include "server/answer.h"
 #include "server/exchange.h"
 #include "server/http_head.h"
@@ -34,6 +32,8 @@
 #include "server/openapi.h"
 #include "server/pages.h"
 #include "server/routes.h"
+#include "system/config.h"
+#include "system/json.h"
 
 /// One client's connection: requests one after another, each answered before the next is read. For
 /// front.cpp only, since it is slow to compile.

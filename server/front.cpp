@@ -17,9 +17,9 @@
 #include <memory>
 #include <stdexcept>
 
-#include "platform/log.h"
-#include "platform/service_identity.h"
 #include "server/connection.h"
+#include "system/log.h"
+#include "system/service_identity.h"
 
 namespace maru::server {
 namespace {

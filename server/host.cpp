@@ -11,8 +11,6 @@
 
 #include <exception>
 
-#include "platform/log.h"
-#include "platform/share_table.h"
 #include "server/account.h"
 #include "server/answer.h"
 #include "server/children.h"
@@ -21,6 +19,8 @@
 #include "server/limits.h"
 #include "server/signals.h"
 #include "server/signin.h"
+#include "system/log.h"
+#include "system/share_table.h"
 
 namespace maru::server {
 namespace {

@@ -1,7 +1,7 @@
 #pragma once
 
-#include "platform/config.h"
 #include "server/descriptor.h"
+#include "system/config.h"
 
 namespace maru::server {
 

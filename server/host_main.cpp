@@ -5,9 +5,9 @@
 #include <exception>
 #include <string>
 
-#include "platform/config.h"
-#include "platform/log.h"
 #include "server/host.h"
+#include "system/config.h"
+#include "system/log.h"
 
 namespace {
 

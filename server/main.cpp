@@ -5,9 +5,9 @@
 #include <string>
 #include <vector>
 
-#include "platform/config.h"
-#include "platform/log.h"
 #include "server/supervisor.h"
+#include "system/config.h"
+#include "system/log.h"
 
 namespace {
 

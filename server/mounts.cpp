@@ -9,7 +9,7 @@
 #include <set>
 #include <system_error>
 
-#include "platform/log.h"
+#include "system/log.h"
 
 namespace maru::server {
 namespace {

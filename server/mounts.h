@@ -3,7 +3,7 @@
 #include <map>
 #include <string>
 
-#include "platform/share_table.h"
+#include "system/share_table.h"
 
 namespace maru::server {
 

@@ -6,7 +6,7 @@
 #include <cstdio>
 #include <optional>
 
-#include "platform/utf8.h"
+#include "system/utf8.h"
 
 namespace maru::server {
 namespace {

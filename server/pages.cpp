@@ -8,7 +8,7 @@
 #include <string_view>
 #include <utility>
 
-#include "platform/log.h"
+#include "system/log.h"
 
 namespace maru::server {
 namespace {

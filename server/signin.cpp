@@ -6,9 +6,9 @@
 
 #include <limits>
 
-#include "platform/log.h"
 #include "server/child.h"
 #include "server/frames.h"
+#include "system/log.h"
 
 namespace maru::server {
 namespace {

@@ -19,13 +19,13 @@
 #include <system_error>
 #include <vector>
 
-#include "platform/log.h"
-#include "platform/share_table.h"
 #include "server/frames.h"
 #include "server/front.h"
 #include "server/listener.h"
 #include "server/mounts.h"
 #include "server/signals.h"
+#include "system/log.h"
+#include "system/share_table.h"
 
 namespace maru::server {
 namespace {

@@ -3,7 +3,7 @@
 #include <string>
 #include <vector>
 
-#include "platform/config.h"
+#include "system/config.h"
 
 namespace maru::server {
 

@@ -11,7 +11,7 @@
 #include "indexer/extract/charset.h"
 #include "indexer/extract/wire.h"
 #include "indexer/extract/worker.h"
-#include "platform/log.h"
+#include "system/log.h"
 
 namespace maru::extract {
 namespace {

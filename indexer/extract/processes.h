@@ -8,7 +8,7 @@
 #include <vector>
 
 #include "indexer/extract/extractor.h"
-#include "platform/unique_fd.h"
+#include "system/unique_fd.h"
 
 namespace maru::extract {
 

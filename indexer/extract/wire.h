@@ -5,7 +5,7 @@
 #include <cstdint>
 #include <string>
 
-#include "platform/unique_fd.h"
+#include "system/unique_fd.h"
 
 /// What goes over the socket pairs of the extractor processes. Both ends are of one build.
 namespace maru::extract {

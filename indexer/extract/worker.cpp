@@ -12,7 +12,7 @@
 #include "indexer/extract/charset.h"
 #include "indexer/extract/sandbox.h"
 #include "indexer/extract/wire.h"
-#include "platform/log.h"
+#include "system/log.h"
 
 namespace maru::extract {
 namespace {

@@ -16,7 +16,7 @@
 
 #include "daemon/core.h"
 #include "index/writer.h"
-#include "platform/json.h"
+#include "system/json.h"
 
 namespace maru::daemon::test {
 

@@ -7,7 +7,7 @@
 #include "daemon/question.h"
 #include "daemon/range.h"
 #include "index/fields.h"
-#include "platform/json.h"
+#include "system/json.h"
 
 namespace maru::daemon {
 namespace {

@@ -9,7 +9,7 @@
 #include <thread>
 
 #include "daemon/listener.h"
-#include "platform/unique_fd.h"
+#include "system/unique_fd.h"
 #include "tests/daemon/fixture.h"
 
 namespace maru::daemon::test {

@@ -4,7 +4,7 @@
 
 #include "indexer/extract/charset.h"
 #include "indexer/extract/extractor.h"
-#include "platform/unique_fd.h"
+#include "system/unique_fd.h"
 
 namespace maru::extract {
 namespace {

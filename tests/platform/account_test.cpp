@@ -12,8 +12,8 @@
 #include <algorithm>
 #include <array>
 
-#include "platform/log.h"
 #include "platform/process.h"
+#include "system/log.h"
 #include "tests/platform/support.h"
 
 namespace {

@@ -1,4 +1,4 @@
-#include "platform/daemon_connection.h"
+#include "system/daemon_connection.h"
 
 #include <errno.h>
 #include <gtest/gtest.h>

@@ -1,4 +1,4 @@
-#include "platform/json.h"
+#include "system/json.h"
 
 #include <errno.h>
 #include <gmock/gmock.h>

@@ -9,8 +9,8 @@
 
 #include "platform/account.h"
 #include "platform/acl.h"
-#include "platform/rights_cache.h"
-#include "platform/share_table.h"
+#include "system/rights_cache.h"
+#include "system/share_table.h"
 #include "tests/platform/support.h"
 
 namespace {

@@ -2,10 +2,10 @@
 #include <gtest/gtest.h>
 
 #include "platform/account.h"
-#include "platform/config.h"
-#include "platform/json.h"
-#include "platform/preference.h"
 #include "platform/webapi.h"
+#include "system/config.h"
+#include "system/json.h"
+#include "system/preference.h"
 #include "tests/platform/support.h"
 
 namespace {

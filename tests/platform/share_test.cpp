@@ -7,7 +7,7 @@
 #include "platform/account.h"
 #include "platform/file_index.h"
 #include "platform/process.h"
-#include "platform/share_table.h"
+#include "system/share_table.h"
 #include "tests/platform/support.h"
 
 namespace {

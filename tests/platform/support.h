@@ -14,7 +14,7 @@
 #include <iostream>
 #include <string>
 
-#include "platform/config.h"
+#include "system/config.h"
 
 /// A folder of its own for one test, which every user may enter.
 class TempFolder {

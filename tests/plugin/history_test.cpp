@@ -9,11 +9,11 @@
 #include "common/common.h"
 #include "common/db/search_history.h"
 #include "common/sdk/credentials.h"
-#include "platform/preference.h"
-#include "platform/unique_fd.h"
-#include "platform/whole_file.h"
 #include "plugin/plugin.h"
 #include "support/fake_daemon.h"
+#include "system/preference.h"
+#include "system/unique_fd.h"
+#include "system/whole_file.h"
 
 namespace {
 

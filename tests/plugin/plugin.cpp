@@ -15,9 +15,9 @@
 #include <filesystem>
 #include <fstream>
 
-#include "platform/config.h"
-#include "platform/json.h"
-#include "platform/log.h"
+#include "system/config.h"
+#include "system/json.h"
+#include "system/log.h"
 
 namespace {
 

@@ -8,10 +8,10 @@
 #include <filesystem>
 #include <fstream>
 
-#include "platform/json.h"
-#include "platform/preference.h"
 #include "plugin/plugin.h"
 #include "support/fake_daemon.h"
+#include "system/json.h"
+#include "system/preference.h"
 
 namespace {
 

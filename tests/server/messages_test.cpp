@@ -5,10 +5,10 @@
 #include <gtest/gtest.h>
 #include <sys/socket.h>
 
-#include "platform/json.h"
 #include "server/answer.h"
 #include "server/frames.h"
 #include "server/messages.h"
+#include "system/json.h"
 
 namespace maru::server {
 namespace {

@@ -3,9 +3,9 @@
 #include <dlfcn.h>
 #include <gtest/gtest.h>
 
-#include "platform/json.h"
 #include "server/openapi.h"
 #include "server/plugin.h"
+#include "system/json.h"
 
 namespace maru::server {
 namespace {

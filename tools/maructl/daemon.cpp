@@ -4,8 +4,8 @@
 #include <cstring>
 #include <stdexcept>
 
-#include "platform/config.h"
-#include "platform/json.h"
+#include "system/config.h"
+#include "system/json.h"
 
 namespace maru::control {
 

@@ -4,7 +4,7 @@
 
 #include <string>
 
-#include "platform/daemon_connection.h"
+#include "system/daemon_connection.h"
 
 namespace maru::control {
 

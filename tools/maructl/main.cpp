@@ -5,8 +5,8 @@
 #include <functional>
 #include <string>
 
-#include "platform/config.h"
-#include "platform/log.h"
+#include "system/config.h"
+#include "system/log.h"
 #include "tools/maructl/commands.h"
 
 namespace {

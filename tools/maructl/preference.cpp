@@ -1,4 +1,4 @@
-#include "platform/preference.h"
+#include "system/preference.h"
 
 #include <cerrno>
 #include <charconv>

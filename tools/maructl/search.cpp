@@ -2,7 +2,7 @@
 
 #include <cstdio>
 
-#include "platform/json.h"
+#include "system/json.h"
 #include "tools/maructl/commands.h"
 #include "tools/maructl/daemon.h"
 #include "tools/maructl/print.h"

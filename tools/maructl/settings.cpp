@@ -2,9 +2,9 @@
 
 #include <cstdio>
 
-#include "platform/config.h"
 #include "platform/file_index.h"
-#include "platform/share_table.h"
+#include "system/config.h"
+#include "system/share_table.h"
 #include "tools/maructl/commands.h"
 #include "tools/maructl/print.h"
 

@@ -9,9 +9,9 @@
 #include <stdexcept>
 #include <string>
 
-#include "platform/config.h"
-#include "platform/json.h"
-#include "platform/unique_fd.h"
+#include "system/config.h"
+#include "system/json.h"
+#include "system/unique_fd.h"
 #include "tools/maructl/commands.h"
 #include "tools/maructl/daemon.h"
 #include "tools/maructl/print.h"

@@ -5,7 +5,7 @@
 #include <mutex>
 #include <unordered_map>
 
-#include "platform/acl.h"
+#include "system/rights.h"
 
 namespace maru {
 

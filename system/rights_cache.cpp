@@ -1,4 +1,4 @@
-#include "platform/rights_cache.h"
+#include "system/rights_cache.h"
 
 #include <fcntl.h>
 #include <time.h>

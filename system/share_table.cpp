@@ -1,4 +1,4 @@
-#include "platform/share_table.h"
+#include "system/share_table.h"
 
 #include <algorithm>
 #include <functional>
@@ -6,13 +6,11 @@
 #include <stdexcept>
 #include <string_view>
 
-#include "platform/share.h"
-#include "platform/text.h"
+#include "system/text.h"
 
 namespace maru {
 namespace {
 
-constexpr std::string_view kHomes = "homes";
 constexpr std::string_view kHomesByDefault = "/home";
 // "fileindex_" and the name make one file name.
 constexpr std::size_t kMaxName = 240;
@@ -108,8 +106,8 @@ bool Settle(Section& section) {
       SameWord(share.name, "print$")) {
     return false;
   }
-  if (SameWord(share.name, kHomes)) {
-    share.name = kHomes;
+  if (SameWord(share.name, kHomesShare)) {
+    share.name = kHomesShare;
     share.path = HomesFolder(share.path);
   }
   Replace(share.path, "%S", share.name);

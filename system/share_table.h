@@ -4,7 +4,7 @@
 #include <string>
 #include <vector>
 
-#include "platform/acl.h"
+#include "system/rights.h"
 
 namespace maru {
 
@@ -55,10 +55,17 @@ class ShareTable {
   friend class ShareTableSource;
 };
 
-/// MARUSHAREPRIV of the user on the share by the share's lists (platform/share.h says the rules).
-/// Administrators are not treated specially here, nor are Samba's `admin users`, whose file
-/// operations are root's but who enter no share and write to none without the lists.
+/// What a user may do with a share as a whole.
+enum SharePrivilege { kSharePrivReadWrite = 1, kSharePrivReadOnly = 2, kSharePrivNone = 4 };
+
+/// SharePrivilege of the user on the share by `available`, `invalid users`, `valid users`, `read
+/// list`, `write list` and `read only`, with @, + and & groups and %S. Administrators are not
+/// treated specially here, nor are Samba's `admin users`, whose file operations are root's but who
+/// enter no share and write to none without the lists.
 int PrivilegeOf(const ShareSettings& share, const std::string& user_name, const Identity& identity);
+
+/// The share that holds the users' home folders.
+inline constexpr const char* kHomesShare = "homes";
 
 /// The volume under which all shares appear to users: "/volume1".
 inline constexpr const char* kVolume = "/volume1";

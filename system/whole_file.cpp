@@ -1,4 +1,4 @@
-#include "platform/whole_file.h"
+#include "system/whole_file.h"
 
 #include <errno.h>
 #include <fcntl.h>

@@ -7,12 +7,13 @@
 #include <mutex>
 #include <stdexcept>
 
-#include "platform/config.h"
-#include "platform/guard.h"
-#include "platform/name_service.h"
-#include "platform/samba.h"
-#include "platform/share_table.h"
-#include "platform/whole_file.h"
+#include "system/accounts.h"
+#include "system/config.h"
+#include "system/keep_errno.h"
+#include "system/log.h"
+#include "system/samba.h"
+#include "system/share_table.h"
+#include "system/whole_file.h"
 
 namespace maru {
 namespace {

@@ -1,4 +1,4 @@
-#include "platform/log.h"
+#include "system/log.h"
 
 #include <errno.h>
 #include <stdarg.h>

@@ -1,4 +1,4 @@
-#include "platform/config.h"
+#include "system/config.h"
 
 #include <errno.h>
 #include <string.h>
@@ -8,9 +8,9 @@
 #include <stdexcept>
 #include <string_view>
 
-#include "platform/guard.h"
-#include "platform/text.h"
-#include "platform/whole_file.h"
+#include "system/keep_errno.h"
+#include "system/text.h"
+#include "system/whole_file.h"
 
 namespace maru {
 namespace {

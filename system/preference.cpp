@@ -1,4 +1,4 @@
-#include "platform/preference.h"
+#include "system/preference.h"
 
 #include <errno.h>
 #include <sys/stat.h>
@@ -6,10 +6,10 @@
 #include <stdexcept>
 #include <string_view>
 
-#include "platform/config.h"
-#include "platform/guard.h"
-#include "platform/json.h"
-#include "platform/whole_file.h"
+#include "system/config.h"
+#include "system/json.h"
+#include "system/keep_errno.h"
+#include "system/whole_file.h"
 
 namespace maruseeker::pref {
 namespace {

@@ -1,4 +1,4 @@
-#include "platform/json.h"
+#include "system/json.h"
 
 #include <errno.h>
 #include <json/reader.h>
@@ -8,7 +8,7 @@
 #include <sstream>
 #include <string_view>
 
-#include "platform/whole_file.h"
+#include "system/whole_file.h"
 
 namespace maru::json {
 namespace {

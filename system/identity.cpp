@@ -1,8 +1,8 @@
 #include <algorithm>
 
-#include "platform/acl.h"
-#include "platform/config.h"
-#include "platform/name_service.h"
+#include "system/accounts.h"
+#include "system/config.h"
+#include "system/rights.h"
 
 namespace maru {
 namespace {

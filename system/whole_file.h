@@ -5,7 +5,7 @@
 #include <string>
 #include <string_view>
 
-#include "platform/unique_fd.h"
+#include "system/unique_fd.h"
 
 /// Small files, read and written whole. For this room.
 namespace maru {

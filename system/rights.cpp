@@ -10,8 +10,8 @@
 #include <array>
 #include <optional>
 
-#include "platform/acl.h"
-#include "platform/unique_fd.h"
+#include "system/rights.h"
+#include "system/unique_fd.h"
 
 namespace maru {
 namespace {

@@ -1,6 +1,6 @@
-#include "platform/volume_path.h"
+#include "system/volume_path.h"
 
-#include "platform/share_table.h"
+#include "system/share_table.h"
 
 namespace maru {
 

@@ -1,4 +1,4 @@
-#include "platform/name_service.h"
+#include "system/accounts.h"
 
 #include <errno.h>
 #include <grp.h>

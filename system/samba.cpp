@@ -1,4 +1,4 @@
-#include "platform/samba.h"
+#include "system/samba.h"
 
 #include <errno.h>
 #include <fcntl.h>
@@ -12,7 +12,7 @@
 #include <chrono>
 #include <stdexcept>
 
-#include "platform/unique_fd.h"
+#include "system/unique_fd.h"
 
 namespace maru {
 namespace {

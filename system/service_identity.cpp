@@ -1,4 +1,4 @@
-#include "platform/service_identity.h"
+#include "system/service_identity.h"
 
 #include <cap-ng.h>
 #include <errno.h>
@@ -8,18 +8,15 @@
 #include <stdexcept>
 #include <system_error>
 
-#include "platform/account.h"
+#include "system/accounts.h"
 
 namespace maru {
 
 void BecomeForGood(const std::string& account, Kept kept) {
-  MARUUSER* user = nullptr;
-  if (MARUUserGet(account.c_str(), &user) != 0) {
-    throw std::runtime_error("There is no account " + account);
-  }
-  const uid_t uid = user->nUid;
-  const gid_t gid = user->nGid;
-  MARUUserFree(user);
+  const std::optional<Account> found = AccountByName(account);
+  if (!found) throw std::runtime_error("There is no account " + account);
+  const uid_t uid = found->uid;
+  const gid_t gid = found->gid;
   if (uid == 0) throw std::runtime_error("The account " + account + " is root's");
 
   capng_get_caps_process();

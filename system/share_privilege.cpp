@@ -4,10 +4,9 @@
 #include <mutex>
 #include <string_view>
 
-#include "platform/name_service.h"
-#include "platform/share.h"
-#include "platform/share_table.h"
-#include "platform/text.h"
+#include "system/accounts.h"
+#include "system/share_table.h"
+#include "system/text.h"
 
 namespace maru {
 namespace {
@@ -39,7 +38,7 @@ bool Expand(std::string& name, const ShareSettings& share, const std::string& us
     }
     const char variable = i + 1 < name.size() ? name[++i] : '\0';
     if (variable == 'S') {
-      expanded += share.name == "homes" ? user : share.name;
+      expanded += share.name == kHomesShare ? user : share.name;
     } else if (variable == 'U' || variable == 'u') {
       expanded += user;
     } else {

@@ -1,4 +1,4 @@
-#include "platform/daemon_connection.h"
+#include "system/daemon_connection.h"
 
 #include <errno.h>
 #include <fcntl.h>
@@ -12,7 +12,7 @@
 #include <chrono>
 #include <utility>
 
-#include "platform/unique_fd.h"
+#include "system/unique_fd.h"
 
 namespace marudaemon {
 namespace {

@@ -1,0 +1,49 @@
+#pragma once
+
+#include <cstdint>
+#include <cstring>
+#include <string_view>
+
+/// Characters in UTF-8.
+namespace maru {
+
+/// The length of the UTF-8 character at `at`, which is not ASCII (RFC 3629: no surrogates, nothing
+/// overlong), or 0.
+inline std::size_t UTF8Length(std::string_view text, std::size_t at) {
+  const auto byte = [&](std::size_t i) -> std::uint8_t {
+    return at + i < text.size() ? static_cast<std::uint8_t>(text[at + i]) : 0;
+  };
+  const auto follows = [&](std::size_t i) { return (byte(i) & 0xc0) == 0x80; };
+  const std::uint8_t first = byte(0), second = byte(1);
+  if (first < 0xc2 || first > 0xf4 || !follows(1)) return 0;
+  if (first < 0xe0) return 2;
+  if (first < 0xf0) {
+    if ((first == 0xe0 && second < 0xa0) || (first == 0xed && second >= 0xa0)) return 0;
+    return follows(2) ? 3 : 0;
+  }
+  if ((first == 0xf0 && second < 0x90) || (first == 0xf4 && second >= 0x90)) return 0;
+  return follows(2) && follows(3) ? 4 : 0;
+}
+
+/// The place of the next byte that is not ASCII, or the end; eight bytes at a time.
+inline std::size_t NextNonASCII(std::string_view text, std::size_t at) {
+  constexpr std::uint64_t kHighBits = 0x8080808080808080;
+  std::uint64_t eight;
+  for (; at + sizeof(eight) <= text.size(); at += sizeof(eight)) {
+    std::memcpy(&eight, text.data() + at, sizeof(eight));
+    if (eight & kHighBits) break;
+  }
+  while (at < text.size() && static_cast<std::uint8_t>(text[at]) < 0x80) ++at;
+  return at;
+}
+
+inline bool IsUTF8(std::string_view text) {
+  for (std::size_t at = 0; (at = NextNonASCII(text, at)) < text.size();) {
+    const std::size_t length = UTF8Length(text, at);
+    if (length == 0) return false;
+    at += length;
+  }
+  return true;
+}
+
+}  // namespace maru
