@@ -5,7 +5,7 @@
 #include <filesystem>
 #include <string>
 
-#include "daemon/keyword.h"
+#include "daemon/language/keyword.h"
 #include "index/fields.h"
 #include "index/fragments.h"
 #include "index/reader.h"

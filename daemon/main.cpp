@@ -10,11 +10,11 @@
 #include <stdexcept>
 #include <string>
 
-#include "daemon/core.h"
+#include "daemon/core/core.h"
+#include "daemon/core/privilege.h"
 #include "daemon/history.h"
-#include "daemon/listener.h"
-#include "daemon/privilege.h"
-#include "daemon/server.h"
+#include "daemon/socket/listener.h"
+#include "daemon/socket/server.h"
 #include "system/config.h"
 #include "system/log.h"
 

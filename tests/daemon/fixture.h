@@ -14,7 +14,7 @@
 #include <string>
 #include <vector>
 
-#include "daemon/core.h"
+#include "daemon/core/core.h"
 #include "index/writer.h"
 #include "system/json.h"
 

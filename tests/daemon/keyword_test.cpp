@@ -1,11 +1,11 @@
-#include "daemon/keyword.h"
+#include "daemon/language/keyword.h"
 
 #include <gtest/gtest.h>
 
-#include "daemon/arguments.h"
-#include "daemon/criteria.h"
-#include "daemon/question.h"
-#include "daemon/range.h"
+#include "daemon/core/arguments.h"
+#include "daemon/language/criteria.h"
+#include "daemon/language/question.h"
+#include "daemon/language/range.h"
 #include "index/fields.h"
 #include "system/json.h"
 

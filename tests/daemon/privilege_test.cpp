@@ -1,10 +1,10 @@
-#include "daemon/privilege.h"
+#include "daemon/core/privilege.h"
 
 #include <sys/wait.h>
 
 #include <thread>
 
-#include "daemon/page_check.h"
+#include "daemon/core/page_check.h"
 #include "tests/daemon/fixture.h"
 
 namespace maru::daemon::test {

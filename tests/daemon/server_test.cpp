@@ -1,4 +1,4 @@
-#include "daemon/server.h"
+#include "daemon/socket/server.h"
 
 #include <poll.h>
 #include <sys/socket.h>
@@ -8,7 +8,7 @@
 #include <condition_variable>
 #include <thread>
 
-#include "daemon/listener.h"
+#include "daemon/socket/listener.h"
 #include "system/unique_fd.h"
 #include "tests/daemon/fixture.h"
 

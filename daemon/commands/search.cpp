@@ -1,0 +1,189 @@
+#include <algorithm>
+
+#include "daemon/commands/commands.h"
+#include "daemon/commands/hit.h"
+#include "daemon/core/arguments.h"
+#include "daemon/core/page_check.h"
+#include "daemon/language/criteria.h"
+#include "daemon/language/filters.h"
+#include "daemon/language/question.h"
+#include "system/json.h"
+
+namespace maru::daemon {
+namespace {
+
+constexpr std::int64_t kMaxFrom = 1'000'000'000;
+constexpr std::int64_t kMaxSize = 10'000;
+constexpr std::int64_t kDefaultSize = 20;
+constexpr std::size_t kMaxHighlights = 8;
+/// Characters of fragments that one page may ask for.
+constexpr std::uint64_t kMaxFragmentCharacters = 16u << 20;
+/// Times a page is filled up behind hits that fell out of it.
+constexpr int kMaxRounds = 4;
+constexpr std::size_t kMaxCollectorText = 256;
+
+/// A search as asked for.
+struct Wish {
+  index::Query query;
+  std::vector<const index::Field*> fields;
+  std::vector<index::FragmentOptions> highlights;
+  index::SearchOptions options;
+  Scope scope;
+};
+
+std::vector<index::FragmentOptions> ReadHighlights(const Arguments& data) {
+  std::vector<index::FragmentOptions> highlights;
+  const auto read = [&](const Json::Value& item) {
+    highlights.push_back(ReadFragmentOptions(
+        Arguments(item, data.NameOf("highlight"), {"field", "frag_length", "num_fragments"})));
+  };
+  if (data.Any("highlight").isObject()) {
+    read(data.Any("highlight"));
+  } else {
+    for (const Json::Value& item : data.Array("highlight", kMaxHighlights)) read(item);
+  }
+  return highlights;
+}
+
+void ReadSort(const Arguments& data, index::SearchOptions& options) {
+  if (!data.Has("sort")) return;
+  const Arguments sort(data.Object("sort"), data.NameOf("sort"), {"field", "direction"});
+  options.sort_field = sort.String("field", 64);
+  const index::Field* field = index::FindField(options.sort_field);
+  if (!field || field->slot < 0) {
+    sort.Refuse("field", "is not a number or time field: " + Quoted(options.sort_field));
+  }
+  const std::string direction = sort.String("direction", 8, "DESC");
+  if (direction != "ASC" && direction != "DESC") sort.Refuse("direction", "is not ASC or DESC");
+  options.ascending = direction == "ASC";
+}
+
+/// Who asked with what, told for statistics: checked, and nothing is decided by it.
+void CheckCollector(const Arguments& data) {
+  const Arguments collector(data.Any("collector"), data.NameOf("collector"),
+                            {"agent", "uid", "has_criteria"});
+  collector.String("agent", kMaxCollectorText);
+  collector.Integer("uid", 0, UINT32_MAX, 0);
+  if (collector.Has("has_criteria") && !collector.Any("has_criteria").isBool()) {
+    collector.Refuse("has_criteria", "is not true or false");
+  }
+}
+
+void CheckPage(const Wish& wish) {
+  std::uint64_t characters = 0;
+  for (const index::FragmentOptions& highlight : wish.highlights) {
+    characters += std::uint64_t{wish.options.size} * highlight.length * highlight.count;
+  }
+  if (characters > kMaxFragmentCharacters) {
+    throw BadParameter("Too many fragments: ask for a smaller page, fewer or shorter fragments");
+  }
+}
+
+Wish ReadWish(const Request& request) {
+  const Arguments data(request.data, "data",
+                       {"pre_query", "indice", "from", "size", "default_search_op", "load_field",
+                        "lazy_field", "collector", "highlight", "fields", "filters", "sort"});
+  const Arguments pre_query(data.Object("pre_query"), "data.pre_query",
+                            {"keyword", "criteria_list", "file_type", "search_weight_list"});
+  Wish wish;
+  Question question = ReadQuestion(pre_query);
+  const Filters filters = ReadFilters(data);
+  for (const std::string& type : filters.types) {
+    if (auto kinds = ParseKinds(type)) question.filters.push_back(std::move(*kinds));
+  }
+  wish.query = ToQuery(question, ReadAnyWord(data));
+  wish.fields = ReadFields(data);
+  for (const std::string& name : data.Strings("lazy_field", 64, 64)) {
+    if (!index::FindField(name))
+      data.Refuse("lazy_field", "names an unknown field, " + Quoted(name));
+  }
+  wish.highlights = ReadHighlights(data);
+  wish.options.from = static_cast<std::uint32_t>(data.Integer("from", 0, kMaxFrom, 0));
+  wish.options.size = static_cast<std::uint32_t>(data.Integer("size", 0, kMaxSize, kDefaultSize));
+  wish.options.cancelled = request.cancelled;
+  ReadSort(data, wish.options);
+  CheckCollector(data);
+  CheckPage(wish);
+  Eyes eyes = EyesOf(request.caller, filters.users);
+  wish.scope = data.Has("indice") ? ScopeOf(request.core, std::move(eyes),
+                                            data.Strings("indice", kMaxIndices, kMaxIndexId))
+                                  : WholeScope(request.core, std::move(eyes));
+  return wish;
+}
+
+/// What the caller opened lately ranks higher.
+void AddBoosts(const Request& request, const Scope& scope, index::Reader& reader,
+               index::SearchOptions& options) {
+  const std::vector<std::string> ids = scope.Ids();
+  for (const OpenedFile& file : request.core.usage.Strongest(request.caller.uid, ids)) {
+    const auto share =
+        static_cast<std::size_t>(std::find(ids.begin(), ids.end(), file.index_id) - ids.begin());
+    const auto hit = reader.Find(share, file.document);
+    if (hit && IsSameFile(file.path, hit->path)) {
+      options.boosts[{share, file.document}] = file.boost;
+    }
+  }
+}
+
+/// The page's hits, checked against the file system and filled up behind those that fell out. The
+/// total is lowered by them. (What fell out of earlier pages is not known here; until the index has
+/// caught up, a hit may stand on two pages.)
+index::SearchResult CheckedPage(Wish& wish, index::Reader& reader) {
+  index::SearchResult page;
+  index::SearchOptions options = wish.options;
+  std::uint64_t gone = 0;
+  for (int round = 0; round < kMaxRounds; ++round) {
+    index::SearchResult found = reader.Search(wish.query, options);
+    page.total = found.total;
+    const std::vector<bool> readable = StillReadable(wish.scope, found.hits);
+    for (std::size_t i = 0; i < found.hits.size(); ++i) {
+      if (!readable[i]) ++gone;
+      if (readable[i] && page.hits.size() < wish.options.size) {
+        page.hits.push_back(std::move(found.hits[i]));
+      }
+    }
+    const bool more = found.hits.size() == options.size;
+    if (!more || page.hits.size() == wish.options.size) break;
+    options.from += options.size;
+  }
+  page.total -= std::min(page.total, gone);
+  return page;
+}
+
+}  // namespace
+
+Json::Value SearchCommand(const Request& request) {
+  Wish wish = ReadWish(request);
+  index::SearchResult page;
+  std::unique_ptr<index::Reader> reader;
+  if (!wish.scope.places.empty()) {
+    reader = OpenReader(request.core, wish.scope);
+    if (wish.options.sort_field.empty()) {
+      AddBoosts(request, wish.scope, *reader, wish.options);
+    }
+    page = CheckedPage(wish, *reader);
+  }
+  json::ObjectWriter total;
+  total.AddNumber("total", static_cast<std::int64_t>(page.total));
+  request.output(total.Take(), false);
+  for (const index::Hit& hit : page.hits) {
+    Json::Value highlight;
+    if (!wish.highlights.empty()) {
+      if (request.cancelled()) throw index::Cancelled();
+      highlight = FragmentsOf(*reader, hit, wish.query, wish.highlights);
+    }
+    request.output(HitMessage(wish.scope.places[hit.share], hit, wish.fields, highlight), false);
+  }
+  return {};
+}
+
+Json::Value ExplainCommand(const Request& request) {
+  const Wish wish = ReadWish(request);
+  Json::Value data;
+  data["query"] = Explain(wish.query);
+  data["indice"] = Json::arrayValue;
+  for (const Place& place : wish.scope.places) data["indice"].append(place.id);
+  return data;
+}
+
+}  // namespace maru::daemon

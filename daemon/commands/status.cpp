@@ -1,0 +1,44 @@
+#include "daemon/commands/commands.h"
+#include "daemon/core/arguments.h"
+#include "daemon/core/scope.h"
+
+namespace maru::daemon {
+namespace {
+
+/// An index that cannot be read is told of by its reason instead of a count.
+Json::Value IndexStatus(const Core& core, const std::string& id) {
+  Json::Value status;
+  status["id"] = id;
+  status["share"] = Json::nullValue;
+  if (const auto share = ShareOfIndex(id); share && core.shares()->Find(*share)) {
+    status["share"] = *share;
+  }
+  try {
+    status["documents"] = Json::UInt64{core.indices.Open({id})->Documents()};
+  } catch (const maruseeker::Error& error) {
+    status["error"] = error.Reason();
+  }
+  return status;
+}
+
+}  // namespace
+
+Json::Value StatusCommand(const Request& request) {
+  const Arguments data(request.data, "data", {});
+  const auto uptime = std::chrono::steady_clock::now() - request.core.started;
+  Json::Value status;
+  status["version"] = MARUSEEKER_VERSION;
+  status["uptime"] = Json::Int64{std::chrono::duration_cast<std::chrono::seconds>(uptime).count()};
+  if (!request.caller.unrestricted) return status;
+  status["indices"] = Json::arrayValue;
+  for (const std::string& id : request.core.indices.Ids()) {
+    status["indices"].append(IndexStatus(request.core, id));
+  }
+  status["shares"] = Json::UInt64{request.core.shares()->Shares().size()};
+  status["share_settings_error"] = request.core.shares()->Error();
+  status["opened_files"] = Json::UInt64{request.core.usage.Size()};
+  if (request.core.server_status) request.core.server_status(status);
+  return status;
+}
+
+}  // namespace maru::daemon

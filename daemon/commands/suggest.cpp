@@ -1,0 +1,115 @@
+#include <algorithm>
+#include <set>
+
+#include "daemon/commands/commands.h"
+#include "daemon/commands/suggesters.h"
+#include "daemon/core/arguments.h"
+#include "index/tokenizer.h"
+#include "system/index_id.h"
+
+namespace maru::daemon {
+namespace {
+
+constexpr std::size_t kMaxTermsBytes = 4096;
+constexpr std::int64_t kDefaultSuggestions = 10;
+constexpr std::int64_t kMaxSuggestions = 100;
+
+std::vector<const Suggester*> ReadSuggesters(const Arguments& data) {
+  std::vector<const Suggester*> chosen;
+  for (const std::string& name : data.Strings("suggester", 16, 64)) {
+    const Suggester* suggester = FindSuggester(name);
+    if (!suggester) data.Refuse("suggester", "names an unknown one, " + Quoted(name));
+    if (std::find(chosen.begin(), chosen.end(), suggester) == chosen.end()) {
+      chosen.push_back(suggester);
+    }
+  }
+  return chosen;
+}
+
+/// Ids, or names of shares.
+std::vector<std::string> ReadIndices(const Arguments& data) {
+  std::vector<std::string> ids = data.Strings("indice", kMaxIndices, kMaxIndexId);
+  for (std::string& id : ids) {
+    if (!ShareOfIndex(id)) id = IndexIdOf(id);
+  }
+  return ids;
+}
+
+/// The suggesters' lists merged: the first of each, the second of each, …, each text once.
+Json::Value Merged(const std::vector<const Suggester*>& suggesters,
+                   const std::vector<std::vector<std::string>>& lists, std::size_t limit) {
+  Json::Value merged(Json::arrayValue);
+  std::set<std::string> seen;
+  std::size_t longest = 0;
+  for (const auto& list : lists) longest = std::max(longest, list.size());
+  for (std::size_t rank = 0; rank < longest; ++rank) {
+    for (std::size_t i = 0; i < lists.size() && merged.size() < limit; ++i) {
+      if (rank >= lists[i].size() || !seen.insert(index::Fold(lists[i][rank])).second) continue;
+      Json::Value suggestion;
+      suggestion["term"] = lists[i][rank];
+      suggestion["suggester"] = std::string(suggesters[i]->name);
+      merged.append(std::move(suggestion));
+    }
+  }
+  return merged;
+}
+
+Json::Value Suggest(const std::vector<const Suggester*>& suggesters, const Typing& typing) {
+  std::vector<std::vector<std::string>> lists;
+  for (const Suggester* suggester : suggesters) lists.push_back(suggester->suggest(typing));
+  return Merged(suggesters, lists, typing.limit);
+}
+
+Json::Value SuggestByDefault(const Typing& typing) {
+  std::vector<const Suggester*> first, last;
+  for (const Suggester& suggester : Suggesters()) {
+    (suggester.always ? first : last).push_back(&suggester);
+  }
+  Json::Value suggestions = Suggest(first, typing);
+  return suggestions.empty() ? Suggest(last, typing) : suggestions;
+}
+
+}  // namespace
+
+Json::Value TermSuggestCommand(const Request& request) {
+  const Arguments data(request.data, "data",
+                       {"uid", "terms", "suggest_num", "indice", "suggester"});
+  const std::string text = data.String("terms", kMaxTermsBytes);
+  const std::int64_t wanted = data.Integer("suggest_num", INT64_MIN, INT64_MAX, 0);
+  const std::int64_t uid = data.Integer("uid", 0, UINT32_MAX, request.caller.uid);
+  const std::vector<const Suggester*> suggesters = ReadSuggesters(data);
+  Eyes eyes = EyesOf(request.caller, {});
+  const Scope scope = data.Has("indice") ? ScopeOf(request.core, std::move(eyes), ReadIndices(data))
+                                         : WholeScope(request.core, std::move(eyes));
+  Json::Value reply;
+  reply["suggestions"] = Json::arrayValue;
+  if (index::WordsOf(text).empty()) return reply;
+  const auto reader = scope.places.empty() ? nullptr : OpenReader(request.core, scope);
+  const bool own = !request.caller.unrestricted;
+  const auto limit = static_cast<std::size_t>(wanted < 1 ? kDefaultSuggestions
+                                                         : std::min(wanted, kMaxSuggestions));
+  const Typing typing{
+      request.core, scope, reader.get(),     own ? request.caller.uid : static_cast<uid_t>(uid),
+      text,         limit, request.cancelled};
+  reply["suggestions"] =
+      suggesters.empty() ? SuggestByDefault(typing) : Suggest(suggesters, typing);
+  return reply;
+}
+
+Json::Value ListSuggestersCommand(const Request& request) {
+  const Arguments data(request.data, "data", {});
+  Json::Value reply;
+  for (const Suggester& suggester : Suggesters()) {
+    Json::Value row;
+    row["name"] = std::string(suggester.name);
+    row["description"] = std::string(suggester.description);
+    reply["suggesters"].append(std::move(row));
+  }
+  reply["indices"] = Json::arrayValue;
+  for (const Place& place : WholeScope(request.core, EyesOf(request.caller, {})).places) {
+    reply["indices"].append(place.id);
+  }
+  return reply;
+}
+
+}  // namespace maru::daemon

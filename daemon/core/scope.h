@@ -1,0 +1,63 @@
+#pragma once
+
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "daemon/core/core.h"
+
+/// What a request may see: whose eyes, and which indices.
+namespace maru::daemon {
+
+constexpr std::size_t kMaxIndices = 1024;
+/// Bytes of an index id.
+constexpr std::size_t kMaxIndexId = 300;
+
+/// An identity with the name that share settings know it by.
+struct Eyes {
+  Identity identity;
+  std::string user_name;
+  /// Sees nothing at all.
+  bool blind = false;
+};
+
+/// The caller's eyes, narrowed by "permission" filters. For root and the service they become the
+/// named user's. Anybody else may name just himself: another name, an unknown one, or two different
+/// ones see nothing, so that no filter ever shows more than its absence. A user id without an
+/// account sees nothing either.
+Eyes EyesOf(const Identity& caller, const std::vector<std::string>& users);
+
+/// One admitted index.
+struct Place {
+  std::string id;
+  const ShareSettings* share;
+};
+
+struct Scope {
+  Eyes eyes;
+  std::vector<Place> places;
+  /// Owns what the places point to.
+  std::shared_ptr<const ShareTable> table;
+
+  std::vector<std::string> Ids() const;
+};
+
+/// The index ids of "indice" that exist and whose share the eyes may use; the others are left out.
+/// A malformed id throws Error (120).
+Scope ScopeOf(const Core& core, Eyes eyes, const std::vector<std::string>& ids);
+
+/// All of them.
+Scope WholeScope(const Core& core, Eyes eyes);
+
+/// "photo" of "fileindex_photo"; none for another form. Throws Error (120) for what can be no name
+/// at all: empty, with a slash or a control character, "." or "..".
+std::optional<std::string> ShareOfIndex(const std::string& id);
+
+/// A reader over the scope's places, in their order, with its eyes.
+std::unique_ptr<index::Reader> OpenReader(const Core& core, const Scope& scope);
+
+/// The volume path of a path within the share.
+std::string FullPath(const Place& place, const std::string& path);
+
+}  // namespace maru::daemon
