@@ -10,8 +10,8 @@
 #include <stdexcept>
 #include <string>
 
+#include "daemon/core/capability.h"
 #include "daemon/core/core.h"
-#include "daemon/core/privilege.h"
 #include "daemon/history.h"
 #include "daemon/socket/listener.h"
 #include "daemon/socket/server.h"
@@ -54,7 +54,7 @@ void Serve(const Config& config) {
   const Identity identity = FutureIdentity(config.service_account);
   const Listener listener(config.daemon_socket, identity);
   DropPrivileges(config.service_account);
-  if (!MayExamineAllFiles()) {
+  if (!HoldsReadSearch()) {
     MARU_LOG("Running without CAP_DAC_READ_SEARCH: only files that user %u can reach are shown",
              geteuid());
   }

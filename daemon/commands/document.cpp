@@ -1,11 +1,12 @@
-#include <algorithm>
 #include <cstdint>
 
 #include "daemon/commands/commands.h"
 #include "daemon/commands/hit.h"
 #include "daemon/core/arguments.h"
 #include "daemon/core/page_check.h"
-#include "daemon/language/question.h"
+#include "daemon/language/clauses.h"
+#include "system/index_id.h"
+#include "system/volume_path.h"
 
 namespace maru::daemon {
 namespace {
@@ -18,17 +19,7 @@ maruseeker::Error NotThere() {
 }
 
 bool Readable(const Scope& scope, const index::Hit& hit) {
-  return StillReadable(scope, {hit})[0];
-}
-
-/// Share name and path within the share ("" for the share itself) of "/volume1/photo/a.jpg".
-std::pair<std::string, std::string> SplitFullPath(const std::string& full_path) {
-  const std::string begin = std::string(kVolume) + "/";
-  if (!full_path.starts_with(begin) || full_path.find('\0') != std::string::npos) {
-    throw BadParameter("data.full_path is not a path such as /volume1/photo/a.jpg");
-  }
-  const std::size_t slash = std::min(full_path.find('/', begin.size()), full_path.size());
-  return {full_path.substr(begin.size(), slash - begin.size()), full_path.substr(slash)};
+  return ReadableNow(scope, {hit})[0];
 }
 
 }  // namespace
@@ -40,9 +31,9 @@ Json::Value HighlightCommand(const Request& request) {
   const std::int64_t document = data.Integer("doc_id", INT64_MIN, INT64_MAX, 0);
   const index::FragmentOptions options = ReadFragmentOptions(Arguments(
       data.Any("highlight"), "data.highlight", {"field", "frag_length", "num_fragments"}));
-  const index::Query query = ToQuery(ReadQuestion(data), false);
+  const index::Query query = ToQuery(ReadClauses(data), false);
   const Scope scope = ScopeOf(request.core, EyesOf(request.caller, {}), {id});
-  if (scope.places.empty() || document < 1 || document > UINT32_MAX) throw NotThere();
+  if (scope.indices.empty() || document < 1 || document > UINT32_MAX) throw NotThere();
   const auto reader = OpenReader(request.core, scope);
   const auto hit = reader->Find(0, static_cast<index::DocumentId>(document));
   if (!hit || !Readable(scope, *hit)) throw NotThere();
@@ -55,11 +46,16 @@ Json::Value HighlightCommand(const Request& request) {
 Json::Value RecordOpenCommand(const Request& request) {
   const Arguments data(request.data, "data", {"id", "full_path"});
   const std::string id = data.String("id", kMaxIndexId);
-  const auto [share, path] = SplitFullPath(data.String("full_path", kMaxPathBytes));
-  if (ShareOfIndex(id) != share) throw BadParameter("data.full_path does not lie in " + Quoted(id));
+  const std::string full_path = data.String("full_path", kMaxPathBytes);
+  CheckIndexId(id);
+  VolumePath path;
+  if (!SplitAtShare(full_path, path) || full_path.find('\0') != std::string::npos) {
+    data.Refuse("full_path", "is not a path such as /volume1/photo/a.jpg");
+  }
+  if (id != IndexIdOf(path.share)) data.Refuse("full_path", "does not lie in " + Quoted(id));
   const Scope scope = ScopeOf(request.core, EyesOf(request.caller, {}), {id});
-  if (scope.places.empty()) throw NotThere();
-  const auto hit = OpenReader(request.core, scope)->Find(0, path);
+  if (scope.indices.empty()) throw NotThere();
+  const auto hit = OpenReader(request.core, scope)->Find(0, path.rest);
   if (!hit || !Readable(scope, *hit)) throw NotThere();
   request.core.usage.Record(request.caller.uid, id, hit->document, hit->path);
   return Json::objectValue;

@@ -5,6 +5,7 @@
 #include <limits>
 #include <map>
 
+#include "daemon/language/criteria.h"
 #include "system/json.h"
 
 namespace maru::daemon {
@@ -14,7 +15,6 @@ using index::Field;
 using index::Hit;
 
 constexpr std::size_t kMaxFieldNames = 64;
-constexpr std::size_t kMaxFieldName = 64;
 /// Any integer: it is brought within its bounds instead of being refused.
 constexpr std::int64_t kLow = std::numeric_limits<std::int64_t>::min();
 constexpr std::int64_t kHigh = std::numeric_limits<std::int64_t>::max();
@@ -30,9 +30,9 @@ Json::Value AuthorsOf(const Hit& hit) {
   return authors;
 }
 
-void AddField(json::ObjectWriter& message, const Place& place, const Hit& hit,
+void AddField(json::ObjectWriter& message, const ShareIndex& from, const Hit& hit,
               std::string_view field) {
-  if (field == index::kPath) return message.AddText(field, FullPath(place, hit.path));
+  if (field == index::kPath) return message.AddText(field, FullPath(from, hit.path));
   if (field == index::kName) return message.AddText(field, hit.record.name);
   if (field == index::kExtension) {
     return message.AddText(field, index::ExtensionOf(hit.record.name));
@@ -53,30 +53,38 @@ std::size_t Bounded(std::int64_t number, std::int64_t least, std::int64_t most,
   return static_cast<std::size_t>(number < 1 ? usual : std::clamp(number, least, most));
 }
 
+std::vector<const Field*> FieldsNamed(const Arguments& arguments, const char* list) {
+  std::vector<const Field*> fields;
+  for (const std::string& name : arguments.Strings(list, kMaxFieldNames, kMaxFieldName)) {
+    fields.push_back(index::FindField(name));
+    if (!fields.back()) arguments.Refuse(list, "names an unknown field, " + Quoted(name));
+  }
+  return fields;
+}
+
 }  // namespace
 
 std::vector<const Field*> ReadFields(const Arguments& arguments) {
   std::map<std::string_view, const Field*> fields = {
       {index::kOwner, index::FindField(index::kOwner)}};
   for (const char* list : {"load_field", "fields"}) {
-    for (const std::string& name : arguments.Strings(list, kMaxFieldNames, kMaxFieldName)) {
-      const Field* field = index::FindField(name);
-      if (!field) arguments.Refuse(list, "names an unknown field, " + Quoted(name));
+    for (const Field* field : FieldsNamed(arguments, list)) {
       if (field->name != index::kText) fields[field->name] = field;
     }
   }
+  FieldsNamed(arguments, "lazy_field");
   std::vector<const Field*> in_order;
   for (const auto& [name, field] : fields) in_order.push_back(field);
   return in_order;
 }
 
-std::string HitMessage(const Place& place, const Hit& hit, const std::vector<const Field*>& fields,
-                       const Json::Value& highlight) {
+std::string HitMessage(const ShareIndex& from, const Hit& hit,
+                       const std::vector<const Field*>& fields, const Json::Value& highlight) {
   json::ObjectWriter message;
-  for (const Field* field : fields) AddField(message, place, hit, field->name);
+  for (const Field* field : fields) AddField(message, from, hit, field->name);
   message.AddNumber("doc_id", hit.document);
   if (!highlight.isNull()) message.AddValue("highlight", highlight);
-  message.AddText("id", place.id);
+  message.AddText("id", from.id);
   message.AddNumber("score", std::llround(hit.score * 1000));
   return message.Take();
 }

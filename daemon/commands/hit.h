@@ -13,11 +13,11 @@ namespace maru::daemon {
 
 /// The fields that a hit's message has: those named by the lists "load_field" and "fields" and the
 /// owner, in the order of their names. MARUMDTextContent is taken and left out: texts are shown in
-/// fragments only. Throws Error (120) for an unknown name.
+/// fragments only. Throws Error (120) for an unknown name, also in "lazy_field".
 std::vector<const index::Field*> ReadFields(const Arguments& arguments);
 
 /// A hit's message: the fields, doc_id, "highlight" unless that is null, id and score.
-std::string HitMessage(const Place& place, const index::Hit& hit,
+std::string HitMessage(const ShareIndex& from, const index::Hit& hit,
                        const std::vector<const index::Field*>& fields,
                        const Json::Value& highlight);
 

@@ -3,9 +3,10 @@
 #include "daemon/commands/commands.h"
 #include "daemon/core/arguments.h"
 #include "daemon/core/scope.h"
+#include "daemon/language/clauses.h"
 #include "daemon/language/criteria.h"
 #include "daemon/language/filters.h"
-#include "daemon/language/question.h"
+#include "daemon/language/query_tree.h"
 
 namespace maru::daemon {
 namespace {
@@ -15,8 +16,8 @@ using index::Query;
 constexpr std::size_t kMaxQueries = 64;
 constexpr std::size_t kMaxNameBytes = 4096;
 
-/// One of the named queries.
-struct Part {
+/// One of the named queries: what is counted.
+struct Facet {
   std::string name;
   std::vector<std::string> users;
   bool any_word = false;
@@ -25,21 +26,17 @@ struct Part {
 
 /// A query's own type is its last "file_type" filter: askers add each query's filters to those of
 /// the queries before, and expect the count of the type just added.
-Part ReadPart(const Json::Value& item, bool blank) {
-  const Arguments part(item, "data.queries", {"name", "query"});
-  if (!part.Has("name")) part.Refuse("name", "is missing");
-  const Arguments query(part.Object("query"), "data.queries.query",
+Facet ReadFacet(const Json::Value& item, bool blank) {
+  const Arguments named(item, "data.queries", {"name", "query"});
+  if (!named.Has("name")) named.Refuse("name", "is missing");
+  const Arguments query(named.Object("query"), "data.queries.query",
                         {"filters", "default_search_op"});
   Filters filters = ReadFilters(query);
-  Part read{part.String("name", kMaxNameBytes), std::move(filters.users), ReadAnyWord(query), {}};
-  std::optional<Query> kinds;
-  if (!filters.types.empty()) kinds = ParseKinds(filters.types.back());
-  if (kinds) {
-    read.filter = std::move(*kinds);
-  } else if (blank) {
-    read.filter.kind = Query::Kind::kNothing;
-  }
-  return read;
+  Facet facet{named.String("name", kMaxNameBytes), std::move(filters.users), ReadAnyWord(query),
+              blank ? Nothing() : Query{}};
+  if (filters.types.empty()) return facet;
+  if (auto kinds = ParseKinds(filters.types.back())) facet.filter = std::move(*kinds);
+  return facet;
 }
 
 }  // namespace
@@ -47,28 +44,28 @@ Part ReadPart(const Json::Value& item, bool blank) {
 Json::Value IndicateCommand(const Request& request) {
   const Arguments data(request.data, "data",
                        {"keyword", "indice", "criteria_list", "search_weight_list", "queries"});
-  const Question question = ReadQuestion(data);
-  const bool blank = AsksNothing(question);
+  const QueryClauses clauses = ReadClauses(data);
+  const bool blank = IsBlank(clauses);
   const std::vector<std::string> ids = data.Strings("indice", kMaxIndices, kMaxIndexId);
 
-  // Queries with the same eyes and the same operator share one pass; in practice that is all.
-  std::map<std::pair<std::vector<std::string>, bool>, std::vector<Part>> passes;
+  // Facets with the same eyes and the same operator share one pass; in practice that is all.
+  std::map<std::pair<std::vector<std::string>, bool>, std::vector<Facet>> passes;
   for (const Json::Value& item : data.Array("queries", kMaxQueries)) {
-    Part part = ReadPart(item, blank);
-    passes[{part.users, part.any_word}].push_back(std::move(part));
+    Facet facet = ReadFacet(item, blank);
+    passes[{facet.users, facet.any_word}].push_back(std::move(facet));
   }
   Json::Value counts(Json::objectValue);
-  for (const auto& [kind_of_pass, parts] : passes) {
-    const auto& [users, any_word] = kind_of_pass;
-    for (const Part& part : parts) counts[part.name] = 0;
+  for (const auto& [what, facets] : passes) {
+    const auto& [users, any_word] = what;
+    for (const Facet& facet : facets) counts[facet.name] = 0;
     const Scope scope = ScopeOf(request.core, EyesOf(request.caller, users), ids);
-    if (scope.places.empty()) continue;
+    if (scope.indices.empty()) continue;
     std::vector<Query> filters;
-    for (const Part& part : parts) filters.push_back(part.filter);
-    const Query query = blank ? Query{} : ToQuery(question, any_word);
+    for (const Facet& facet : facets) filters.push_back(facet.filter);
+    const Query query = blank ? Query{} : ToQuery(clauses, any_word);
     const auto found = OpenReader(request.core, scope)->Count(query, filters, request.cancelled);
-    for (std::size_t i = 0; i < parts.size(); ++i) {
-      counts[parts[i].name] = Json::UInt64{found[i]};
+    for (std::size_t i = 0; i < facets.size(); ++i) {
+      counts[facets[i].name] = Json::UInt64{found[i]};
     }
   }
   return counts;

@@ -4,9 +4,10 @@
 #include "daemon/commands/hit.h"
 #include "daemon/core/arguments.h"
 #include "daemon/core/page_check.h"
+#include "daemon/language/clauses.h"
 #include "daemon/language/criteria.h"
 #include "daemon/language/filters.h"
-#include "daemon/language/question.h"
+#include "daemon/language/query_tree.h"
 #include "system/json.h"
 
 namespace maru::daemon {
@@ -23,7 +24,7 @@ constexpr int kMaxRounds = 4;
 constexpr std::size_t kMaxCollectorText = 256;
 
 /// A search as asked for.
-struct Wish {
+struct SearchRequest {
   index::Query query;
   std::vector<const index::Field*> fields;
   std::vector<index::FragmentOptions> highlights;
@@ -48,7 +49,7 @@ std::vector<index::FragmentOptions> ReadHighlights(const Arguments& data) {
 void ReadSort(const Arguments& data, index::SearchOptions& options) {
   if (!data.Has("sort")) return;
   const Arguments sort(data.Object("sort"), data.NameOf("sort"), {"field", "direction"});
-  options.sort_field = sort.String("field", 64);
+  options.sort_field = sort.String("field", kMaxFieldName);
   const index::Field* field = index::FindField(options.sort_field);
   if (!field || field->slot < 0) {
     sort.Refuse("field", "is not a number or time field: " + Quoted(options.sort_field));
@@ -69,46 +70,42 @@ void CheckCollector(const Arguments& data) {
   }
 }
 
-void CheckPage(const Wish& wish) {
+void CheckPage(const SearchRequest& search) {
   std::uint64_t characters = 0;
-  for (const index::FragmentOptions& highlight : wish.highlights) {
-    characters += std::uint64_t{wish.options.size} * highlight.length * highlight.count;
+  for (const index::FragmentOptions& highlight : search.highlights) {
+    characters += std::uint64_t{search.options.size} * highlight.length * highlight.count;
   }
   if (characters > kMaxFragmentCharacters) {
     throw BadParameter("Too many fragments: ask for a smaller page, fewer or shorter fragments");
   }
 }
 
-Wish ReadWish(const Request& request) {
+SearchRequest ReadSearch(const Request& request) {
   const Arguments data(request.data, "data",
                        {"pre_query", "indice", "from", "size", "default_search_op", "load_field",
                         "lazy_field", "collector", "highlight", "fields", "filters", "sort"});
   const Arguments pre_query(data.Object("pre_query"), "data.pre_query",
                             {"keyword", "criteria_list", "file_type", "search_weight_list"});
-  Wish wish;
-  Question question = ReadQuestion(pre_query);
+  SearchRequest search;
+  QueryClauses clauses = ReadClauses(pre_query);
   const Filters filters = ReadFilters(data);
   for (const std::string& type : filters.types) {
-    if (auto kinds = ParseKinds(type)) question.filters.push_back(std::move(*kinds));
+    if (auto kinds = ParseKinds(type)) clauses.filters.push_back(std::move(*kinds));
   }
-  wish.query = ToQuery(question, ReadAnyWord(data));
-  wish.fields = ReadFields(data);
-  for (const std::string& name : data.Strings("lazy_field", 64, 64)) {
-    if (!index::FindField(name))
-      data.Refuse("lazy_field", "names an unknown field, " + Quoted(name));
-  }
-  wish.highlights = ReadHighlights(data);
-  wish.options.from = static_cast<std::uint32_t>(data.Integer("from", 0, kMaxFrom, 0));
-  wish.options.size = static_cast<std::uint32_t>(data.Integer("size", 0, kMaxSize, kDefaultSize));
-  wish.options.cancelled = request.cancelled;
-  ReadSort(data, wish.options);
+  search.query = ToQuery(clauses, ReadAnyWord(data));
+  search.fields = ReadFields(data);
+  search.highlights = ReadHighlights(data);
+  search.options.from = static_cast<std::uint32_t>(data.Integer("from", 0, kMaxFrom, 0));
+  search.options.size = static_cast<std::uint32_t>(data.Integer("size", 0, kMaxSize, kDefaultSize));
+  search.options.cancelled = request.cancelled;
+  ReadSort(data, search.options);
   CheckCollector(data);
-  CheckPage(wish);
-  Eyes eyes = EyesOf(request.caller, filters.users);
-  wish.scope = data.Has("indice") ? ScopeOf(request.core, std::move(eyes),
-                                            data.Strings("indice", kMaxIndices, kMaxIndexId))
-                                  : WholeScope(request.core, std::move(eyes));
-  return wish;
+  CheckPage(search);
+  const std::vector<std::string> ids = data.Has("indice")
+                                           ? data.Strings("indice", kMaxIndices, kMaxIndexId)
+                                           : request.core.indices.Ids();
+  search.scope = ScopeOf(request.core, EyesOf(request.caller, filters.users), ids);
+  return search;
 }
 
 /// What the caller opened lately ranks higher.
@@ -117,7 +114,7 @@ void AddBoosts(const Request& request, const Scope& scope, index::Reader& reader
   const std::vector<std::string> ids = scope.Ids();
   for (const OpenedFile& file : request.core.usage.Strongest(request.caller.uid, ids)) {
     const auto share =
-        static_cast<std::size_t>(std::find(ids.begin(), ids.end(), file.index_id) - ids.begin());
+        static_cast<std::size_t>(std::ranges::find(ids, file.index_id) - ids.begin());
     const auto hit = reader.Find(share, file.document);
     if (hit && IsSameFile(file.path, hit->path)) {
       options.boosts[{share, file.document}] = file.boost;
@@ -128,22 +125,22 @@ void AddBoosts(const Request& request, const Scope& scope, index::Reader& reader
 /// The page's hits, checked against the file system and filled up behind those that fell out. The
 /// total is lowered by them. (What fell out of earlier pages is not known here; until the index has
 /// caught up, a hit may stand on two pages.)
-index::SearchResult CheckedPage(Wish& wish, index::Reader& reader) {
+index::SearchResult CheckedPage(SearchRequest& search, index::Reader& reader) {
   index::SearchResult page;
-  index::SearchOptions options = wish.options;
+  index::SearchOptions options = search.options;
   std::uint64_t gone = 0;
   for (int round = 0; round < kMaxRounds; ++round) {
-    index::SearchResult found = reader.Search(wish.query, options);
+    index::SearchResult found = reader.Search(search.query, options);
     page.total = found.total;
-    const std::vector<bool> readable = StillReadable(wish.scope, found.hits);
+    const std::vector<bool> readable = ReadableNow(search.scope, found.hits);
     for (std::size_t i = 0; i < found.hits.size(); ++i) {
       if (!readable[i]) ++gone;
-      if (readable[i] && page.hits.size() < wish.options.size) {
+      if (readable[i] && page.hits.size() < search.options.size) {
         page.hits.push_back(std::move(found.hits[i]));
       }
     }
     const bool more = found.hits.size() == options.size;
-    if (!more || page.hits.size() == wish.options.size) break;
+    if (!more || page.hits.size() == search.options.size) break;
     options.from += options.size;
   }
   page.total -= std::min(page.total, gone);
@@ -153,36 +150,37 @@ index::SearchResult CheckedPage(Wish& wish, index::Reader& reader) {
 }  // namespace
 
 Json::Value SearchCommand(const Request& request) {
-  Wish wish = ReadWish(request);
+  SearchRequest search = ReadSearch(request);
   index::SearchResult page;
   std::unique_ptr<index::Reader> reader;
-  if (!wish.scope.places.empty()) {
-    reader = OpenReader(request.core, wish.scope);
-    if (wish.options.sort_field.empty()) {
-      AddBoosts(request, wish.scope, *reader, wish.options);
+  if (!search.scope.indices.empty()) {
+    reader = OpenReader(request.core, search.scope);
+    if (search.options.sort_field.empty()) {
+      AddBoosts(request, search.scope, *reader, search.options);
     }
-    page = CheckedPage(wish, *reader);
+    page = CheckedPage(search, *reader);
   }
   json::ObjectWriter total;
   total.AddNumber("total", static_cast<std::int64_t>(page.total));
   request.output(total.Take(), false);
   for (const index::Hit& hit : page.hits) {
     Json::Value highlight;
-    if (!wish.highlights.empty()) {
+    if (!search.highlights.empty()) {
       if (request.cancelled()) throw index::Cancelled();
-      highlight = FragmentsOf(*reader, hit, wish.query, wish.highlights);
+      highlight = FragmentsOf(*reader, hit, search.query, search.highlights);
     }
-    request.output(HitMessage(wish.scope.places[hit.share], hit, wish.fields, highlight), false);
+    request.output(HitMessage(search.scope.indices[hit.share], hit, search.fields, highlight),
+                   false);
   }
   return {};
 }
 
 Json::Value ExplainCommand(const Request& request) {
-  const Wish wish = ReadWish(request);
+  const SearchRequest search = ReadSearch(request);
   Json::Value data;
-  data["query"] = Explain(wish.query);
+  data["query"] = Explain(search.query);
   data["indice"] = Json::arrayValue;
-  for (const Place& place : wish.scope.places) data["indice"].append(place.id);
+  for (const std::string& id : search.scope.Ids()) data["indice"].append(id);
   return data;
 }
 

@@ -1,6 +1,6 @@
 #include "daemon/commands/commands.h"
 #include "daemon/core/arguments.h"
-#include "daemon/core/scope.h"
+#include "system/index_id.h"
 
 namespace maru::daemon {
 namespace {
@@ -9,10 +9,8 @@ namespace {
 Json::Value IndexStatus(const Core& core, const std::string& id) {
   Json::Value status;
   status["id"] = id;
-  status["share"] = Json::nullValue;
-  if (const auto share = ShareOfIndex(id); share && core.shares()->Find(*share)) {
-    status["share"] = *share;
-  }
+  const std::string share(ShareOfIndexId(id));
+  status["share"] = core.shares()->Find(share) ? Json::Value(share) : Json::Value();
   try {
     status["documents"] = Json::UInt64{core.indices.Open({id})->Documents()};
   } catch (const maruseeker::Error& error) {

@@ -30,7 +30,8 @@ std::vector<const Suggester*> ReadSuggesters(const Arguments& data) {
 std::vector<std::string> ReadIndices(const Arguments& data) {
   std::vector<std::string> ids = data.Strings("indice", kMaxIndices, kMaxIndexId);
   for (std::string& id : ids) {
-    if (!ShareOfIndex(id)) id = IndexIdOf(id);
+    CheckIndexId(id);
+    if (ShareOfIndexId(id).empty()) id = IndexIdOf(id);
   }
   return ids;
 }
@@ -54,19 +55,20 @@ Json::Value Merged(const std::vector<const Suggester*>& suggesters,
   return merged;
 }
 
-Json::Value Suggest(const std::vector<const Suggester*>& suggesters, const Typing& typing) {
+Json::Value Suggest(const std::vector<const Suggester*>& suggesters,
+                    const SuggestRequest& request) {
   std::vector<std::vector<std::string>> lists;
-  for (const Suggester* suggester : suggesters) lists.push_back(suggester->suggest(typing));
-  return Merged(suggesters, lists, typing.limit);
+  for (const Suggester* suggester : suggesters) lists.push_back(suggester->suggest(request));
+  return Merged(suggesters, lists, request.limit);
 }
 
-Json::Value SuggestByDefault(const Typing& typing) {
+Json::Value SuggestByDefault(const SuggestRequest& request) {
   std::vector<const Suggester*> first, last;
   for (const Suggester& suggester : Suggesters()) {
     (suggester.always ? first : last).push_back(&suggester);
   }
-  Json::Value suggestions = Suggest(first, typing);
-  return suggestions.empty() ? Suggest(last, typing) : suggestions;
+  Json::Value suggestions = Suggest(first, request);
+  return suggestions.empty() ? Suggest(last, request) : suggestions;
 }
 
 }  // namespace
@@ -78,21 +80,20 @@ Json::Value TermSuggestCommand(const Request& request) {
   const std::int64_t wanted = data.Integer("suggest_num", INT64_MIN, INT64_MAX, 0);
   const std::int64_t uid = data.Integer("uid", 0, UINT32_MAX, request.caller.uid);
   const std::vector<const Suggester*> suggesters = ReadSuggesters(data);
-  Eyes eyes = EyesOf(request.caller, {});
-  const Scope scope = data.Has("indice") ? ScopeOf(request.core, std::move(eyes), ReadIndices(data))
-                                         : WholeScope(request.core, std::move(eyes));
+  const std::vector<std::string> ids =
+      data.Has("indice") ? ReadIndices(data) : request.core.indices.Ids();
+  const Scope scope = ScopeOf(request.core, EyesOf(request.caller, {}), ids);
   Json::Value reply;
   reply["suggestions"] = Json::arrayValue;
   if (index::WordsOf(text).empty()) return reply;
-  const auto reader = scope.places.empty() ? nullptr : OpenReader(request.core, scope);
+  const auto reader = scope.indices.empty() ? nullptr : OpenReader(request.core, scope);
   const bool own = !request.caller.unrestricted;
   const auto limit = static_cast<std::size_t>(wanted < 1 ? kDefaultSuggestions
                                                          : std::min(wanted, kMaxSuggestions));
-  const Typing typing{
+  const SuggestRequest typed{
       request.core, scope, reader.get(),     own ? request.caller.uid : static_cast<uid_t>(uid),
       text,         limit, request.cancelled};
-  reply["suggestions"] =
-      suggesters.empty() ? SuggestByDefault(typing) : Suggest(suggesters, typing);
+  reply["suggestions"] = suggesters.empty() ? SuggestByDefault(typed) : Suggest(suggesters, typed);
   return reply;
 }
 
@@ -106,8 +107,9 @@ Json::Value ListSuggestersCommand(const Request& request) {
     reply["suggesters"].append(std::move(row));
   }
   reply["indices"] = Json::arrayValue;
-  for (const Place& place : WholeScope(request.core, EyesOf(request.caller, {})).places) {
-    reply["indices"].append(place.id);
+  const Eyes eyes = EyesOf(request.caller, {});
+  for (const std::string& id : ScopeOf(request.core, eyes, request.core.indices.Ids()).Ids()) {
+    reply["indices"].append(id);
   }
   return reply;
 }

@@ -4,6 +4,7 @@
 #include <array>
 
 #include "daemon/core/page_check.h"
+#include "daemon/language/query_tree.h"
 #include "index/fields.h"
 #include "index/tokenizer.h"
 
@@ -34,44 +35,42 @@ std::string Replaced(const std::string& text, const Word& typed, const std::stri
 }
 
 /// The word being typed: the last one, when the text ends with it.
-std::vector<std::string> Complete(const Typing& typing) {
+std::vector<std::string> Complete(const SuggestRequest& request) {
   std::vector<std::string> texts;
-  const std::vector<Word> words = WordsIn(typing.text);
-  if (!typing.reader || words.empty() || words.back().end != typing.text.size()) return texts;
+  const std::vector<Word> words = WordsIn(request.text);
+  if (!request.reader || words.empty() || words.back().end != request.text.size()) return texts;
   // One more: the word as it stands is among its completions.
   for (const std::string& word :
-       typing.reader->Complete("", words.back().folded, typing.limit + 1)) {
-    if (word != words.back().folded) texts.push_back(Replaced(typing.text, words.back(), word));
+       request.reader->Complete("", words.back().folded, request.limit + 1)) {
+    if (word != words.back().folded) texts.push_back(Replaced(request.text, words.back(), word));
   }
   return texts;
 }
 
 /// Names with all the words, the last of which may be going on.
 index::Query NameQuery(const std::vector<Word>& words, bool last_goes_on) {
-  index::Query query;
-  query.kind = index::Query::Kind::kAnd;
+  std::vector<index::Query> parts;
   for (const Word& typed : words) {
-    index::Query word;
-    word.kind = last_goes_on && &typed == &words.back() ? index::Query::Kind::kPrefix
-                                                        : index::Query::Kind::kWord;
+    index::Query& word = parts.emplace_back();
+    word.kind = index::Query::Kind::kWord;
     word.words = {typed.folded};
     word.fields = {{std::string(index::kName), 1}};
     word.exact = true;
-    query.parts.push_back(std::move(word));
   }
-  return query;
+  if (last_goes_on) parts.back().kind = index::Query::Kind::kPrefix;
+  return Join(index::Query::Kind::kAnd, std::move(parts));
 }
 
-std::vector<std::string> Names(const Typing& typing) {
+std::vector<std::string> Names(const SuggestRequest& request) {
   std::vector<std::string> names;
-  const std::vector<Word> words = WordsIn(typing.text);
-  if (!typing.reader || words.empty()) return names;
+  const std::vector<Word> words = WordsIn(request.text);
+  if (!request.reader || words.empty()) return names;
   index::SearchOptions options;
-  options.size = static_cast<std::uint32_t>(typing.limit);
-  options.cancelled = typing.cancelled;
-  const bool last_goes_on = words.back().end == typing.text.size();
-  const auto hits = typing.reader->Search(NameQuery(words, last_goes_on), options).hits;
-  const std::vector<bool> readable = StillReadable(typing.scope, hits);
+  options.size = static_cast<std::uint32_t>(request.limit);
+  options.cancelled = request.cancelled;
+  const bool last_goes_on = words.back().end == request.text.size();
+  const auto hits = request.reader->Search(NameQuery(words, last_goes_on), options).hits;
+  const std::vector<bool> readable = ReadableNow(request.scope, hits);
   for (std::size_t i = 0; i < hits.size(); ++i) {
     if (readable[i]) names.push_back(hits[i].record.name);
   }
@@ -79,27 +78,27 @@ std::vector<std::string> Names(const Typing& typing) {
 }
 
 /// One word at a time put right, the last one first.
-std::vector<std::string> Spellings(const Typing& typing) {
+std::vector<std::string> Spellings(const SuggestRequest& request) {
   std::vector<std::string> texts;
-  std::vector<Word> words = WordsIn(typing.text);
-  if (!typing.reader) return texts;
+  std::vector<Word> words = WordsIn(request.text);
+  if (!request.reader) return texts;
   std::reverse(words.begin(), words.end());
   if (words.size() > kMaxWordsCorrected) words.resize(kMaxWordsCorrected);
   for (const Word& typed : words) {
-    for (const std::string& word : typing.reader->Correct(typed.folded, typing.limit)) {
-      if (word != typed.folded) texts.push_back(Replaced(typing.text, typed, word));
+    for (const std::string& word : request.reader->Correct(typed.folded, request.limit)) {
+      if (word != typed.folded) texts.push_back(Replaced(request.text, typed, word));
     }
-    if (texts.size() >= typing.limit) break;
+    if (texts.size() >= request.limit) break;
   }
   return texts;
 }
 
 /// Earlier searches: first those that begin with the text, then those that hold it.
-std::vector<std::string> Earlier(const Typing& typing) {
-  if (!typing.core.history) return {};
-  const std::string wanted = index::Fold(typing.text);
+std::vector<std::string> Earlier(const SuggestRequest& request) {
+  if (!request.core.history) return {};
+  const std::string wanted = index::Fold(request.text);
   std::vector<std::string> begin, hold;
-  for (std::string& keyword : typing.core.history(typing.uid)) {
+  for (std::string& keyword : request.core.history(request.uid)) {
     const std::string folded = index::Fold(keyword);
     if (folded.empty() || folded == wanted) continue;
     const std::size_t at = folded.find(wanted);
@@ -107,7 +106,7 @@ std::vector<std::string> Earlier(const Typing& typing) {
     (at == 0 ? begin : hold).push_back(std::move(keyword));
   }
   begin.insert(begin.end(), hold.begin(), hold.end());
-  if (begin.size() > typing.limit) begin.resize(typing.limit);
+  if (begin.size() > request.limit) begin.resize(request.limit);
   return begin;
 }
 
@@ -126,8 +125,7 @@ std::span<const Suggester> Suggesters() {
 }
 
 const Suggester* FindSuggester(std::string_view name) {
-  const auto found = std::find_if(kSuggesters.begin(), kSuggesters.end(),
-                                  [&](const Suggester& row) { return row.name == name; });
+  const auto found = std::ranges::find(kSuggesters, name, &Suggester::name);
   return found == kSuggesters.end() ? nullptr : &*found;
 }
 

@@ -12,7 +12,7 @@
 namespace maru::daemon {
 
 /// What was typed and for whom.
-struct Typing {
+struct SuggestRequest {
   const Core& core;
   const Scope& scope;
   /// Null when there is no index to look into.
@@ -21,7 +21,7 @@ struct Typing {
   uid_t uid;
   const std::string& text;
   std::size_t limit;
-  const Cancelled& cancelled;
+  const CancelCheck& cancelled;
 };
 
 struct Suggester {
@@ -30,7 +30,7 @@ struct Suggester {
   /// Used when no suggester is named; otherwise just when nothing else was found.
   bool always;
   /// Whole texts for the box, best first, about `limit` of them.
-  std::vector<std::string> (*suggest)(const Typing& typing);
+  std::vector<std::string> (*suggest)(const SuggestRequest& request);
 };
 
 /// In the order in which they take turns.

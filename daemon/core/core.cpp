@@ -13,8 +13,8 @@ namespace {
 
 constexpr std::size_t kMaxCommandName = 64;
 
-Json::Value Carry(Core& core, const Identity& caller, const std::string& line, const Output& output,
-                  const Cancelled& cancelled) {
+Json::Value Execute(Core& core, const Identity& caller, const std::string& line,
+                    const Output& output, const CancelCheck& cancelled) {
   Json::Value message;
   std::string why;
   if (!json::FromString(line, message, &why)) throw BadParameter("Not a JSON text: " + why);
@@ -46,10 +46,10 @@ Json::Value ErrorReply(int code, const std::string& message) {
 }
 
 void Answer(Core& core, const Identity& caller, const std::string& line, const Output& output,
-            const Cancelled& cancelled) {
+            const CancelCheck& cancelled) {
   Json::Value reply;
   try {
-    reply = Carry(core, caller, line, output, cancelled);
+    reply = Execute(core, caller, line, output, cancelled);
   } catch (const maruseeker::Error& error) {
     if (error.Code() != maruseeker::kErrorBadParameter &&
         error.Code() != maruseeker::kErrorNoPermission) {

@@ -56,7 +56,7 @@ struct Core {
 /// Takes one message, a line without its end; `last` is told with the one that has "success".
 using Output = std::function<void(std::string_view message, bool last)>;
 /// True when nobody waits for the answer any more, or it takes too long.
-using Cancelled = std::function<bool()>;
+using CancelCheck = std::function<bool()>;
 
 /// One command being carried out.
 struct Request {
@@ -66,14 +66,14 @@ struct Request {
   const Json::Value& data;
   /// For replies of several messages.
   const Output& output;
-  const Cancelled& cancelled;
+  const CancelCheck& cancelled;
 };
 
 /// Carries out one line and gives every message of the reply to `output`; the last one has
 /// "success". Whatever the line holds, this neither throws nor ends the process; only what `output`
 /// throws on the last message comes out.
 void Answer(Core& core, const Identity& caller, const std::string& line, const Output& output,
-            const Cancelled& cancelled);
+            const CancelCheck& cancelled);
 
 /// {"success": false, "error": {"code", "msg"}}
 Json::Value ErrorReply(int code, const std::string& message);

@@ -7,7 +7,7 @@
 #include <numeric>
 #include <string>
 
-#include "daemon/core/privilege.h"
+#include "daemon/core/capability.h"
 #include "system/rights_cache.h"
 #include "system/unique_fd.h"
 
@@ -83,17 +83,17 @@ class Walk {
 
 }  // namespace
 
-std::vector<bool> StillReadable(const Scope& scope, const std::vector<index::Hit>& hits) {
+std::vector<bool> ReadableNow(const Scope& scope, const std::vector<index::Hit>& hits) {
   std::vector<std::size_t> order(hits.size());
   std::iota(order.begin(), order.end(), 0);
   std::sort(order.begin(), order.end(), [&](std::size_t a, std::size_t b) {
     return std::tie(hits[a].share, hits[a].path) < std::tie(hits[b].share, hits[b].path);
   });
-  const ExamineFiles examine;
+  const RaisedReadSearch raised;
   std::vector<bool> readable(hits.size());
   for (std::size_t i = 0; i < order.size();) {
     const std::size_t share = hits[order[i]].share;
-    Walk walk(scope.eyes.identity, *scope.places[share].share);
+    Walk walk(scope.eyes.identity, *scope.indices[share].share);
     for (; i < order.size() && hits[order[i]].share == share; ++i) {
       readable[order[i]] = walk.Readable(hits[order[i]].path);
     }

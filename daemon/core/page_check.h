@@ -13,7 +13,7 @@ namespace maru::daemon {
 /// file system's present rights it may be read: read permission on it, search permission on every
 /// folder from the share's own down. No symbolic link is followed below the share's folder. A path
 /// that cannot be examined, or is deeper than kMaxPathDepth folders, may not be read.
-std::vector<bool> StillReadable(const Scope& scope, const std::vector<index::Hit>& hits);
+std::vector<bool> ReadableNow(const Scope& scope, const std::vector<index::Hit>& hits);
 
 constexpr std::size_t kMaxPathDepth = 256;
 

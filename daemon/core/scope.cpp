@@ -9,11 +9,6 @@
 namespace maru::daemon {
 namespace {
 
-std::string NameOfUser(uid_t uid) {
-  const std::optional<Account> account = AccountByUID(uid);
-  return account ? account->name : std::string();
-}
-
 bool MayUse(const Eyes& eyes, const ShareSettings& share) {
   // Homes are judged by their own rights alone.
   if (eyes.identity.unrestricted || share.name == kHomesShare) return true;
@@ -28,63 +23,49 @@ Eyes Blind() {
 
 }  // namespace
 
+std::optional<Identity> IdentityNamed(const std::string& user) {
+  Identity identity;
+  if (user.find('\0') != std::string::npos || !IdentityOfUser(user, identity)) return std::nullopt;
+  return identity;
+}
+
 Eyes EyesOf(const Identity& caller, const std::vector<std::string>& users) {
-  Eyes eyes{caller, {}};
   if (users.empty()) {
-    if (caller.unrestricted) return eyes;
-    eyes.user_name = NameOfUser(caller.uid);
-    eyes.blind = eyes.user_name.empty();
-    return eyes;
+    if (caller.unrestricted) return {caller, {}};
+    const std::optional<Account> account = AccountByUID(caller.uid);
+    return account ? Eyes{caller, account->name} : Blind();
   }
   const std::string& user = users[0];
-  for (const std::string& other : users) {
-    if (other != user) return Blind();
-  }
-  Identity named;
-  if (user.empty() || user.find('\0') != std::string::npos || !IdentityOfUser(user, named)) {
-    return Blind();
-  }
-  if (caller.unrestricted) {
-    eyes.identity = named;
-  } else if (named.uid != caller.uid) {
-    return Blind();
-  }
-  eyes.user_name = user;
-  return eyes;
+  const std::optional<Identity> named = IdentityNamed(user);
+  if (!named || std::ranges::count(users, user) != std::ssize(users)) return Blind();
+  if (caller.unrestricted) return {*named, user};
+  return named->uid == caller.uid ? Eyes{caller, user} : Blind();
 }
 
 std::vector<std::string> Scope::Ids() const {
   std::vector<std::string> ids;
-  for (const Place& place : places) ids.push_back(place.id);
+  for (const ShareIndex& index : indices) ids.push_back(index.id);
   return ids;
 }
 
-std::optional<std::string> ShareOfIndex(const std::string& id) {
-  const bool sound =
-      !id.empty() && id != "." && id != ".." && std::none_of(id.begin(), id.end(), [](char c) {
-        return c == '/' || static_cast<unsigned char>(c) < 0x20 || c == 0x7f;
-      });
+void CheckIndexId(const std::string& id) {
+  const bool sound = !id.empty() && id != "." && id != ".." && std::ranges::none_of(id, [](char c) {
+    return c == '/' || static_cast<unsigned char>(c) < 0x20 || c == 0x7f;
+  });
   if (!sound) throw BadParameter("Malformed index id " + Quoted(id));
-  if (!id.starts_with(kIndexPrefix)) return std::nullopt;
-  return id.substr(kIndexPrefix.size());
 }
 
 Scope ScopeOf(const Core& core, Eyes eyes, const std::vector<std::string>& ids) {
   Scope scope{std::move(eyes), {}, core.shares()};
   for (const std::string& id : ids) {
-    const std::optional<std::string> name = ShareOfIndex(id);
-    if (!name || scope.eyes.blind) continue;
-    const ShareSettings* share = scope.table->Find(*name);
-    const bool known = std::any_of(scope.places.begin(), scope.places.end(),
-                                   [&](const Place& place) { return place.id == id; });
-    if (!share || known || !core.indices.Has(id) || !MayUse(scope.eyes, *share)) continue;
-    scope.places.push_back({id, share});
+    CheckIndexId(id);
+    const ShareSettings* share = scope.table->Find(std::string(ShareOfIndexId(id)));
+    if (!share || scope.eyes.blind) continue;
+    const bool known = std::ranges::count(scope.indices, id, &ShareIndex::id) > 0;
+    if (known || !core.indices.Has(id) || !MayUse(scope.eyes, *share)) continue;
+    scope.indices.push_back({id, share});
   }
   return scope;
-}
-
-Scope WholeScope(const Core& core, Eyes eyes) {
-  return ScopeOf(core, std::move(eyes), core.indices.Ids());
 }
 
 std::unique_ptr<index::Reader> OpenReader(const Core& core, const Scope& scope) {
@@ -93,8 +74,8 @@ std::unique_ptr<index::Reader> OpenReader(const Core& core, const Scope& scope) 
   return reader;
 }
 
-std::string FullPath(const Place& place, const std::string& path) {
-  return place.share->VolumePath() + path;
+std::string FullPath(const ShareIndex& index, const std::string& path) {
+  return index.share->VolumePath() + path;
 }
 
 }  // namespace maru::daemon

@@ -14,6 +14,9 @@ constexpr std::size_t kMaxIndices = 1024;
 /// Bytes of an index id.
 constexpr std::size_t kMaxIndexId = 300;
 
+/// None when there is no such account.
+std::optional<Identity> IdentityNamed(const std::string& user);
+
 /// An identity with the name that share settings know it by.
 struct Eyes {
   Identity identity;
@@ -28,36 +31,33 @@ struct Eyes {
 /// account sees nothing either.
 Eyes EyesOf(const Identity& caller, const std::vector<std::string>& users);
 
-/// One admitted index.
-struct Place {
+/// One admitted index, and whose it is.
+struct ShareIndex {
   std::string id;
   const ShareSettings* share;
 };
 
 struct Scope {
   Eyes eyes;
-  std::vector<Place> places;
-  /// Owns what the places point to.
+  std::vector<ShareIndex> indices;
+  /// Owns the shares.
   std::shared_ptr<const ShareTable> table;
 
   std::vector<std::string> Ids() const;
 };
 
-/// The index ids of "indice" that exist and whose share the eyes may use; the others are left out.
-/// A malformed id throws Error (120).
+/// Of the index ids those that exist and whose share the eyes may use. A malformed one throws Error
+/// (120).
 Scope ScopeOf(const Core& core, Eyes eyes, const std::vector<std::string>& ids);
 
-/// All of them.
-Scope WholeScope(const Core& core, Eyes eyes);
+/// Throws Error (120) for what can be no index id at all: empty, with a slash or a control
+/// character, "." or "..".
+void CheckIndexId(const std::string& id);
 
-/// "photo" of "fileindex_photo"; none for another form. Throws Error (120) for what can be no name
-/// at all: empty, with a slash or a control character, "." or "..".
-std::optional<std::string> ShareOfIndex(const std::string& id);
-
-/// A reader over the scope's places, in their order, with its eyes.
+/// A reader over the scope's indices, in their order, with its eyes.
 std::unique_ptr<index::Reader> OpenReader(const Core& core, const Scope& scope);
 
 /// The volume path of a path within the share.
-std::string FullPath(const Place& place, const std::string& path);
+std::string FullPath(const ShareIndex& index, const std::string& path);
 
 }  // namespace maru::daemon

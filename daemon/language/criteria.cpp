@@ -1,14 +1,17 @@
 #include "daemon/language/criteria.h"
 
+#include <algorithm>
 #include <vector>
 
 #include "daemon/core/arguments.h"
+#include "daemon/core/scope.h"
 #include "daemon/language/keyword.h"
+#include "daemon/language/query_tree.h"
 #include "daemon/language/range.h"
 #include "index/tokenizer.h"
-#include "system/rights.h"
 #include "system/share_table.h"
 #include "system/text.h"
+#include "system/volume_path.h"
 
 namespace maru::daemon {
 namespace {
@@ -27,50 +30,26 @@ maruseeker::Error BadValue(const Field& field, const std::string& value, const s
 /// The alternatives of a value, each trimmed and out of its quotation marks.
 std::vector<std::string> Alternatives(std::string_view text, bool commas) {
   std::vector<std::string> alternatives;
-  std::size_t at = 0;
-  while (at <= text.size()) {
-    std::size_t end = text.find(" OR ", at);
-    std::size_t next = end == std::string_view::npos ? end : end + 4;
-    const std::size_t comma = commas ? text.find(',', at) : std::string_view::npos;
-    if (comma < end) {
-      end = comma;
-      next = comma + 1;
-    }
-    std::string_view item =
-        Trimmed(text.substr(at, end == std::string_view::npos ? end : end - at));
+  for (bool more = true; more;) {
+    const std::size_t comma = commas ? text.find(',') : std::string_view::npos;
+    const std::size_t end = std::min(text.find(" OR "), comma);
+    std::string_view item = Trimmed(text.substr(0, end));
     if (item.size() >= 2 && item.front() == '"' && item.back() == '"') {
       item = item.substr(1, item.size() - 2);
     }
     if (!item.empty()) alternatives.emplace_back(item);
-    if (next == std::string_view::npos) break;
-    at = next;
+    more = end != std::string_view::npos;
+    if (more) text.remove_prefix(end + (end == comma ? 1 : 4));
   }
   return alternatives;
-}
-
-Query ValueQuery(std::string_view field, std::string text) {
-  Query query;
-  query.kind = Query::Kind::kValue;
-  query.field = field;
-  query.text = std::move(text);
-  return query;
-}
-
-Query AnyOf(std::vector<Query> queries) {
-  if (queries.size() == 1) return std::move(queries[0]);
-  Query any;
-  any.kind = queries.empty() ? Query::Kind::kNothing : Query::Kind::kOr;
-  any.parts = std::move(queries);
-  return any;
 }
 
 /// The form in which the index holds an exact value; empty when no document can have it.
 std::string StoredValue(const Field& field, const std::string& value) {
   if (field.name == index::kOwner) {
     if (value.find_first_not_of("0123456789") == std::string::npos) return value;
-    Identity owner;
-    if (value.find('\0') != std::string::npos || !IdentityOfUser(value, owner)) return {};
-    return std::to_string(owner.uid);
+    const std::optional<Identity> owner = IdentityNamed(value);
+    return owner ? std::to_string(owner->uid) : "";
   }
   if (field.name == index::kExtension && value[0] == '.') return index::Fold(value.substr(1));
   return index::Fold(value);
@@ -83,9 +62,9 @@ Query ExactCriterion(const Field& field, const std::string& value) {
   for (const std::string& alternative : alternatives) {
     if (alternative.size() > kMaxValue) throw BadValue(field, alternative, "is too long");
     std::string stored = StoredValue(field, alternative);
-    if (!stored.empty()) any.push_back(ValueQuery(field.name, std::move(stored)));
+    if (!stored.empty()) any.push_back(Equals(field.name, std::move(stored)));
   }
-  return AnyOf(std::move(any));
+  return Join(Query::Kind::kOr, std::move(any));
 }
 
 Query RangeCriterion(const Field& field, const std::string& value) {
@@ -116,23 +95,6 @@ Query PathCriterion(const Field& field, const std::string& value) {
 
 }  // namespace
 
-std::optional<std::string> VolumePathOf(std::string_view path) {
-  const std::string volume = kVolume;
-  if (!path.starts_with('/') || path.size() > 4096 || path.find('\0') != std::string_view::npos) {
-    return std::nullopt;
-  }
-  std::string clean;
-  while (!path.empty()) {
-    path.remove_prefix(1);
-    const std::string_view component = path.substr(0, path.find('/'));
-    path.remove_prefix(component.size());
-    if (component == "." || component == "..") return std::nullopt;
-    if (!component.empty()) clean.append("/").append(component);
-  }
-  if (clean == volume || clean.starts_with(volume + "/")) return clean;
-  return volume + clean;
-}
-
 std::optional<Query> ParseKinds(const std::string& kinds) {
   std::vector<Query> any;
   for (const std::string& alternative : Alternatives(kinds, true)) {
@@ -140,10 +102,10 @@ std::optional<Query> ParseKinds(const std::string& kinds) {
     if (kind == "all") return std::nullopt;
     if (!index::IsKind(kind)) throw BadParameter("Unknown file type " + Quoted(alternative));
     if (any.size() >= kMaxAlternatives) throw BadParameter("Too many file types");
-    any.push_back(ValueQuery(index::kKind, kind));
+    any.push_back(Equals(index::kKind, kind));
   }
   if (any.empty()) return std::nullopt;
-  return AnyOf(std::move(any));
+  return Join(Query::Kind::kOr, std::move(any));
 }
 
 std::optional<Query> ParseCriterion(const Field& field, const std::string& value) {
@@ -156,7 +118,7 @@ std::optional<Query> ParseCriterion(const Field& field, const std::string& value
       return field.name == index::kKind ? ParseKinds(text) : ExactCriterion(field, text);
     case FieldType::kFlag:
       if (text != "true" && text != "false") throw BadValue(field, value, "is not true or false");
-      return ValueQuery(field.name, text == "true" ? "1" : "0");
+      return Equals(field.name, text == "true" ? "1" : "0");
     case FieldType::kPath:
       return PathCriterion(field, value);
     default:

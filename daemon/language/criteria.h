@@ -9,7 +9,7 @@
 
 namespace maru::daemon {
 
-constexpr std::size_t kMaxCriteria = 32;
+constexpr std::size_t kMaxFieldName = 64;
 /// Alternatives joined by " OR " in one value.
 constexpr std::size_t kMaxAlternatives = 64;
 
@@ -20,9 +20,5 @@ std::optional<index::Query> ParseCriterion(const index::Field& field, const std:
 /// Kinds of files separated by commas or " OR "; none for "", blanks and "all". Throws Error (120)
 /// for an unknown kind.
 std::optional<index::Query> ParseKinds(const std::string& kinds);
-
-/// "/volume1/photo/trip" of that or of "/photo/trip", without a slash at the end; "/volume1" for
-/// the folder of all shares. None unless it is absolute and free of "." and "..".
-std::optional<std::string> VolumePathOf(std::string_view path);
 
 }  // namespace maru::daemon

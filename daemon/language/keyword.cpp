@@ -1,8 +1,10 @@
 #include "daemon/language/keyword.h"
 
+#include <algorithm>
 #include <string>
 
 #include "daemon/core/arguments.h"
+#include "daemon/language/query_tree.h"
 #include "index/tokenizer.h"
 
 namespace maru::daemon {
@@ -10,142 +12,138 @@ namespace {
 
 using index::Query;
 
-enum class Mark { kWord, kPrefix, kPhrase, kMinus, kOpen, kClose, kOr, kAnd };
+// A text becomes tokens; those that mean nothing where they stand are dropped or become words; what
+// is left always parses:
+//   list    = { group }                    side by side
+//   group   = operand { tighter operand }  joined by the operator that binds tighter
+//   operand = [ "-" ] ( word | prefix | phrase | "(" list ")" )
 
-struct Piece {
-  Mark mark;
+/// In this order, so that comparisons tell what begins and what ends an operand.
+enum class TokenKind { kWord, kPrefix, kPhrase, kMinus, kOpen, kClose, kOr, kAnd };
+
+struct Token {
+  TokenKind kind;
   std::string_view text;
 };
 
+constexpr std::string_view kBlanks(" \t\n\v\f\r\0", 7);
+constexpr std::string_view kWordEnds(" \t\n\v\f\r\0\"()", 10);
+
 bool IsBlank(char c) {
-  return c == ' ' || (c >= '\t' && c <= '\r') || c == '\0';
+  return kBlanks.find(c) != std::string_view::npos;
 }
 
-bool EndsWord(char c) {
-  return IsBlank(c) || c == '"' || c == '(' || c == ')';
+/// Whether a minus stands here that excludes ("-boat"), not one that joins ("well-known").
+bool Excludes(std::string_view text, std::size_t at) {
+  const bool begins = at == 0 || IsBlank(text[at - 1]) || text[at - 1] == '(';
+  return begins && text[at] == '-' && at + 1 < text.size() && !IsBlank(text[at + 1]) &&
+         text[at + 1] != '-';
 }
 
-std::vector<Piece> Split(std::string_view text) {
-  std::vector<Piece> pieces;
-  std::size_t at = 0;
-  while (at < text.size()) {
-    const char c = text[at];
-    const bool begins = at == 0 || IsBlank(text[at - 1]) || text[at - 1] == '(';
-    if (IsBlank(c)) {
-      ++at;
-    } else if (c == '(' || c == ')') {
-      pieces.push_back({c == '(' ? Mark::kOpen : Mark::kClose, {}});
-      ++at;
-    } else if (c == '"') {
-      const std::size_t end = text.find('"', at + 1);
-      if (end != std::string_view::npos) {
-        pieces.push_back({Mark::kPhrase, text.substr(at + 1, end - at - 1)});
-      }
-      at = end == std::string_view::npos ? at + 1 : end + 1;
-    } else if (c == '-' && begins && at + 1 < text.size() && !IsBlank(text[at + 1]) &&
-               text[at + 1] != '-') {
-      pieces.push_back({Mark::kMinus, {}});
-      ++at;
+TokenKind KindOf(std::string_view word) {
+  if (word == "OR" || word == "|") return TokenKind::kOr;
+  if (word == "AND") return TokenKind::kAnd;
+  return word.size() > 1 && word.back() == '*' ? TokenKind::kPrefix : TokenKind::kWord;
+}
+
+std::vector<Token> Tokenize(std::string_view text) {
+  std::vector<Token> tokens;
+  for (std::size_t at = 0, end; at < text.size(); at = end) {
+    end = at + 1;
+    if (IsBlank(text[at])) continue;
+    if (text[at] == '(' || text[at] == ')') {
+      tokens.push_back({text[at] == '(' ? TokenKind::kOpen : TokenKind::kClose, {}});
+    } else if (text[at] == '"') {
+      const std::size_t close = text.find('"', end);
+      if (close == std::string_view::npos) continue;
+      tokens.push_back({TokenKind::kPhrase, text.substr(end, close - end)});
+      end = close + 1;
+    } else if (Excludes(text, at)) {
+      tokens.push_back({TokenKind::kMinus, {}});
     } else {
-      std::size_t end = at;
-      while (end < text.size() && !EndsWord(text[end])) ++end;
+      end = std::min(text.find_first_of(kWordEnds, end), text.size());
       const std::string_view word = text.substr(at, end - at);
-      const bool prefix = word.size() > 1 && word.back() == '*';
-      pieces.push_back({word == "OR" || word == "|" ? Mark::kOr
-                        : word == "AND"             ? Mark::kAnd
-                        : prefix                    ? Mark::kPrefix
-                                                    : Mark::kWord,
-                        word});
-      at = end;
+      tokens.push_back({KindOf(word), word});
     }
   }
-  return pieces;
+  return tokens;
 }
 
 /// Drops parentheses that have no partner or stand too deep.
-std::vector<Piece> Paired(const std::vector<Piece>& pieces) {
-  std::vector<bool> keep(pieces.size(), true);
+std::vector<Token> Paired(const std::vector<Token>& tokens) {
+  std::vector<bool> keep(tokens.size(), true);
   std::vector<std::size_t> open;
-  for (std::size_t i = 0; i < pieces.size(); ++i) {
-    if (pieces[i].mark == Mark::kOpen) {
+  for (std::size_t i = 0; i < tokens.size(); ++i) {
+    if (tokens[i].kind == TokenKind::kOpen) {
       keep[i] = false;
       open.push_back(i);
-    } else if (pieces[i].mark == Mark::kClose) {
+    } else if (tokens[i].kind == TokenKind::kClose) {
       keep[i] = !open.empty() && open.size() <= kMaxKeywordDepth;
       if (keep[i]) keep[open.back()] = true;
       if (!open.empty()) open.pop_back();
     }
   }
-  std::vector<Piece> paired;
-  for (std::size_t i = 0; i < pieces.size(); ++i) {
-    if (keep[i]) paired.push_back(pieces[i]);
+  std::vector<Token> paired;
+  for (std::size_t i = 0; i < tokens.size(); ++i) {
+    if (keep[i]) paired.push_back(tokens[i]);
   }
   return paired;
 }
 
-bool BeginsOperand(const Piece& piece) {
-  return piece.mark <= Mark::kOpen;
+bool BeginsOperand(const Token& token) {
+  return token.kind <= TokenKind::kOpen;
 }
 
-bool EndsOperand(const Piece& piece) {
-  return piece.mark <= Mark::kPhrase || piece.mark == Mark::kClose;
+bool EndsOperand(const Token& token) {
+  return token.kind <= TokenKind::kPhrase || token.kind == TokenKind::kClose;
 }
 
 /// Operators without an operand on each side become words, a minus without one goes.
-std::vector<Piece> WithOperands(const std::vector<Piece>& pieces) {
-  std::vector<Piece> sound;
-  for (std::size_t i = 0; i < pieces.size(); ++i) {
-    Piece piece = pieces[i];
-    const bool followed = i + 1 < pieces.size() && BeginsOperand(pieces[i + 1]);
-    const bool minus_follows = followed && pieces[i + 1].mark == Mark::kMinus;
-    if (piece.mark == Mark::kMinus && (!followed || minus_follows)) continue;
-    if ((piece.mark == Mark::kOr || piece.mark == Mark::kAnd) &&
+std::vector<Token> WithOperands(const std::vector<Token>& tokens) {
+  std::vector<Token> sound;
+  for (std::size_t i = 0; i < tokens.size(); ++i) {
+    Token token = tokens[i];
+    const bool followed = i + 1 < tokens.size() && BeginsOperand(tokens[i + 1]);
+    const bool minus_follows = followed && tokens[i + 1].kind == TokenKind::kMinus;
+    if (token.kind == TokenKind::kMinus && (!followed || minus_follows)) continue;
+    if ((token.kind == TokenKind::kOr || token.kind == TokenKind::kAnd) &&
         (!followed || sound.empty() || !EndsOperand(sound.back()))) {
-      piece.mark = Mark::kWord;
+      token.kind = TokenKind::kWord;
     }
-    sound.push_back(piece);
+    sound.push_back(token);
   }
   return sound;
 }
 
-Query Join(Query::Kind kind, std::vector<Query> parts) {
-  if (parts.size() == 1) return std::move(parts[0]);
-  Query query;
-  query.kind = kind;
-  query.parts = std::move(parts);
-  return query;
-}
-
-Query Without(Query wanted, std::vector<Query> unwanted) {
-  unwanted.insert(unwanted.begin(), std::move(wanted));
+/// What is wanted, joined, or everything, without what is unwanted.
+Query Without(Query::Kind kind, std::vector<Query> wanted, std::vector<Query> unwanted) {
+  unwanted.insert(unwanted.begin(), wanted.empty() ? Query{} : Join(kind, std::move(wanted)));
   return Join(Query::Kind::kAndNot, std::move(unwanted));
 }
 
 class Parser {
  public:
-  Parser(std::vector<Piece> pieces, const KeywordOptions& options)
-      : pieces_(std::move(pieces)), options_(options) {}
+  Parser(std::vector<Token> tokens, const KeywordOptions& options)
+      : tokens_(std::move(tokens)), options_(options) {}
 
   /// Groups side by side, up to a closing parenthesis or the end; none without a word.
   std::optional<Query> List() {
     std::vector<Query> wanted, unwanted;
-    while (at_ < pieces_.size() && pieces_[at_].mark != Mark::kClose) {
+    while (at_ < tokens_.size() && tokens_[at_].kind != TokenKind::kClose) {
       if (!Take(SideBySide())) Group(wanted, unwanted);
     }
     if (wanted.empty() && unwanted.empty()) return std::nullopt;
-    Query all = wanted.empty() ? Query{}
-                               : Join(options_.any_word ? Query::Kind::kOr : Query::Kind::kAnd,
-                                      std::move(wanted));
-    return Without(std::move(all), std::move(unwanted));
+    return Without(options_.any_word ? Query::Kind::kOr : Query::Kind::kAnd, std::move(wanted),
+                   std::move(unwanted));
   }
 
  private:
   /// The operator that says what standing side by side says; the other one binds tighter.
-  Mark SideBySide() const { return options_.any_word ? Mark::kOr : Mark::kAnd; }
-  Mark Tighter() const { return options_.any_word ? Mark::kAnd : Mark::kOr; }
+  TokenKind SideBySide() const { return options_.any_word ? TokenKind::kOr : TokenKind::kAnd; }
+  TokenKind Tighter() const { return options_.any_word ? TokenKind::kAnd : TokenKind::kOr; }
 
-  bool Take(Mark mark) {
-    if (at_ >= pieces_.size() || pieces_[at_].mark != mark) return false;
+  bool Take(TokenKind kind) {
+    if (at_ >= tokens_.size() || tokens_[at_].kind != kind) return false;
     ++at_;
     return true;
   }
@@ -154,7 +152,7 @@ class Parser {
   void Group(std::vector<Query>& wanted, std::vector<Query>& unwanted) {
     std::vector<Query> with, without;
     do {
-      const bool negated = Take(Mark::kMinus);
+      const bool negated = Take(TokenKind::kMinus);
       std::optional<Query> operand = Operand();
       if (operand) (negated ? without : with).push_back(std::move(*operand));
     } while (Take(Tighter()));
@@ -162,48 +160,45 @@ class Parser {
       unwanted.push_back(std::move(without[0]));
     } else if (options_.any_word) {
       if (with.empty() && without.empty()) return;
-      Query all = with.empty() ? Query{} : Join(Query::Kind::kAnd, std::move(with));
-      wanted.push_back(Without(std::move(all), std::move(without)));
+      wanted.push_back(Without(Query::Kind::kAnd, std::move(with), std::move(without)));
     } else {
-      for (Query& query : without) with.push_back(Without(Query{}, {std::move(query)}));
+      for (Query& query : without) with.push_back(Without(Query::Kind::kAnd, {}, {query}));
       if (!with.empty()) wanted.push_back(Join(Query::Kind::kOr, std::move(with)));
     }
   }
 
   std::optional<Query> Operand() {
-    if (at_ >= pieces_.size() || pieces_[at_].mark == Mark::kClose) return std::nullopt;
-    const Piece piece = pieces_[at_++];
-    if (piece.mark != Mark::kOpen) return Leaf(piece);
+    if (at_ >= tokens_.size() || tokens_[at_].kind == TokenKind::kClose) return std::nullopt;
+    const Token token = tokens_[at_++];
+    if (token.kind != TokenKind::kOpen) return Leaf(token);
     std::optional<Query> inside = List();
-    Take(Mark::kClose);
+    Take(TokenKind::kClose);
     return inside;
   }
 
-  std::optional<Query> Leaf(const Piece& piece) {
-    std::vector<std::string> words = index::WordsOf(piece.text);
+  std::optional<Query> Leaf(const Token& token) {
+    std::vector<std::string> words = index::WordsOf(token.text);
     if (words.empty()) return std::nullopt;
     words_ += words.size();
     if (++terms_ > kMaxKeywordTerms || words_ > kMaxKeywordWords) {
       throw BadParameter("The keyword has more than " + std::to_string(kMaxKeywordTerms) +
                          " words");
     }
-    if (piece.mark != Mark::kPrefix) {
-      const Query::Kind kind = words.size() == 1 ? Query::Kind::kWord : Query::Kind::kPhrase;
-      return Words(kind, std::move(words), piece.mark == Mark::kPhrase);
-    }
+    const bool exact = token.kind == TokenKind::kPhrase;
+    if (token.kind != TokenKind::kPrefix) return Words(std::move(words), exact);
     // "annual_rep*": what stands before its last word, and words that begin like that one.
-    const std::string last = std::move(words.back());
+    std::vector<Query> both{Node(Query::Kind::kPrefix, {std::move(words.back())}, false)};
     words.pop_back();
-    Query prefix = Words(Query::Kind::kPrefix, {last}, false);
-    if (words.empty()) return prefix;
-    const Query::Kind kind = words.size() == 1 ? Query::Kind::kWord : Query::Kind::kPhrase;
-    std::vector<Query> both;
-    both.push_back(Words(kind, std::move(words), true));
-    both.push_back(std::move(prefix));
+    if (!words.empty()) both.insert(both.begin(), Words(std::move(words), true));
     return Join(Query::Kind::kAnd, std::move(both));
   }
 
-  Query Words(Query::Kind kind, std::vector<std::string> words, bool exact) const {
+  Query Words(std::vector<std::string> words, bool exact) const {
+    const Query::Kind kind = words.size() == 1 ? Query::Kind::kWord : Query::Kind::kPhrase;
+    return Node(kind, std::move(words), exact);
+  }
+
+  Query Node(Query::Kind kind, std::vector<std::string> words, bool exact) const {
     Query query;
     query.kind = options_.fields.empty() ? Query::Kind::kNothing : kind;
     query.words = std::move(words);
@@ -212,7 +207,7 @@ class Parser {
     return query;
   }
 
-  std::vector<Piece> pieces_;
+  std::vector<Token> tokens_;
   const KeywordOptions& options_;
   std::size_t at_ = 0;
   unsigned terms_ = 0;
@@ -225,14 +220,11 @@ std::optional<Query> ParseKeyword(std::string_view text, const KeywordOptions& o
   if (text.size() > kMaxKeywordBytes) {
     throw BadParameter("The keyword is longer than " + std::to_string(kMaxKeywordBytes) + " bytes");
   }
-  const std::vector<Piece> pieces = Split(text);
-  if (pieces.empty() && text.find('"') == std::string_view::npos) return std::nullopt;
-  Parser parser(WithOperands(Paired(pieces)), options);
+  const std::vector<Token> tokens = Tokenize(text);
+  if (tokens.empty() && text.find('"') == std::string_view::npos) return std::nullopt;
+  Parser parser(WithOperands(Paired(tokens)), options);
   std::optional<Query> query = parser.List();
-  if (query) return query;
-  Query nothing;
-  nothing.kind = Query::Kind::kNothing;
-  return nothing;
+  return query ? std::move(query) : Nothing();
 }
 
 }  // namespace maru::daemon

@@ -36,19 +36,11 @@ std::optional<Range> ParseRange(std::string_view text, EndParser parse) {
   const std::string_view first = Trimmed(text.substr(0, dots));
   const std::string_view last = Trimmed(text.substr(dots + 2));
   if (first.empty() && last.empty()) return std::nullopt;
-  Range range{-kInfinity, kInfinity};
-  if (!first.empty()) {
-    const std::optional<Range> end = parse(first);
-    if (!end) return std::nullopt;
-    range.low = end->low;
-  }
-  if (!last.empty()) {
-    const std::optional<Range> end = parse(last);
-    if (!end) return std::nullopt;
-    range.high = end->high;
-  }
-  if (range.low > range.high) return std::nullopt;
-  return range;
+  const std::optional<Range> open(Range{-kInfinity, kInfinity});
+  const std::optional<Range> low = first.empty() ? open : parse(first);
+  const std::optional<Range> high = last.empty() ? open : parse(last);
+  if (!low || !high || low->low > high->high) return std::nullopt;
+  return Range{low->low, high->high};
 }
 
 std::optional<Range> ParseSize(std::string_view text) {
@@ -57,19 +49,15 @@ std::optional<Range> ParseSize(std::string_view text) {
   const auto [behind, error] =
       std::from_chars(text.data(), text.data() + text.size(), number, std::chars_format::fixed);
   if (error != std::errc()) return std::nullopt;
-  std::string unit;
-  for (const char c : Trimmed(text.substr(static_cast<std::size_t>(behind - text.data())))) {
-    unit += c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c;
+  const std::string_view unit = Trimmed({behind, text.data() + text.size()});
+  if (unit.empty() || SameWord(unit, "b")) return Range{number, number};
+  const std::size_t power = std::string_view("kKmMgGtT").find(unit[0]);
+  const std::string_view rest = unit.substr(1);
+  if (power == std::string_view::npos ||
+      !(rest.empty() || SameWord(rest, "b") || SameWord(rest, "ib"))) {
+    return std::nullopt;
   }
-  if (unit == "b") unit.clear();
-  if (!unit.empty()) {
-    const std::size_t power = std::string_view("kmgt").find(unit[0]);
-    const std::string_view rest = std::string_view(unit).substr(1);
-    if (power == std::string_view::npos || !(rest.empty() || rest == "b" || rest == "ib")) {
-      return std::nullopt;
-    }
-    number *= std::pow(1024.0, static_cast<double>(power + 1));
-  }
+  number *= std::pow(1024.0, static_cast<double>(power / 2 + 1));
   return Range{number, number};
 }
 
@@ -121,7 +109,27 @@ std::optional<Range> ParseEpoch(std::string_view text) {
   return Range{static_cast<double>(seconds), static_cast<double>(seconds)};
 }
 
-/// The hours, minutes and seconds of a moment. `step` becomes what follows it at once.
+/// The year and, as far as they are there, month and day. `step` becomes the last that is.
+bool TakeDate(std::string_view& text, std::tm& time, int std::tm::*& step) {
+  const std::optional<int> year = TakeNumber(text, 4, 4);
+  if (!year) return false;
+  time.tm_year = *year - 1900;
+  time.tm_mday = 1;
+  step = &std::tm::tm_year;
+  if (!TakeMark(text, "-")) return true;
+  const std::optional<int> month = TakeNumber(text, 1, 2);
+  if (!month || *month < 1 || *month > 12) return false;
+  time.tm_mon = *month - 1;
+  step = &std::tm::tm_mon;
+  if (!TakeMark(text, "-")) return true;
+  const std::optional<int> day = TakeNumber(text, 1, 2);
+  if (!day || *day < 1) return false;
+  time.tm_mday = *day;
+  step = &std::tm::tm_mday;
+  return true;
+}
+
+/// Hours, minutes and, if they are there, seconds. `step` becomes the last that is.
 bool TakeClock(std::string_view& text, std::tm& time, int std::tm::*& step) {
   const std::optional<int> hour = TakeNumber(text, 2, 2);
   if (!hour || !TakeMark(text, ":")) return false;
@@ -149,26 +157,12 @@ bool IsDay(const std::tm& time) {
 std::optional<Range> ParseTime(std::string_view text) {
   if (text.starts_with('@')) return ParseEpoch(text.substr(1));
   std::tm time{};
-  time.tm_mday = 1;
-  int std::tm::*step = &std::tm::tm_year;
-  const std::optional<int> year = TakeNumber(text, 4, 4);
-  if (!year) return std::nullopt;
-  time.tm_year = *year - 1900;
+  int std::tm::*step = nullptr;
   std::optional<int> zone;
-  if (TakeMark(text, "-")) {
-    const std::optional<int> month = TakeNumber(text, 1, 2);
-    if (!month || *month < 1 || *month > 12) return std::nullopt;
-    time.tm_mon = *month - 1;
-    step = &std::tm::tm_mon;
-    if (TakeMark(text, "-")) {
-      const std::optional<int> day = TakeNumber(text, 1, 2);
-      if (!day || *day < 1) return std::nullopt;
-      time.tm_mday = *day;
-      step = &std::tm::tm_mday;
-      if (TakeMark(text, "Tt ") && !(TakeClock(text, time, step) && TakeZone(text, zone))) {
-        return std::nullopt;
-      }
-    }
+  if (!TakeDate(text, time, step)) return std::nullopt;
+  if (step == &std::tm::tm_mday && TakeMark(text, "Tt ") &&
+      !(TakeClock(text, time, step) && TakeZone(text, zone))) {
+    return std::nullopt;
   }
   if (!text.empty() || !IsDay(time)) return std::nullopt;
   std::tm next = time;

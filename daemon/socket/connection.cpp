@@ -1,5 +1,6 @@
 #include "daemon/socket/connection.h"
 
+#include <poll.h>
 #include <sys/socket.h>
 
 #include <cerrno>
@@ -84,6 +85,16 @@ bool Connection::Flush() {
   output_ = {};
   sent_ = 0;
   return true;
+}
+
+bool Connection::HasInput() const {
+  pollfd now{Socket(), POLLIN, 0};
+  return poll(&now, 1, 0) > 0;
+}
+
+bool Connection::HasHungUp() const {
+  pollfd now{Socket(), 0, 0};
+  return poll(&now, 1, 0) > 0;
 }
 
 }  // namespace maru::daemon

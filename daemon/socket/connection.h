@@ -47,6 +47,11 @@ class Connection {
   bool AllSent() const { return sent_ == output_.size(); }
   std::size_t Unsent() const { return output_.size() - sent_; }
 
+  /// Whether there is something to be received.
+  bool HasInput() const;
+  /// Whether the client is gone altogether. (One that has merely said all is not.)
+  bool HasHungUp() const;
+
   State state = State::kReading;
   /// Close when the reply is out.
   bool last = false;

@@ -8,18 +8,16 @@
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
+#include <filesystem>
 #include <stdexcept>
-#include <system_error>
+
+#include "system/throw_errno.h"
 
 namespace maru::daemon {
 namespace {
 
 constexpr int kBacklog = 512;
 constexpr int kWanted = kACLWrite | kACLExecute;
-
-std::system_error Failed(const std::string& doing) {
-  return std::system_error(errno, std::generic_category(), doing);
-}
 
 sockaddr_un AddressOf(const std::string& path) {
   sockaddr_un address{};
@@ -33,7 +31,7 @@ sockaddr_un AddressOf(const std::string& path) {
 
 UniqueFd NewSocket() {
   UniqueFd made(socket(AF_UNIX, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0));
-  if (!made) throw Failed("Cannot make a socket");
+  if (!made) ThrowErrno("Cannot make a socket");
   return made;
 }
 
@@ -49,46 +47,48 @@ void RefuseWhenServed(const std::string& path) {
       errno == EAGAIN) {
     throw std::runtime_error("Another daemon serves " + path);
   }
-  if (errno != ECONNREFUSED && errno != ENOENT) throw Failed("Cannot tell who serves " + path);
-}
-
-std::string FolderOf(const std::string& path) {
-  const std::size_t slash = path.rfind('/');
-  if (slash == std::string::npos) return ".";
-  return slash == 0 ? "/" : path.substr(0, slash);
+  if (errno != ECONNREFUSED && errno != ENOENT) ThrowErrno("Cannot tell who serves " + path);
 }
 
 /// By the kernel's rules, which know no service.
-bool MayWrite(Identity who, const std::string& folder) {
+bool MayWrite(Identity who, const std::filesystem::path& folder) {
   who.unrestricted = who.uid == 0;
   FileRights rights;
-  if (!ReadFileRights(AT_FDCWD, (folder + "/.").c_str(), rights)) return false;
-  return (RightsOf(who, rights) & kWanted) == kWanted;
+  return ReadFileRights(AT_FDCWD, (folder / ".").c_str(), rights) &&
+         (RightsOf(who, rights) & kWanted) == kWanted;
+}
+
+/// A folder of the owner's where only root can make one, so nobody else's can be in its place.
+void MakeFolder(const std::string& folder, const Identity& owner) {
+  if (mkdir(folder.c_str(), 0755) != 0 && errno != EEXIST) ThrowErrno("Cannot make " + folder);
+  const UniqueFd opened(open(folder.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+  if (!opened || fchown(opened.Get(), owner.uid, static_cast<gid_t>(-1)) != 0 ||
+      fchmod(opened.Get(), 0755) != 0) {
+    ThrowErrno("Cannot prepare " + folder);
+  }
+}
+
+void Link(const std::string& path) {
+  const std::string fresh = path + ".new";
+  unlink(fresh.c_str());
+  if (symlink("maruelasticd/socket", fresh.c_str()) != 0 ||
+      rename(fresh.c_str(), path.c_str()) != 0) {
+    ThrowErrno("Cannot link " + path);
+  }
 }
 
 }  // namespace
 
 Listener::Listener(const std::string& path, const Identity& owner) : place_(path) {
   RefuseWhenServed(path);
-  const std::string folder = FolderOf(path);
-  if (geteuid() != 0 || MayWrite(owner, folder)) {
-    Bind(owner);
-    return;
+  const std::filesystem::path folder = std::filesystem::path(path).parent_path();
+  const bool apart = geteuid() == 0 && !MayWrite(owner, folder);
+  if (apart) {
+    MakeFolder(folder / "maruelasticd", owner);
+    place_ = folder / "maruelasticd/socket";
   }
-  MakeFolder(folder + "/maruelasticd", owner);
-  place_ = folder + "/maruelasticd/socket";
   Bind(owner);
-  Link(path);
-}
-
-/// A folder of the owner's where only root can make one, so nobody else's can be in its place.
-void Listener::MakeFolder(const std::string& folder, const Identity& owner) {
-  if (mkdir(folder.c_str(), 0755) != 0 && errno != EEXIST) throw Failed("Cannot make " + folder);
-  const UniqueFd opened(open(folder.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
-  if (!opened || fchown(opened.Get(), owner.uid, static_cast<gid_t>(-1)) != 0 ||
-      fchmod(opened.Get(), 0755) != 0) {
-    throw Failed("Cannot prepare " + folder);
-  }
+  if (apart) Link(path);
 }
 
 void Listener::Bind(const Identity& owner) {
@@ -100,23 +100,14 @@ void Listener::Bind(const Identity& owner) {
       chmod(fresh.c_str(), 0666) != 0 ||
       (geteuid() == 0 && lchown(fresh.c_str(), owner.uid, static_cast<gid_t>(-1)) != 0) ||
       listen(socket_.Get(), kBacklog) != 0) {
-    throw Failed("Cannot listen on " + fresh);
+    ThrowErrno("Cannot listen on " + fresh);
   }
   struct stat status;
   if (lstat(fresh.c_str(), &status) != 0 || rename(fresh.c_str(), place_.c_str()) != 0) {
-    throw Failed("Cannot listen on " + place_);
+    ThrowErrno("Cannot listen on " + place_);
   }
   device_ = status.st_dev;
   inode_ = status.st_ino;
-}
-
-void Listener::Link(const std::string& path) {
-  const std::string fresh = path + ".new";
-  unlink(fresh.c_str());
-  if (symlink("maruelasticd/socket", fresh.c_str()) != 0 ||
-      rename(fresh.c_str(), path.c_str()) != 0) {
-    throw Failed("Cannot link " + path);
-  }
 }
 
 Listener::~Listener() {

@@ -26,9 +26,7 @@ class Listener {
   int Socket() const { return socket_.Get(); }
 
  private:
-  void MakeFolder(const std::string& folder, const Identity& owner);
   void Bind(const Identity& owner);
-  void Link(const std::string& path);
 
   /// Where the socket itself lies.
   std::string place_;

@@ -7,12 +7,13 @@
 #include <algorithm>
 #include <cerrno>
 #include <exception>
-#include <system_error>
+#include <optional>
 
 #include "common/error.h"
-#include "daemon/socket/peer.h"
+#include "daemon/socket/peer_credentials.h"
 #include "system/json.h"
 #include "system/log.h"
+#include "system/throw_errno.h"
 
 namespace maru::daemon {
 namespace {
@@ -41,10 +42,9 @@ Server::Server(Core& core, int listening, uid_t service, const Limits& limits)
       limits_(limits),
       poll_(epoll_create1(EPOLL_CLOEXEC)),
       wake_(eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {
-  if (!poll_ || !wake_ || !Watch(listening_, EPOLLIN, EPOLL_CTL_ADD) ||
-      !Watch(wake_.Get(), EPOLLIN, EPOLL_CTL_ADD)) {
-    throw std::system_error(errno, std::generic_category(), "Cannot wait for connections");
-  }
+  CheckErrno(poll_ && wake_ && Watch(listening_, EPOLLIN, EPOLL_CTL_ADD) &&
+                 Watch(wake_.Get(), EPOLLIN, EPOLL_CTL_ADD),
+             "Cannot wait for connections");
   finished_.reserve(limits.connections + limits.reserved);
   core_.server_status = [this](Json::Value& status) { AddStatus(status); };
   const unsigned threads =
@@ -60,6 +60,10 @@ Server::~Server() {
 
 void Server::Stop() {
   stopped_ = true;
+  Wake();
+}
+
+void Server::Wake() {
   const std::uint64_t one = 1;
   [[maybe_unused]] const ssize_t written = write(wake_.Get(), &one, sizeof one);
 }
@@ -84,12 +88,10 @@ void Server::Run() {
   while (!stopped_) {
     const int timeout = connections_.empty() && accepting_ ? -1 : kSweepMilliseconds;
     const int count = epoll_wait(poll_.Get(), events, std::size(events), timeout);
-    if (count < 0 && errno != EINTR) {
-      throw std::system_error(errno, std::generic_category(), "Cannot wait for connections");
-    }
+    CheckErrno(count >= 0 || errno == EINTR, "Cannot wait for connections");
     for (int i = 0; i < count; ++i) OnEvent(events[i].data.fd);
     if (Clock::now() - swept >= std::chrono::milliseconds(kSweepMilliseconds)) {
-      EndOverdue();
+      Sweep();
       swept = Clock::now();
     }
   }
@@ -130,9 +132,9 @@ void Server::Accept() {
       accepting_ = false;
       return;
     }
-    Identity caller;
-    if (!IdentityOfPeer(socket.Get(), service_, caller)) continue;
-    if (!MakeRoom(caller)) {
+    std::optional<Identity> caller = IdentityOfPeer(socket.Get(), service_);
+    if (!caller) continue;
+    if (!MakeRoom(*caller)) {
       const std::string refusal =
           LineOf(ErrorReply(maruseeker::kErrorDaemonExchange, "Too many connections"));
       send(socket.Get(), refusal.data(), refusal.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
@@ -140,7 +142,7 @@ void Server::Accept() {
     }
     const int descriptor = socket.Get();
     if (!Watch(descriptor, EPOLLIN | EPOLLONESHOT, EPOLL_CTL_ADD)) continue;
-    connections_[descriptor] = std::make_unique<Connection>(std::move(socket), std::move(caller));
+    connections_[descriptor] = std::make_unique<Connection>(std::move(socket), std::move(*caller));
     open_ = connections_.size();
   }
 }
@@ -150,20 +152,20 @@ bool Server::MakeRoom(const Identity& caller) {
     const auto mine = std::count_if(connections_.begin(), connections_.end(), [&](const auto& row) {
       return row.second->Caller().uid == caller.uid;
     });
-    if (static_cast<std::size_t>(mine) >= limits_.per_user && !GiveWay(&caller)) return false;
+    if (static_cast<std::size_t>(mine) >= limits_.per_user && !EvictSilent(&caller)) return false;
   }
   const std::size_t most = limits_.connections + (caller.unrestricted ? limits_.reserved : 0);
-  return connections_.size() < most || GiveWay(nullptr);
+  return connections_.size() < most || EvictSilent(nullptr);
 }
 
 /// Closes the connection (of `only`, or of anybody) that has said nothing for longest.
-bool Server::GiveWay(const Identity* only) {
+bool Server::EvictSilent(const Identity* only) {
   Connection* longest = nullptr;
   const auto latest = Clock::now() - kSilence;
   for (const auto& [descriptor, connection] : connections_) {
     if (connection->state != Connection::State::kReading || connection->since > latest) continue;
     if (only && connection->Caller().uid != only->uid) continue;
-    if (HasInput(connection->Socket())) continue;
+    if (connection->HasInput()) continue;
     if (!longest || connection->since < longest->since) longest = connection.get();
   }
   if (longest) Close(*longest);
@@ -194,27 +196,26 @@ void Server::Proceed(Connection& connection) {
 
 void Server::Start(Connection& connection, std::string line) {
   workers_->Add(connection.Caller().uid, [this, &connection, line = std::move(line)] {
-    Carry(connection, line);
+    Execute(connection, line);
     {
       const std::lock_guard lock(finished_mutex_);
       finished_.push_back(&connection);
     }
-    const std::uint64_t one = 1;
-    [[maybe_unused]] const ssize_t written = write(wake_.Get(), &one, sizeof one);
+    Wake();
   });
   connection.state = Connection::State::kWorking;
 }
 
 /// In a worker. What cannot be sent at once is left to the loop.
-void Server::Carry(Connection& connection, const std::string& line) noexcept {
+void Server::Execute(Connection& connection, const std::string& line) noexcept {
   const auto deadline = Clock::now() + limits_.answer;
   auto next_look = Clock::time_point::min();
-  const Cancelled cancelled = [&] {
+  const CancelCheck cancelled = [&] {
     const auto now = Clock::now();
     if (stopped_ || now > deadline) return true;
     if (now < next_look) return false;
     next_look = now + kBetweenLooks;
-    return HasHungUp(connection.Socket());
+    return connection.HasHungUp();
   };
   if (cancelled()) return;
   ++carried_;
@@ -283,17 +284,24 @@ std::size_t Server::UnreadOf(uid_t user) const {
   return bytes;
 }
 
-void Server::EndOverdue() {
-  const auto now = Clock::now();
-  for (auto row = connections_.begin(); row != connections_.end();) {
-    const Connection& connection = *row->second;
-    const auto age = now - connection.since;
-    const bool overdue = (connection.state == Connection::State::kReading &&
-                          age > (connection.WithinLine() ? limits_.line : limits_.idle)) ||
-                         (connection.state == Connection::State::kWriting && age > limits_.send);
-    row = overdue ? connections_.erase(row) : std::next(row);
+bool Server::IsOverdue(const Connection& connection) const {
+  const auto age = Clock::now() - connection.since;
+  switch (connection.state) {
+    case Connection::State::kReading:
+      return age > (connection.WithinLine() ? limits_.line : limits_.idle);
+    case Connection::State::kWorking:
+      return false;
+    case Connection::State::kWriting:
+      return age > limits_.send;
   }
-  open_ = connections_.size();
+  return false;
+}
+
+void Server::Sweep() {
+  for (auto row = connections_.begin(); row != connections_.end();) {
+    Connection& connection = *(row++)->second;
+    if (IsOverdue(connection)) Close(connection);
+  }
   if (!accepting_) accepting_ = Watch(listening_, EPOLLIN, EPOLL_CTL_MOD);
 }
 

@@ -52,23 +52,25 @@ class Server {
   using Clock = std::chrono::steady_clock;
   using Connections = std::map<int, std::unique_ptr<Connection>>;
 
+  void Wake();
   /// False with errno.
   bool Watch(int descriptor, unsigned events, int operation);
   void Await(Connection& connection, Connection::State state);
   void Accept();
   bool MakeRoom(const Identity& caller);
-  bool GiveWay(const Identity* only);
+  bool EvictSilent(const Identity* only);
   void OnEvent(int descriptor);
   void OnConnection(Connection& connection);
   void Close(Connection& connection);
   /// What comes next on a connection that has no request under way.
   void Proceed(Connection& connection);
   void Start(Connection& connection, std::string line);
-  void Carry(Connection& connection, const std::string& line) noexcept;
+  void Execute(Connection& connection, const std::string& line) noexcept;
   void Refuse(Connection& connection, const std::string& why);
   void Deliver(Connection& connection);
   void TakeFinished();
-  void EndOverdue();
+  bool IsOverdue(const Connection& connection) const;
+  void Sweep();
   std::size_t UnreadOf(uid_t user) const;
   void AddStatus(Json::Value& status) const;
 

@@ -3,8 +3,9 @@
 #include <gtest/gtest.h>
 
 #include "daemon/core/arguments.h"
+#include "daemon/language/clauses.h"
 #include "daemon/language/criteria.h"
-#include "daemon/language/question.h"
+#include "daemon/language/query_tree.h"
 #include "daemon/language/range.h"
 #include "index/fields.h"
 #include "system/json.h"
@@ -143,13 +144,13 @@ TEST(Ranges, OfSizesAndTimes) {
   }
 }
 
-TEST(Question, WeightsFieldsAndRefusesWhatIsUnknown) {
+TEST(Clauses, WeightsFieldsAndRefusesWhatIsUnknown) {
   const auto read = [](const std::string& text) {
     Json::Value value;
     EXPECT_TRUE(json::FromString(text, value)) << text;
     const Arguments arguments(value, "data",
                               {"keyword", "criteria_list", "file_type", "search_weight_list"});
-    return Explain(ToQuery(ReadQuestion(arguments), false));
+    return Explain(ToQuery(ReadClauses(arguments), false));
   };
   EXPECT_EQ(read(R"({"keyword": "a", "search_weight_list": [{"field": "MARUMDFSName", "weight": 9},
                      {"field": "MARUMDTextContent", "weight": 0},

@@ -1,4 +1,4 @@
-#include "daemon/core/privilege.h"
+#include "daemon/core/capability.h"
 
 #include <cap-ng.h>
 #include <unistd.h>
@@ -28,15 +28,15 @@ void DropPrivileges(const std::string& account) {
   if (holds_capability) SetEffective(false);
 }
 
-bool MayExamineAllFiles() {
+bool HoldsReadSearch() {
   return holds_capability || geteuid() == 0;
 }
 
-ExamineFiles::ExamineFiles() {
+RaisedReadSearch::RaisedReadSearch() {
   if (holds_capability) SetEffective(true);
 }
 
-ExamineFiles::~ExamineFiles() {
+RaisedReadSearch::~RaisedReadSearch() {
   if (holds_capability) SetEffective(false);
 }
 

@@ -1,4 +1,4 @@
-#include "daemon/core/privilege.h"
+#include "daemon/core/capability.h"
 
 #include <sys/wait.h>
 
@@ -29,12 +29,12 @@ TEST_F(DaemonTest, TheServiceCanExamineAllFilesAndOpenNone) {
   const std::string secret = root_ + "/photo/shut/secret.txt";
   const int result = InChild([&] {
     DropPrivileges("bin");
-    if (!MayExamineAllFiles() || geteuid() != bin_.uid) return 1;
+    if (!HoldsReadSearch() || geteuid() != bin_.uid) return 1;
     // As in the daemon: in a thread, again and again.
     int fault = 0;
     std::thread([&] {
       for (int i = 0; i < 3 && fault == 0; ++i) {
-        if (!StillReadable(scope, {hit})[0]) fault = 2;
+        if (!ReadableNow(scope, {hit})[0]) fault = 2;
         if (open(secret.c_str(), O_RDONLY) >= 0) fault = 3;
       }
     }).join();
