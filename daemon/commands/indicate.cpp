@@ -5,7 +5,6 @@
 #include "daemon/core/scope.h"
 #include "daemon/language/clauses.h"
 #include "daemon/language/criteria.h"
-#include "daemon/language/filters.h"
 #include "daemon/language/query_tree.h"
 
 namespace maru::daemon {
@@ -28,7 +27,7 @@ struct Facet {
 /// the queries before, and expect the count of the type just added.
 Facet ReadFacet(const Json::Value& item, bool blank) {
   const Arguments named(item, "data.queries", {"name", "query"});
-  if (!named.Has("name")) named.Refuse("name", "is missing");
+  named.Require("name");
   const Arguments query(named.Object("query"), "data.queries.query",
                         {"filters", "default_search_op"});
   Filters filters = ReadFilters(query);

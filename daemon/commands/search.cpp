@@ -6,7 +6,6 @@
 #include "daemon/core/page_check.h"
 #include "daemon/language/clauses.h"
 #include "daemon/language/criteria.h"
-#include "daemon/language/filters.h"
 #include "daemon/language/query_tree.h"
 #include "system/json.h"
 

@@ -1,7 +1,6 @@
 #include "daemon/core/arguments.h"
 
 #include <algorithm>
-#include <cmath>
 
 #include "system/json.h"
 
@@ -32,7 +31,7 @@ Arguments::Arguments(const Json::Value& object, std::string where,
   }
   for (auto member = object_.begin(); member != object_.end(); ++member) {
     const std::string name = member.name();
-    if (std::find(known.begin(), known.end(), name) == known.end()) {
+    if (std::ranges::find(known, name) == known.end()) {
       throw BadParameter("Unknown member " + Quoted(name) +
                          (where_.empty() ? "" : " in " + where_));
     }
@@ -55,9 +54,8 @@ void Arguments::Refuse(const char* key, const std::string& why) const {
   throw BadParameter(NameOf(key) + " " + why);
 }
 
-const Json::Value& Arguments::Required(const char* key) const {
+void Arguments::Require(const char* key) const {
   if (!Has(key)) Refuse(key, "is missing");
-  return Any(key);
 }
 
 std::string Arguments::String(const char* key, std::size_t max_bytes,
@@ -85,7 +83,8 @@ std::int64_t Arguments::Integer(const char* key, std::int64_t low, std::int64_t 
 }
 
 double Arguments::Number(const char* key, double low, double high) const {
-  const Json::Value& value = Required(key);
+  Require(key);
+  const Json::Value& value = Any(key);
   if (!value.isNumeric()) Refuse(key, "is not a number");
   const double number = value.asDouble();
   if (!(number >= low && number <= high)) Refuse(key, "is out of range");

@@ -28,11 +28,13 @@ class Arguments {
             std::initializer_list<std::string_view> known);
 
   bool Has(const char* key) const;
+  void Require(const char* key) const;
   std::string String(const char* key, std::size_t max_bytes,
                      const std::string& fallback = {}) const;
   /// Within [low, high].
   std::int64_t Integer(const char* key, std::int64_t low, std::int64_t high,
                        std::int64_t fallback) const;
+  /// Within [low, high]; it has to be there.
   double Number(const char* key, double low, double high) const;
   /// An empty array when absent.
   const Json::Value& Array(const char* key, std::size_t max_items) const;
@@ -48,8 +50,6 @@ class Arguments {
   [[noreturn]] void Refuse(const char* key, const std::string& why) const;
 
  private:
-  const Json::Value& Required(const char* key) const;
-
   const Json::Value& object_;
   std::string where_;
 };

@@ -17,7 +17,9 @@ namespace {
 RightsCache known_rights;
 
 /// Walks from folder to folder of one share with the way to the present one kept open, so that hits
-/// in the order of their paths look at each folder once.
+/// in the order of their paths look at each folder once. Every step is taken from the folder
+/// before, never by a path: what is renamed meanwhile cannot lead past a folder that was not looked
+/// at.
 class Walk {
  public:
   Walk(const Identity& who, const ShareSettings& share) : who_(who) {
@@ -51,7 +53,8 @@ class Walk {
     return known_rights.Read(folder, name.c_str(), rights) && (RightsOf(who_, rights) & wanted);
   }
 
-  /// Makes the folder ("/a/b") the present one. False when they cannot reach it.
+  /// Makes the folder ("/a/b") the present one: steps that the way has in common with it stay, the
+  /// others go, and what is missing is opened. False when they cannot reach it.
   bool Enter(std::string_view folder) {
     std::size_t depth = 0;
     while (!folder.empty()) {

@@ -25,7 +25,7 @@ constexpr const char* kSchema =
     "PRIMARY KEY (uid, index_id, document))";
 
 std::string_view FolderOf(std::string_view path) {
-  return path.substr(0, path.rfind('/') == std::string_view::npos ? 0 : path.rfind('/'));
+  return path.substr(0, path.rfind('/'));
 }
 
 double Boost(double own, double others) {
@@ -54,9 +54,10 @@ UsageStore::UsageStore(const std::string& path, Clock clock)
     session_ = std::make_unique<marudbquery::Session>("sqlite3://" + path, kSchema);
     session_->Open() << "PRAGMA synchronous = NORMAL";
     Load();
-    usable_ = true;
   } catch (const std::exception& error) {
     MARU_LOG("Opened files are not remembered: %s: %s", path.c_str(), error.what());
+    session_.reset();
+    files_.clear();
   }
 }
 
@@ -133,7 +134,7 @@ void UsageStore::ForgetOldestUser() {
 void UsageStore::Record(uid_t uid, const std::string& index_id, index::DocumentId document,
                         const std::string& path) {
   const std::lock_guard lock(mutex_);
-  if (!usable_) throw StoreFailed("there is no database");
+  if (!session_) throw StoreFailed("there is no database");
   std::string why;
   const bool stored = session_->Transaction(
       [&] {

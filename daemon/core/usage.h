@@ -89,8 +89,8 @@ class UsageStore {
 
   Clock clock_;
   mutable std::mutex mutex_;
+  /// Null when the database cannot be used.
   std::unique_ptr<marudbquery::Session> session_;
-  bool usable_ = false;
   /// By user id; kEverybody for all together.
   std::map<std::int64_t, Files> files_;
 };

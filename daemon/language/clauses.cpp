@@ -13,6 +13,8 @@ using index::FieldType;
 using index::Query;
 
 constexpr std::size_t kMaxCriteria = 32;
+constexpr std::size_t kMaxFilters = 256;
+constexpr std::size_t kMaxFilterData = 4096;
 constexpr double kMaxWeight = 1000;
 
 const Field& FieldNamed(const std::string& name) {
@@ -63,6 +65,21 @@ QueryClauses ReadClauses(const Arguments& arguments) {
     clauses.filters.push_back(std::move(*kinds));
   }
   return clauses;
+}
+
+Filters ReadFilters(const Arguments& arguments) {
+  Filters filters;
+  for (const Json::Value& item : arguments.Array("filters", kMaxFilters)) {
+    const Arguments filter(item, arguments.NameOf("filters"), {"name", "data"});
+    const std::string name = filter.String("name", kMaxFilterData);
+    if (name != "permission" && name != "file_type") {
+      throw BadParameter("Unknown filter " + Quoted(name));
+    }
+    filter.Require("data");
+    auto& list = name == "permission" ? filters.users : filters.types;
+    list.push_back(filter.String("data", kMaxFilterData));
+  }
+  return filters;
 }
 
 bool ReadAnyWord(const Arguments& arguments) {

@@ -23,6 +23,16 @@ struct QueryClauses {
 /// absent.
 QueryClauses ReadClauses(const Arguments& arguments);
 
+/// The "filters" of a request.
+struct Filters {
+  /// Of "permission" filters; each narrows.
+  std::vector<std::string> users;
+  /// Of "file_type" filters, in the order given.
+  std::vector<std::string> types;
+};
+
+Filters ReadFilters(const Arguments& arguments);
+
 /// "AND" (also when absent): false; "OR": true.
 bool ReadAnyWord(const Arguments& arguments);
 

@@ -29,6 +29,11 @@ constexpr std::chrono::milliseconds kSilence{250};
 /// A request may ask whether it is still wanted far more often than the kernel need be.
 constexpr std::chrono::milliseconds kBetweenLooks{1};
 
+// A connection is read until it has a line, belongs to a worker until that line is carried out, and
+// is written until the reply is out; then it is read again. The loop waits for one event of it at a
+// time (EPOLLONESHOT), and for none while it works: no event finds it in a worker's hands, and what
+// a worker did it reports through `finished_`.
+
 std::string LineOf(const Json::Value& message) {
   return json::ToString(message) + "\n";
 }
