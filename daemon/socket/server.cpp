@@ -38,6 +38,18 @@ std::string LineOf(const Json::Value& message) {
   return json::ToString(message) + "\n";
 }
 
+/// Does something for one connection; false when that failed.
+template <class Work>
+bool Unharmed(Work work) {
+  try {
+    work();
+    return true;
+  } catch (const std::exception& error) {
+    MARU_LOG("Connection failed: %s", error.what());
+    return false;
+  }
+}
+
 }  // namespace
 
 Server::Server(Core& core, int listening, uid_t service, const Limits& limits)
@@ -50,7 +62,7 @@ Server::Server(Core& core, int listening, uid_t service, const Limits& limits)
   CheckErrno(poll_ && wake_ && Watch(listening_, EPOLLIN, EPOLL_CTL_ADD) &&
                  Watch(wake_.Get(), EPOLLIN, EPOLL_CTL_ADD),
              "Cannot wait for connections");
-  finished_.reserve(limits.connections + limits.reserved);
+  for (auto* list : {&finished_, &taken_}) list->reserve(limits.connections + limits.reserved);
   core_.server_status = [this](Json::Value& status) { AddStatus(status); };
   const unsigned threads =
       limits.workers ? limits.workers : std::max(4u, 2 * std::thread::hardware_concurrency());
@@ -103,27 +115,23 @@ void Server::Run() {
 }
 
 void Server::OnEvent(int descriptor) {
-  try {
-    if (descriptor == listening_) return Accept();
-    if (descriptor == wake_.Get()) return TakeFinished();
-    const auto found = connections_.find(descriptor);
-    if (found != connections_.end()) OnConnection(*found->second);
-  } catch (const std::exception& error) {
-    MARU_LOG("Connection failed: %s", error.what());
-    const auto found = connections_.find(descriptor);
-    if (found == connections_.end()) return;
-    if (found->second->state != Connection::State::kWorking) Close(*found->second);
+  if (descriptor == listening_) {
+    Unharmed([this] { Accept(); });
+  } else if (descriptor == wake_.Get()) {
+    TakeFinished();
+  } else if (const auto found = connections_.find(descriptor); found != connections_.end()) {
+    if (found->second->state != Connection::State::kWorking) Attend(*found->second);
   }
 }
 
-void Server::OnConnection(Connection& connection) {
-  if (connection.state == Connection::State::kWriting) return Deliver(connection);
-  if (connection.state != Connection::State::kReading) return;
-  if (connection.Receive()) {
+/// After an event of a connection, or when its request is carried out.
+void Server::Attend(Connection& connection) {
+  const bool unharmed = Unharmed([&] {
+    if (connection.state != Connection::State::kReading) return Deliver(connection);
+    if (!connection.Receive()) return Close(connection);
     Proceed(connection);
-  } else {
-    Close(connection);
-  }
+  });
+  if (!unharmed) Close(connection);
 }
 
 void Server::Accept() {
@@ -245,13 +253,12 @@ void Server::Execute(Connection& connection, const std::string& line) noexcept {
 void Server::TakeFinished() {
   std::uint64_t count;
   [[maybe_unused]] const ssize_t taken = read(wake_.Get(), &count, sizeof count);
-  std::vector<Connection*> finished;
   {
     const std::lock_guard lock(finished_mutex_);
-    finished = finished_;
-    finished_.clear();
+    taken_.swap(finished_);
   }
-  for (Connection* connection : finished) Deliver(*connection);
+  for (Connection* connection : taken_) Attend(*connection);
+  taken_.clear();
 }
 
 void Server::Refuse(Connection& connection, const std::string& why) {

@@ -60,7 +60,7 @@ class Server {
   bool MakeRoom(const Identity& caller);
   bool EvictSilent(const Identity* only);
   void OnEvent(int descriptor);
-  void OnConnection(Connection& connection);
+  void Attend(Connection& connection);
   void Close(Connection& connection);
   /// What comes next on a connection that has no request under way.
   void Proceed(Connection& connection);
@@ -86,8 +86,9 @@ class Server {
   std::atomic<std::uint64_t> carried_ = 0;
   Connections connections_;
   std::mutex finished_mutex_;
-  /// Has room for all connections, so that reporting never fails.
-  std::vector<Connection*> finished_;
+  /// Carried out, and of these what the loop has taken over. Both have room for all connections, so
+  /// that reporting never fails.
+  std::vector<Connection*> finished_, taken_;
   /// Last, so that its threads end before anything they use.
   std::unique_ptr<Workers> workers_;
 };
