@@ -78,7 +78,7 @@ Json::Value TermSuggestCommand(const Request& request) {
                        {"uid", "terms", "suggest_num", "indice", "suggester"});
   const std::string text = data.String("terms", kMaxTermsBytes);
   const std::int64_t wanted = data.Integer("suggest_num", INT64_MIN, INT64_MAX, 0);
-  const std::int64_t uid = data.Integer("uid", 0, UINT32_MAX, request.caller.uid);
+  const std::int64_t named = data.Integer("uid", 0, UINT32_MAX, request.caller.uid);
   const std::vector<const Suggester*> suggesters = ReadSuggesters(data);
   const std::vector<std::string> ids =
       data.Has("indice") ? ReadIndices(data) : request.core.indices.Ids();
@@ -87,12 +87,15 @@ Json::Value TermSuggestCommand(const Request& request) {
   reply["suggestions"] = Json::arrayValue;
   if (index::WordsOf(text).empty()) return reply;
   const auto reader = scope.indices.empty() ? nullptr : OpenReader(request.core, scope);
-  const bool own = !request.caller.unrestricted;
-  const auto limit = static_cast<std::size_t>(wanted < 1 ? kDefaultSuggestions
-                                                         : std::min(wanted, kMaxSuggestions));
   const SuggestRequest typed{
-      request.core, scope, reader.get(),     own ? request.caller.uid : static_cast<uid_t>(uid),
-      text,         limit, request.cancelled};
+      .core = request.core,
+      .scope = scope,
+      .reader = reader.get(),
+      .uid = request.caller.unrestricted ? static_cast<uid_t>(named) : request.caller.uid,
+      .text = text,
+      .limit = static_cast<std::size_t>(wanted < 1 ? kDefaultSuggestions
+                                                   : std::min(wanted, kMaxSuggestions)),
+      .cancelled = request.cancelled};
   reply["suggestions"] = suggesters.empty() ? SuggestByDefault(typed) : Suggest(suggesters, typed);
   return reply;
 }
