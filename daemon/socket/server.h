@@ -20,7 +20,7 @@ class Server {
  public:
   struct Limits {
     /// Connections of all callers, what root and the service have besides, and those of one other
-    /// user. Where a bound is met, the caller's connection that has been silent longest gives way.
+    /// user. Where a bound is met, the connection it counts that has been silent longest gives way.
     std::size_t connections = 512;
     std::size_t reserved = 64;
     std::size_t per_user = 128;
