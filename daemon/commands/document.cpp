@@ -34,12 +34,13 @@ Json::Value HighlightCommand(const Request& request) {
   const index::Query query = ToQuery(ReadClauses(data), false);
   const Scope scope = ScopeOf(request.core, EyesOf(request.caller, {}), {id});
   if (scope.indices.empty() || document < 1 || document > UINT32_MAX) throw NotThere();
-  const auto reader = OpenReader(request.core, scope);
-  const auto hit = reader->Find(0, static_cast<index::DocumentId>(document));
+  const auto view = OpenView(request.core, scope, request.cancelled);
+  const auto hit = view->Find(0, static_cast<index::DocumentId>(document));
   if (!hit || !Readable(scope, *hit)) throw NotThere();
+  index::Highlighter highlighter(*view, query);
   Json::Value reply;
   reply["doc_id"] = hit->document;
-  reply["fragments"] = FragmentsOf(*reader, *hit, query, {options});
+  reply["fragments"] = FragmentsOf(highlighter, *hit, {options});
   return reply;
 }
 
@@ -55,7 +56,7 @@ Json::Value RecordOpenCommand(const Request& request) {
   if (id != IndexIdOf(path.share)) data.Refuse("full_path", "does not lie in " + Quoted(id));
   const Scope scope = ScopeOf(request.core, EyesOf(request.caller, {}), {id});
   if (scope.indices.empty()) throw NotThere();
-  const auto hit = OpenReader(request.core, scope)->Find(0, path.rest);
+  const auto hit = OpenView(request.core, scope, request.cancelled)->Find(0, path.rest);
   if (!hit || !Readable(scope, *hit)) throw NotThere();
   request.core.usage.Record(request.caller.uid, id, hit->document, hit->path);
   return Json::objectValue;

@@ -103,12 +103,11 @@ index::FragmentOptions ReadFragmentOptions(const Arguments& arguments) {
   return options;
 }
 
-Json::Value FragmentsOf(index::Reader& reader, const Hit& hit, const index::Query& query,
+Json::Value FragmentsOf(index::Highlighter& highlighter, const Hit& hit,
                         const std::vector<index::FragmentOptions>& options) {
   Json::Value fragments(Json::objectValue);
   for (const index::FragmentOptions& wanted : options) {
-    for (const index::Fragment& fragment :
-         reader.Fragments(hit.share, hit.document, query, wanted)) {
+    for (const index::Fragment& fragment : highlighter.FragmentsOf(hit, wanted)) {
       fragments[wanted.field].append(fragment.html);
     }
   }

@@ -6,8 +6,8 @@
 
 #include "daemon/core/arguments.h"
 #include "daemon/core/scope.h"
-#include "index/fields.h"
-#include "index/reader.h"
+#include "index/search/view.h"
+#include "index/store/fields.h"
 
 namespace maru::daemon {
 
@@ -33,7 +33,7 @@ constexpr std::int64_t kDefaultFragments = 3;
 constexpr std::int64_t kMaxFragments = 20;
 
 /// {field: [html…]} for each of the options whose field holds a match.
-Json::Value FragmentsOf(index::Reader& reader, const index::Hit& hit, const index::Query& query,
+Json::Value FragmentsOf(index::Highlighter& highlighter, const index::Hit& hit,
                         const std::vector<index::FragmentOptions>& options);
 
 }  // namespace maru::daemon

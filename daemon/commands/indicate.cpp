@@ -62,7 +62,7 @@ Json::Value IndicateCommand(const Request& request) {
     std::vector<Query> filters;
     for (const Facet& facet : facets) filters.push_back(facet.filter);
     const Query query = blank ? Query{} : ToQuery(clauses, any_word);
-    const auto found = OpenReader(request.core, scope)->Count(query, filters, request.cancelled);
+    const auto found = OpenView(request.core, scope, request.cancelled)->Count(query, filters);
     for (std::size_t i = 0; i < facets.size(); ++i) {
       counts[facets[i].name] = Json::UInt64{found[i]};
     }

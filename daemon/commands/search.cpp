@@ -96,7 +96,6 @@ SearchRequest ReadSearch(const Request& request) {
   search.highlights = ReadHighlights(data);
   search.options.from = static_cast<std::uint32_t>(data.Integer("from", 0, kMaxFrom, 0));
   search.options.size = static_cast<std::uint32_t>(data.Integer("size", 0, kMaxSize, kDefaultSize));
-  search.options.cancelled = request.cancelled;
   ReadSort(data, search.options);
   CheckCollector(data);
   CheckPage(search);
@@ -108,13 +107,13 @@ SearchRequest ReadSearch(const Request& request) {
 }
 
 /// What the caller opened lately ranks higher.
-void AddBoosts(const Request& request, const Scope& scope, index::Reader& reader,
+void AddBoosts(const Request& request, const Scope& scope, index::View& view,
                index::SearchOptions& options) {
   const std::vector<std::string> ids = scope.Ids();
   for (const OpenedFile& file : request.core.usage.Strongest(request.caller.uid, ids)) {
     const auto share =
         static_cast<std::size_t>(std::ranges::find(ids, file.index_id) - ids.begin());
-    const auto hit = reader.Find(share, file.document);
+    const auto hit = view.Find(share, file.document);
     if (hit && IsSameFile(file.path, hit->path)) {
       options.boosts[{share, file.document}] = file.boost;
     }
@@ -124,12 +123,12 @@ void AddBoosts(const Request& request, const Scope& scope, index::Reader& reader
 /// The page's hits, checked against the file system and filled up behind those that fell out. The
 /// total is lowered by them. (What fell out of earlier pages is not known here; until the index has
 /// caught up, a hit may stand on two pages.)
-index::SearchResult CheckedPage(SearchRequest& search, index::Reader& reader) {
+index::SearchResult CheckedPage(SearchRequest& search, index::View& view) {
   index::SearchResult page;
   index::SearchOptions options = search.options;
   std::uint64_t gone = 0;
   for (int round = 0; round < kMaxRounds; ++round) {
-    index::SearchResult found = reader.Search(search.query, options);
+    index::SearchResult found = view.Search(search.query, options);
     page.total = found.total;
     const std::vector<bool> readable = ReadableNow(search.scope, found.hits);
     for (std::size_t i = 0; i < found.hits.size(); ++i) {
@@ -151,22 +150,24 @@ index::SearchResult CheckedPage(SearchRequest& search, index::Reader& reader) {
 Json::Value SearchCommand(const Request& request) {
   SearchRequest search = ReadSearch(request);
   index::SearchResult page;
-  std::unique_ptr<index::Reader> reader;
+  std::unique_ptr<index::View> view;
   if (!search.scope.indices.empty()) {
-    reader = OpenReader(request.core, search.scope);
+    view = OpenView(request.core, search.scope, request.cancelled);
     if (search.options.sort_field.empty()) {
-      AddBoosts(request, search.scope, *reader, search.options);
+      AddBoosts(request, search.scope, *view, search.options);
     }
-    page = CheckedPage(search, *reader);
+    page = CheckedPage(search, *view);
   }
   json::ObjectWriter total;
   total.AddNumber("total", static_cast<std::int64_t>(page.total));
   request.output(total.Take(), false);
+  std::optional<index::Highlighter> highlighter;
+  if (view && !search.highlights.empty()) highlighter.emplace(*view, search.query);
   for (const index::Hit& hit : page.hits) {
     Json::Value highlight;
-    if (!search.highlights.empty()) {
+    if (highlighter) {
       if (request.cancelled()) throw index::Cancelled();
-      highlight = FragmentsOf(*reader, hit, search.query, search.highlights);
+      highlight = FragmentsOf(*highlighter, hit, search.highlights);
     }
     request.output(HitMessage(search.scope.indices[hit.share], hit, search.fields, highlight),
                    false);

@@ -12,7 +12,8 @@ Json::Value IndexStatus(const Core& core, const std::string& id) {
   const std::string share(ShareOfIndexId(id));
   status["share"] = core.shares()->Find(share) ? Json::Value(share) : Json::Value();
   try {
-    status["documents"] = Json::UInt64{core.indices.Open({id})->Documents()};
+    status["documents"] =
+        Json::UInt64{core.indices.Open({id}, {0, {}, true}, nullptr)->Documents()};
   } catch (const maruseeker::Error& error) {
     status["error"] = error.Reason();
   }
@@ -32,6 +33,11 @@ Json::Value StatusCommand(const Request& request) {
   for (const std::string& id : request.core.indices.Ids()) {
     status["indices"].append(IndexStatus(request.core, id));
   }
+  const index::Library::Kept cached = request.core.indices.Cached();
+  status["cache"]["bytes"] = Json::UInt64{cached.bytes};
+  status["cache"]["entries"] = Json::UInt64{cached.entries};
+  status["cache"]["found"] = Json::UInt64{cached.found};
+  status["cache"]["missed"] = Json::UInt64{cached.missed};
   status["shares"] = Json::UInt64{request.core.shares()->Shares().size()};
   status["share_settings_error"] = request.core.shares()->Error();
   status["opened_files"] = Json::UInt64{request.core.usage.Size()};

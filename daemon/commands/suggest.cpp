@@ -4,7 +4,7 @@
 #include "daemon/commands/commands.h"
 #include "daemon/commands/suggesters.h"
 #include "daemon/core/arguments.h"
-#include "index/tokenizer.h"
+#include "index/text/tokenizer.h"
 #include "system/index_id.h"
 
 namespace maru::daemon {
@@ -86,16 +86,16 @@ Json::Value TermSuggestCommand(const Request& request) {
   Json::Value reply;
   reply["suggestions"] = Json::arrayValue;
   if (index::WordsOf(text).empty()) return reply;
-  const auto reader = scope.indices.empty() ? nullptr : OpenReader(request.core, scope);
+  const auto view =
+      scope.indices.empty() ? nullptr : OpenView(request.core, scope, request.cancelled);
   const SuggestRequest typed{
       .core = request.core,
       .scope = scope,
-      .reader = reader.get(),
+      .view = view.get(),
       .uid = request.caller.unrestricted ? static_cast<uid_t>(named) : request.caller.uid,
       .text = text,
       .limit = static_cast<std::size_t>(wanted < 1 ? kDefaultSuggestions
-                                                   : std::min(wanted, kMaxSuggestions)),
-      .cancelled = request.cancelled};
+                                                   : std::min(wanted, kMaxSuggestions))};
   reply["suggestions"] = suggesters.empty() ? SuggestByDefault(typed) : Suggest(suggesters, typed);
   return reply;
 }

@@ -5,8 +5,8 @@
 
 #include "daemon/core/page_check.h"
 #include "daemon/language/query_tree.h"
-#include "index/fields.h"
-#include "index/tokenizer.h"
+#include "index/store/fields.h"
+#include "index/text/tokenizer.h"
 
 namespace maru::daemon {
 namespace {
@@ -38,10 +38,10 @@ std::string Replaced(const std::string& text, const Word& typed, const std::stri
 std::vector<std::string> Complete(const SuggestRequest& request) {
   std::vector<std::string> texts;
   const std::vector<Word> words = WordsIn(request.text);
-  if (!request.reader || words.empty() || words.back().end != request.text.size()) return texts;
+  if (!request.view || words.empty() || words.back().end != request.text.size()) return texts;
   // One more: the word as it stands is among its completions.
   for (const std::string& word :
-       request.reader->Complete("", words.back().folded, request.limit + 1)) {
+       request.view->Complete("", words.back().folded, request.limit + 1)) {
     if (word != words.back().folded) texts.push_back(Replaced(request.text, words.back(), word));
   }
   return texts;
@@ -64,12 +64,11 @@ index::Query NameQuery(const std::vector<Word>& words, bool last_goes_on) {
 std::vector<std::string> Names(const SuggestRequest& request) {
   std::vector<std::string> names;
   const std::vector<Word> words = WordsIn(request.text);
-  if (!request.reader || words.empty()) return names;
+  if (!request.view || words.empty()) return names;
   index::SearchOptions options;
   options.size = static_cast<std::uint32_t>(request.limit);
-  options.cancelled = request.cancelled;
   const bool last_goes_on = words.back().end == request.text.size();
-  const auto hits = request.reader->Search(NameQuery(words, last_goes_on), options).hits;
+  const auto hits = request.view->Search(NameQuery(words, last_goes_on), options).hits;
   const std::vector<bool> readable = ReadableNow(request.scope, hits);
   for (std::size_t i = 0; i < hits.size(); ++i) {
     if (readable[i]) names.push_back(hits[i].record.name);
@@ -81,11 +80,11 @@ std::vector<std::string> Names(const SuggestRequest& request) {
 std::vector<std::string> Spellings(const SuggestRequest& request) {
   std::vector<std::string> texts;
   std::vector<Word> words = WordsIn(request.text);
-  if (!request.reader) return texts;
+  if (!request.view) return texts;
   std::reverse(words.begin(), words.end());
   if (words.size() > kMaxWordsCorrected) words.resize(kMaxWordsCorrected);
   for (const Word& typed : words) {
-    for (const std::string& word : request.reader->Correct(typed.folded, request.limit)) {
+    for (const std::string& word : request.view->Correct(typed.folded, request.limit)) {
       if (word != typed.folded) texts.push_back(Replaced(request.text, typed, word));
     }
     if (texts.size() >= request.limit) break;

@@ -16,12 +16,11 @@ struct SuggestRequest {
   const Core& core;
   const Scope& scope;
   /// Null when there is no index to look into.
-  index::Reader* reader;
+  index::View* view;
   /// Whose history.
   uid_t uid;
   const std::string& text;
   std::size_t limit;
-  const CancelCheck& cancelled;
 };
 
 struct Suggester {

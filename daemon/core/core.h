@@ -9,7 +9,7 @@
 #include <vector>
 
 #include "daemon/core/usage.h"
-#include "index/reader.h"
+#include "index/search/library.h"
 #include "system/rights.h"
 #include "system/share_table.h"
 
@@ -22,20 +22,24 @@ class Indices {
  public:
   virtual ~Indices() = default;
   /// As index::Library::Open.
-  virtual std::unique_ptr<index::Reader> Open(const std::vector<std::string>& ids) = 0;
+  virtual std::unique_ptr<index::View> Open(const std::vector<std::string>& ids,
+                                            const Identity& who, index::IsCancelled cancelled) = 0;
   virtual bool Has(const std::string& id) const = 0;
   virtual std::vector<std::string> Ids() const = 0;
+  virtual index::Library::Kept Cached() const { return {}; }
 };
 
 /// Those on the disk.
 class LibraryIndices : public Indices {
  public:
   explicit LibraryIndices(std::string path) : library_(std::move(path)) {}
-  std::unique_ptr<index::Reader> Open(const std::vector<std::string>& ids) override {
-    return library_.Open(ids);
+  std::unique_ptr<index::View> Open(const std::vector<std::string>& ids, const Identity& who,
+                                    index::IsCancelled cancelled) override {
+    return library_.Open(ids, who, std::move(cancelled));
   }
   bool Has(const std::string& id) const override { return library_.Has(id); }
   std::vector<std::string> Ids() const override { return library_.IndexIds(); }
+  index::Library::Kept Cached() const override { return library_.Cached(); }
 
  private:
   index::Library library_;

@@ -5,7 +5,7 @@
 #include <vector>
 
 #include "daemon/core/scope.h"
-#include "index/reader.h"
+#include "index/search/view.h"
 
 namespace maru::daemon {
 

@@ -68,10 +68,9 @@ Scope ScopeOf(const Core& core, Eyes eyes, const std::vector<std::string>& ids) 
   return scope;
 }
 
-std::unique_ptr<index::Reader> OpenReader(const Core& core, const Scope& scope) {
-  auto reader = core.indices.Open(scope.Ids());
-  reader->SetEyes(scope.eyes.identity);
-  return reader;
+std::unique_ptr<index::View> OpenView(const Core& core, const Scope& scope,
+                                      const CancelCheck& cancelled) {
+  return core.indices.Open(scope.Ids(), scope.eyes.identity, cancelled);
 }
 
 std::string FullPath(const ShareIndex& index, const std::string& path) {

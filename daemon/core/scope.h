@@ -54,8 +54,9 @@ Scope ScopeOf(const Core& core, Eyes eyes, const std::vector<std::string>& ids);
 /// character, "." or "..".
 void CheckIndexId(const std::string& id);
 
-/// A reader over the scope's indices, in their order, with its eyes.
-std::unique_ptr<index::Reader> OpenReader(const Core& core, const Scope& scope);
+/// The scope's indices, in their order, through its eyes.
+std::unique_ptr<index::View> OpenView(const Core& core, const Scope& scope,
+                                      const CancelCheck& cancelled);
 
 /// The volume path of a path within the share.
 std::string FullPath(const ShareIndex& index, const std::string& path);

@@ -12,7 +12,7 @@
 #include <utility>
 #include <vector>
 
-#include "index/document.h"
+#include "index/store/document.h"
 
 namespace marudbquery {
 class Session;

@@ -3,7 +3,7 @@
 #include "daemon/language/criteria.h"
 #include "daemon/language/keyword.h"
 #include "daemon/language/query_tree.h"
-#include "index/fields.h"
+#include "index/store/fields.h"
 
 namespace maru::daemon {
 namespace {

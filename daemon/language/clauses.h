@@ -4,7 +4,7 @@
 #include <vector>
 
 #include "daemon/core/arguments.h"
-#include "index/query.h"
+#include "index/search/query.h"
 
 namespace maru::daemon {
 

@@ -8,7 +8,8 @@
 #include "daemon/language/keyword.h"
 #include "daemon/language/query_tree.h"
 #include "daemon/language/range.h"
-#include "index/tokenizer.h"
+#include "index/text/tokenizer.h"
+#include "system/index_id.h"
 #include "system/share_table.h"
 #include "system/text.h"
 #include "system/volume_path.h"
@@ -87,9 +88,11 @@ Query PathCriterion(const Field& field, const std::string& value) {
   const std::optional<std::string> path = VolumePathOf(value);
   if (!path) throw BadValue(field, value, "is not a folder's path such as /photo/trip");
   Query query;
-  if (*path == kVolume) return query;
+  VolumePath parts;
+  if (!SplitAtShare(*path, parts)) return query;
   query.kind = Query::Kind::kUnder;
-  query.text = *path;
+  query.field = IndexIdOf(parts.share);
+  query.text = parts.rest;
   return query;
 }
 

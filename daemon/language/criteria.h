@@ -4,8 +4,8 @@
 #include <string>
 #include <string_view>
 
-#include "index/fields.h"
-#include "index/query.h"
+#include "index/search/query.h"
+#include "index/store/fields.h"
 
 namespace maru::daemon {
 

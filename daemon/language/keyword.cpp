@@ -5,7 +5,7 @@
 
 #include "daemon/core/arguments.h"
 #include "daemon/language/query_tree.h"
-#include "index/tokenizer.h"
+#include "index/text/tokenizer.h"
 
 namespace maru::daemon {
 namespace {

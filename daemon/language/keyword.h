@@ -4,7 +4,7 @@
 #include <string_view>
 #include <vector>
 
-#include "index/query.h"
+#include "index/search/query.h"
 
 namespace maru::daemon {
 

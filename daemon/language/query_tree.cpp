@@ -3,6 +3,9 @@
 #include <cmath>
 #include <cstdio>
 
+#include "system/index_id.h"
+#include "system/share_table.h"
+
 namespace maru::daemon {
 namespace {
 
@@ -80,7 +83,8 @@ std::string Explain(const Query& query) {
     case Query::Kind::kRange:
       return query.field + "=" + ExplainNumber(query.low) + ".." + ExplainNumber(query.high);
     case Query::Kind::kUnder:
-      return "under " + query.text;
+      return "under " + std::string(kVolume) + "/" + std::string(ShareOfIndexId(query.field)) +
+             query.text;
     case Query::Kind::kAnd:
       return Listed(query.parts, 0, " AND ");
     case Query::Kind::kOr:

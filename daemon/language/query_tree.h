@@ -4,7 +4,7 @@
 #include <string_view>
 #include <vector>
 
-#include "index/query.h"
+#include "index/search/query.h"
 
 /// Queries put together, and told.
 namespace maru::daemon {

@@ -15,7 +15,7 @@
 #include <vector>
 
 #include "daemon/core/core.h"
-#include "index/writer.h"
+#include "index/store/writer.h"
 #include "system/json.h"
 
 namespace maru::daemon::test {

@@ -7,7 +7,7 @@
 #include "daemon/language/criteria.h"
 #include "daemon/language/query_tree.h"
 #include "daemon/language/range.h"
-#include "index/fields.h"
+#include "index/store/fields.h"
 #include "system/json.h"
 
 namespace maru::daemon {
