@@ -1,12 +1,8 @@
 #include <pwd.h>
-#include <sys/resource.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <CLI/CLI.hpp>
 #include <csignal>
-#include <exception>
-#include <iostream>
 #include <stdexcept>
 #include <string>
 
@@ -15,6 +11,7 @@
 #include "daemon/history.h"
 #include "daemon/socket/listener.h"
 #include "daemon/socket/server.h"
+#include "program/program.h"
 #include "system/config.h"
 #include "system/log.h"
 
@@ -41,14 +38,7 @@ Identity FutureIdentity(const std::string& account) {
   return identity;
 }
 
-void RaiseDescriptorLimit() {
-  rlimit limit;
-  if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return;
-  limit.rlim_cur = limit.rlim_max;
-  setrlimit(RLIMIT_NOFILE, &limit);
-}
-
-void Serve(const Config& config) {
+int Serve(const Config& config) {
   umask(077);
   RaiseDescriptorLimit();
   const Identity identity = FutureIdentity(config.service_account);
@@ -68,26 +58,14 @@ void Serve(const Config& config) {
   std::signal(SIGPIPE, SIG_IGN);
   server.Run();
   for (const int signal : {SIGTERM, SIGINT}) std::signal(signal, SIG_IGN);
+  return 0;
 }
 
 }  // namespace
 
 int main(int argc, char** argv) {
-  CLI::App app("The search daemon of MaruSeeker.", "maruelasticd");
-  std::string config_file = Config::kDefaultPath;
-  bool foreground = false;
-  app.add_option("--config", config_file, "Configuration file")->type_name("FILE");
-  app.add_flag("--foreground", foreground, "Log to standard error, too");
-  app.set_version_flag("--version", MARUSEEKER_VERSION);
-  CLI11_PARSE(app, argc, argv);
-  OpenLog("maruelasticd", foreground);
-  try {
-    Serve(app.count("--config") ? Config::Load(config_file) : Config::Get());
-    return 0;
-  } catch (const std::exception& error) {
-    errno = 0;
-    MARU_LOG("%s", error.what());
-    if (!foreground) std::cerr << "maruelasticd: " << error.what() << "\n";
-    return 1;
-  }
+  return RunProgram({{.name = "maruelasticd",
+                      .help = "The search daemon of MaruSeeker.",
+                      .run = [] { return Serve(Config::Get()); }}},
+                    argc, argv);
 }
