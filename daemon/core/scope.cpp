@@ -74,8 +74,4 @@ std::unique_ptr<index::Reader> OpenReader(const Core& core, const Scope& scope) 
   return reader;
 }
 
-std::string FullPath(const ShareIndex& index, const std::string& path) {
-  return index.share->VolumePath() + path;
-}
-
 }  // namespace maru::daemon

@@ -57,7 +57,4 @@ void CheckIndexId(const std::string& id);
 /// A reader over the scope's indices, in their order, with its eyes.
 std::unique_ptr<index::Reader> OpenReader(const Core& core, const Scope& scope);
 
-/// The volume path of a path within the share.
-std::string FullPath(const ShareIndex& index, const std::string& path);
-
 }  // namespace maru::daemon
