@@ -96,10 +96,10 @@ void ParseAndWriteJson(benchmark::State& state) {
 BENCHMARK(ParseAndWriteJson);
 
 void ReadKeyword(benchmark::State& state) {
-  const maru::daemon::KeywordOptions options{{{std::string(kName), 3}, {std::string(kText), 1}}};
+  const std::vector<FieldWeight> fields{{std::string(kName), 3}, {std::string(kText), 1}};
   for (auto _ : state) {
     benchmark::DoNotOptimize(
-        maru::daemon::ParseKeyword("harbour (berth OR \"low tide\") -storm ship*", options));
+        maru::daemon::ParseKeyword("harbour (berth OR \"low tide\") -storm ship*", fields));
   }
 }
 BENCHMARK(ReadKeyword);

@@ -29,8 +29,8 @@ Json::Value HighlightCommand(const Request& request) {
                        {"id", "doc_id", "highlight", "keyword", "search_weight_list"});
   const std::string id = data.String("id", kMaxIndexId);
   const std::int64_t document = data.Integer("doc_id", INT64_MIN, INT64_MAX, 0);
-  const index::FragmentOptions options = ReadFragmentOptions(Arguments(
-      data.Any("highlight"), "data.highlight", {"field", "frag_length", "num_fragments"}));
+  const index::FragmentOptions options =
+      ReadFragmentOptions(data.Object("highlight", kFragmentMembers));
   const index::Query query = ToQuery(ReadClauses(data), false);
   const Scope scope = ScopeOf(request.core, EyesOf(request.caller, {}), {id});
   if (scope.indices.empty() || document < 1 || document > UINT32_MAX) throw NotThere();

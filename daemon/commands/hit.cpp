@@ -32,7 +32,7 @@ Json::Value AuthorsOf(const Hit& hit) {
 
 void AddField(json::ObjectWriter& message, const ShareIndex& from, const Hit& hit,
               std::string_view field) {
-  if (field == index::kPath) return message.AddText(field, FullPath(from, hit.path));
+  if (field == index::kPath) return message.AddText(field, from.share->VolumePath() + hit.path);
   if (field == index::kName) return message.AddText(field, hit.record.name);
   if (field == index::kExtension) {
     return message.AddText(field, index::ExtensionOf(hit.record.name));

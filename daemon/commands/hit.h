@@ -21,7 +21,8 @@ std::string HitMessage(const ShareIndex& from, const index::Hit& hit,
                        const std::vector<const index::Field*>& fields,
                        const Json::Value& highlight);
 
-/// What a highlight asks for, of one field.
+/// What a highlight asks for, of one field, in an object of these members.
+inline const Arguments::Names kFragmentMembers = {"field", "frag_length", "num_fragments"};
 index::FragmentOptions ReadFragmentOptions(const Arguments& arguments);
 
 /// Fragments are asked for with these bounds; numbers outside are taken as the nearest inside, and

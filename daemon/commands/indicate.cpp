@@ -25,11 +25,9 @@ struct Facet {
 
 /// A query's own type is its last "file_type" filter: askers add each query's filters to those of
 /// the queries before, and expect the count of the type just added.
-Facet ReadFacet(const Json::Value& item, bool blank) {
-  const Arguments named(item, "data.queries", {"name", "query"});
+Facet ReadFacet(const Arguments& named, bool blank) {
   named.Require("name");
-  const Arguments query(named.Object("query"), "data.queries.query",
-                        {"filters", "default_search_op"});
+  const Arguments query = named.Object("query", {"filters", "default_search_op"});
   Filters filters = ReadFilters(query);
   Facet facet{named.String("name", kMaxNameBytes), std::move(filters.users), ReadAnyWord(query),
               blank ? Nothing() : Query{}};
@@ -49,8 +47,8 @@ Json::Value IndicateCommand(const Request& request) {
 
   // Facets with the same eyes and the same operator share one pass; in practice that is all.
   std::map<std::pair<std::vector<std::string>, bool>, std::vector<Facet>> passes;
-  for (const Json::Value& item : data.Array("queries", kMaxQueries)) {
-    Facet facet = ReadFacet(item, blank);
+  for (const Arguments& named : data.Objects("queries", kMaxQueries, {"name", "query"})) {
+    Facet facet = ReadFacet(named, blank);
     passes[{facet.users, facet.any_word}].push_back(std::move(facet));
   }
   Json::Value counts(Json::objectValue);

@@ -31,23 +31,20 @@ struct SearchRequest {
   Scope scope;
 };
 
+/// One, or a list.
 std::vector<index::FragmentOptions> ReadHighlights(const Arguments& data) {
+  if (data.Any("highlight").isObject())
+    return {ReadFragmentOptions(data.Object("highlight", kFragmentMembers))};
   std::vector<index::FragmentOptions> highlights;
-  const auto read = [&](const Json::Value& item) {
-    highlights.push_back(ReadFragmentOptions(
-        Arguments(item, data.NameOf("highlight"), {"field", "frag_length", "num_fragments"})));
-  };
-  if (data.Any("highlight").isObject()) {
-    read(data.Any("highlight"));
-  } else {
-    for (const Json::Value& item : data.Array("highlight", kMaxHighlights)) read(item);
+  for (const Arguments& item : data.Objects("highlight", kMaxHighlights, kFragmentMembers)) {
+    highlights.push_back(ReadFragmentOptions(item));
   }
   return highlights;
 }
 
 void ReadSort(const Arguments& data, index::SearchOptions& options) {
   if (!data.Has("sort")) return;
-  const Arguments sort(data.Object("sort"), data.NameOf("sort"), {"field", "direction"});
+  const Arguments sort = data.Object("sort", {"field", "direction"});
   options.sort_field = sort.String("field", kMaxFieldName);
   const index::Field* field = index::FindField(options.sort_field);
   if (!field || field->slot < 0) {
@@ -60,8 +57,7 @@ void ReadSort(const Arguments& data, index::SearchOptions& options) {
 
 /// Who asked with what, told for statistics: checked, and nothing is decided by it.
 void CheckCollector(const Arguments& data) {
-  const Arguments collector(data.Any("collector"), data.NameOf("collector"),
-                            {"agent", "uid", "has_criteria"});
+  const Arguments collector = data.Object("collector", {"agent", "uid", "has_criteria"});
   collector.String("agent", kMaxCollectorText);
   collector.Integer("uid", 0, UINT32_MAX, 0);
   if (collector.Has("has_criteria") && !collector.Any("has_criteria").isBool()) {
@@ -83,8 +79,8 @@ SearchRequest ReadSearch(const Request& request) {
   const Arguments data(request.data, "data",
                        {"pre_query", "indice", "from", "size", "default_search_op", "load_field",
                         "lazy_field", "collector", "highlight", "fields", "filters", "sort"});
-  const Arguments pre_query(data.Object("pre_query"), "data.pre_query",
-                            {"keyword", "criteria_list", "file_type", "search_weight_list"});
+  const Arguments pre_query =
+      data.Object("pre_query", {"keyword", "criteria_list", "file_type", "search_weight_list"});
   SearchRequest search;
   QueryClauses clauses = ReadClauses(pre_query);
   const Filters filters = ReadFilters(data);

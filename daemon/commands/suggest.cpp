@@ -17,11 +17,11 @@ constexpr std::int64_t kMaxSuggestions = 100;
 std::vector<const Suggester*> ReadSuggesters(const Arguments& data) {
   std::vector<const Suggester*> chosen;
   for (const std::string& name : data.Strings("suggester", 16, 64)) {
-    const Suggester* suggester = FindSuggester(name);
-    if (!suggester) data.Refuse("suggester", "names an unknown one, " + Quoted(name));
-    if (std::find(chosen.begin(), chosen.end(), suggester) == chosen.end()) {
-      chosen.push_back(suggester);
+    const auto found = std::ranges::find(Suggesters(), name, &Suggester::name);
+    if (found == Suggesters().end()) {
+      data.Refuse("suggester", "names an unknown one, " + Quoted(name));
     }
+    if (std::ranges::count(chosen, &*found) == 0) chosen.push_back(&*found);
   }
   return chosen;
 }

@@ -123,9 +123,4 @@ std::span<const Suggester> Suggesters() {
   return kSuggesters;
 }
 
-const Suggester* FindSuggester(std::string_view name) {
-  const auto found = std::ranges::find(kSuggesters, name, &Suggester::name);
-  return found == kSuggesters.end() ? nullptr : &*found;
-}
-
 }  // namespace maru::daemon

@@ -34,7 +34,5 @@ struct Suggester {
 
 /// In the order in which they take turns.
 std::span<const Suggester> Suggesters();
-/// Null for an unknown name.
-const Suggester* FindSuggester(std::string_view name);
 
 }  // namespace maru::daemon

@@ -22,8 +22,7 @@ std::string Quoted(std::string_view text) {
   return "\"" + std::string(text.substr(0, end)) + "…\"";
 }
 
-Arguments::Arguments(const Json::Value& object, std::string where,
-                     std::initializer_list<std::string_view> known)
+Arguments::Arguments(const Json::Value& object, std::string where, Names known)
     : object_(object), where_(std::move(where)) {
   if (object_.isNull()) return;
   if (!object_.isObject()) {
@@ -113,11 +112,16 @@ std::vector<std::string> Arguments::Strings(const char* key, std::size_t max_ite
   return strings;
 }
 
-const Json::Value& Arguments::Object(const char* key) const {
-  static const Json::Value empty(Json::objectValue);
-  if (!Has(key)) return empty;
-  if (!Any(key).isObject()) Refuse(key, "is not an object");
-  return Any(key);
+Arguments Arguments::Object(const char* key, Names known) const {
+  return {Any(key), NameOf(key), known};
+}
+
+std::vector<Arguments> Arguments::Objects(const char* key, std::size_t max_items,
+                                          Names known) const {
+  std::vector<Arguments> objects;
+  for (const Json::Value& item : Array(key, max_items))
+    objects.push_back({item, NameOf(key), known});
+  return objects;
 }
 
 }  // namespace maru::daemon

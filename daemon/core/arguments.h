@@ -24,8 +24,8 @@ class Arguments {
  public:
   /// `where` names the object in messages ("data.pre_query"; empty for the request itself). A null
   /// value is an empty object; a member that is not among `known` is refused.
-  Arguments(const Json::Value& object, std::string where,
-            std::initializer_list<std::string_view> known);
+  using Names = std::initializer_list<std::string_view>;
+  Arguments(const Json::Value& object, std::string where, Names known);
 
   bool Has(const char* key) const;
   void Require(const char* key) const;
@@ -36,20 +36,22 @@ class Arguments {
                        std::int64_t fallback) const;
   /// Within [low, high]; it has to be there.
   double Number(const char* key, double low, double high) const;
-  /// An empty array when absent.
-  const Json::Value& Array(const char* key, std::size_t max_items) const;
   std::vector<std::string> Strings(const char* key, std::size_t max_items,
                                    std::size_t max_bytes) const;
-  /// An empty object when absent.
-  const Json::Value& Object(const char* key) const;
+  /// An object, empty when absent, and an array of objects.
+  Arguments Object(const char* key, Names known) const;
+  std::vector<Arguments> Objects(const char* key, std::size_t max_items, Names known) const;
   /// Whatever stands there; null when absent.
   const Json::Value& Any(const char* key) const;
 
-  /// "data.pre_query.keyword".
-  std::string NameOf(const char* key) const;
   [[noreturn]] void Refuse(const char* key, const std::string& why) const;
 
  private:
+  /// "data.pre_query.keyword".
+  std::string NameOf(const char* key) const;
+  /// An empty array when absent.
+  const Json::Value& Array(const char* key, std::size_t max_items) const;
+
   const Json::Value& object_;
   std::string where_;
 };

@@ -24,7 +24,7 @@ Json::Value Execute(Core& core, const Identity& caller, const std::string& line,
   const auto command = std::ranges::find(Commands(), name, &Command::name);
   if (command == Commands().end()) throw BadParameter("Unknown command " + Quoted(name));
   Json::Value reply(Json::objectValue);
-  Json::Value data = command->run({core, caller, envelope.Object("data"), output, cancelled});
+  Json::Value data = command->run({core, caller, envelope.Any("data"), output, cancelled});
   if (!data.isNull()) reply["data"] = std::move(data);
   reply["success"] = true;
   return reply;

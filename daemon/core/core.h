@@ -67,6 +67,7 @@ struct Request {
   Core& core;
   /// Who is connected, as the kernel says.
   const Identity& caller;
+  /// An object, null when empty; anything else its command refuses.
   const Json::Value& data;
   /// For replies of several messages.
   const Output& output;

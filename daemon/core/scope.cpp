@@ -73,8 +73,4 @@ std::unique_ptr<index::View> OpenView(const Core& core, const Scope& scope,
   return core.indices.Open(scope.Ids(), scope.eyes.identity, cancelled);
 }
 
-std::string FullPath(const ShareIndex& index, const std::string& path) {
-  return index.share->VolumePath() + path;
-}
-
 }  // namespace maru::daemon

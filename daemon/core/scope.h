@@ -58,7 +58,4 @@ void CheckIndexId(const std::string& id);
 std::unique_ptr<index::View> OpenView(const Core& core, const Scope& scope,
                                       const CancelCheck& cancelled);
 
-/// The volume path of a path within the share.
-std::string FullPath(const ShareIndex& index, const std::string& path);
-
 }  // namespace maru::daemon

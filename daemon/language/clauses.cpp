@@ -30,8 +30,8 @@ std::vector<index::FieldWeight> ReadWeights(const Arguments& arguments) {
       weights.push_back({std::string(field.name), field.weight});
     }
   }
-  for (const Json::Value& item : arguments.Array("search_weight_list", kMaxCriteria)) {
-    const Arguments row(item, arguments.NameOf("search_weight_list"), {"field", "weight"});
+  for (const Arguments& row :
+       arguments.Objects("search_weight_list", kMaxCriteria, {"field", "weight"})) {
     const Field& field = FieldNamed(row.String("field", kMaxFieldName));
     if (field.type != FieldType::kText) {
       throw BadParameter(std::string(field.name) + " is not a text field and has no weight");
@@ -44,8 +44,8 @@ std::vector<index::FieldWeight> ReadWeights(const Arguments& arguments) {
 }
 
 void ReadCriteria(const Arguments& arguments, QueryClauses& clauses) {
-  for (const Json::Value& item : arguments.Array("criteria_list", kMaxCriteria)) {
-    const Arguments row(item, arguments.NameOf("criteria_list"), {"field", "value"});
+  for (const Arguments& row :
+       arguments.Objects("criteria_list", kMaxCriteria, {"field", "value"})) {
     const Field& field = FieldNamed(row.String("field", kMaxFieldName));
     std::optional<Query> query = ParseCriterion(field, row.String("value", kMaxKeywordBytes));
     if (!query) continue;
@@ -69,8 +69,7 @@ QueryClauses ReadClauses(const Arguments& arguments) {
 
 Filters ReadFilters(const Arguments& arguments) {
   Filters filters;
-  for (const Json::Value& item : arguments.Array("filters", kMaxFilters)) {
-    const Arguments filter(item, arguments.NameOf("filters"), {"name", "data"});
+  for (const Arguments& filter : arguments.Objects("filters", kMaxFilters, {"name", "data"})) {
     const std::string name = filter.String("name", kMaxFilterData);
     if (name != "permission" && name != "file_type") {
       throw BadParameter("Unknown filter " + Quoted(name));
@@ -90,12 +89,12 @@ bool ReadAnyWord(const Arguments& arguments) {
 
 bool IsBlank(const QueryClauses& clauses) {
   return clauses.scored.empty() && clauses.filters.empty() &&
-         !ParseKeyword(clauses.keyword, {clauses.fields, false});
+         !ParseKeyword(clauses.keyword, clauses.fields);
 }
 
 Query ToQuery(const QueryClauses& clauses, bool any_word) {
   std::vector<Query> scored = clauses.scored;
-  if (auto keyword = ParseKeyword(clauses.keyword, {clauses.fields, any_word})) {
+  if (auto keyword = ParseKeyword(clauses.keyword, clauses.fields, any_word)) {
     scored.insert(scored.begin(), std::move(*keyword));
   }
   const bool everything = scored.empty() && !clauses.filters.empty();

@@ -116,7 +116,7 @@ std::optional<Query> ParseCriterion(const Field& field, const std::string& value
   if (text.empty()) return std::nullopt;
   switch (field.type) {
     case FieldType::kText:
-      return ParseKeyword(text, {{{std::string(field.name), 1}}, false});
+      return ParseKeyword(text, {{std::string(field.name), 1}});
     case FieldType::kKeyword:
       return field.name == index::kKind ? ParseKinds(text) : ExactCriterion(field, text);
     case FieldType::kFlag:

@@ -123,8 +123,8 @@ Query Without(Query::Kind kind, std::vector<Query> wanted, std::vector<Query> un
 
 class Parser {
  public:
-  Parser(std::vector<Token> tokens, const KeywordOptions& options)
-      : tokens_(std::move(tokens)), options_(options) {}
+  Parser(std::vector<Token> tokens, const std::vector<index::FieldWeight>& fields, bool any_word)
+      : tokens_(std::move(tokens)), fields_(fields), any_word_(any_word) {}
 
   /// Groups side by side, up to a closing parenthesis or the end; none without a word.
   std::optional<Query> List() {
@@ -133,14 +133,14 @@ class Parser {
       if (!Take(SideBySide())) Group(wanted, unwanted);
     }
     if (wanted.empty() && unwanted.empty()) return std::nullopt;
-    return Without(options_.any_word ? Query::Kind::kOr : Query::Kind::kAnd, std::move(wanted),
+    return Without(any_word_ ? Query::Kind::kOr : Query::Kind::kAnd, std::move(wanted),
                    std::move(unwanted));
   }
 
  private:
   /// The operator that says what standing side by side says; the other one binds tighter.
-  TokenKind SideBySide() const { return options_.any_word ? TokenKind::kOr : TokenKind::kAnd; }
-  TokenKind Tighter() const { return options_.any_word ? TokenKind::kAnd : TokenKind::kOr; }
+  TokenKind SideBySide() const { return any_word_ ? TokenKind::kOr : TokenKind::kAnd; }
+  TokenKind Tighter() const { return any_word_ ? TokenKind::kAnd : TokenKind::kOr; }
 
   bool Take(TokenKind kind) {
     if (at_ >= tokens_.size() || tokens_[at_].kind != kind) return false;
@@ -158,7 +158,7 @@ class Parser {
     } while (Take(Tighter()));
     if (with.empty() && without.size() == 1) {
       unwanted.push_back(std::move(without[0]));
-    } else if (options_.any_word) {
+    } else if (any_word_) {
       if (with.empty() && without.empty()) return;
       wanted.push_back(Without(Query::Kind::kAnd, std::move(with), std::move(without)));
     } else {
@@ -200,15 +200,16 @@ class Parser {
 
   Query Node(Query::Kind kind, std::vector<std::string> words, bool exact) const {
     Query query;
-    query.kind = options_.fields.empty() ? Query::Kind::kNothing : kind;
+    query.kind = fields_.empty() ? Query::Kind::kNothing : kind;
     query.words = std::move(words);
-    query.fields = options_.fields;
+    query.fields = fields_;
     query.exact = exact;
     return query;
   }
 
   std::vector<Token> tokens_;
-  const KeywordOptions& options_;
+  const std::vector<index::FieldWeight>& fields_;
+  const bool any_word_;
   std::size_t at_ = 0;
   unsigned terms_ = 0;
   std::size_t words_ = 0;
@@ -216,13 +217,14 @@ class Parser {
 
 }  // namespace
 
-std::optional<Query> ParseKeyword(std::string_view text, const KeywordOptions& options) {
+std::optional<Query> ParseKeyword(std::string_view text,
+                                  const std::vector<index::FieldWeight>& fields, bool any_word) {
   if (text.size() > kMaxKeywordBytes) {
     throw BadParameter("The keyword is longer than " + std::to_string(kMaxKeywordBytes) + " bytes");
   }
   const std::vector<Token> tokens = Tokenize(text);
   if (tokens.empty() && text.find('"') == std::string_view::npos) return std::nullopt;
-  Parser parser(WithOperands(Paired(tokens)), options);
+  Parser parser(WithOperands(Paired(tokens)), fields, any_word);
   std::optional<Query> query = parser.List();
   return query ? std::move(query) : Nothing();
 }

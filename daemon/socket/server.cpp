@@ -297,16 +297,12 @@ std::size_t Server::UnreadOf(uid_t user) const {
 }
 
 bool Server::IsOverdue(const Connection& connection) const {
-  const auto age = Clock::now() - connection.since;
-  switch (connection.state) {
-    case Connection::State::kReading:
-      return age > (connection.WithinLine() ? limits_.line : limits_.idle);
-    case Connection::State::kWorking:
-      return false;
-    case Connection::State::kWriting:
-      return age > limits_.send;
-  }
-  return false;
+  if (connection.state == Connection::State::kWorking) return false;
+  const bool reading = connection.state == Connection::State::kReading;
+  const auto limit = !reading                  ? limits_.send
+                     : connection.WithinLine() ? limits_.line
+                                               : limits_.idle;
+  return Clock::now() - connection.since > limit;
 }
 
 void Server::Sweep() {

@@ -15,7 +15,7 @@ namespace {
 
 /// The query as text, without the field behind each word.
 std::string Read(const std::string& keyword, bool any_word = false) {
-  const auto query = ParseKeyword(keyword, {{{"F", 1}}, any_word});
+  const auto query = ParseKeyword(keyword, {{"F", 1}}, any_word);
   if (!query) return "blank";
   std::string text = Explain(*query);
   for (std::size_t at; (at = text.find("@F:1")) != std::string::npos;) text.erase(at, 4);
