@@ -39,6 +39,12 @@ std::vector<std::string> Planner::Expand(const Query& query, std::string_view fi
 }
 
 Plan Planner::MakeWord(const Query& query) {
+  // Charged by its form: what a query costs must not tell which words documents have.
+  const std::size_t most = query.kind == Query::Kind::kPrefix ? Query::kMaxExpansion
+                           : query.exact                      ? 1
+                                                              : 1 + Query::kMaxForms;
+  terms_ += query.fields.size() * most;
+  if (terms_ > Query::kMaxTerms) throw BadQuery("The query is too large");
   std::vector<Plan> any;
   for (const FieldWeight& where : query.fields) {
     const Field& field = FieldOf(where.field, {FieldType::kText});
@@ -48,7 +54,6 @@ Plan Planner::MakeWord(const Query& query) {
                         .Scaled(where.weight * (other_form ? kFormWeight : 1)));
     }
   }
-  if ((terms_ += any.size()) > Query::kMaxTerms) throw BadQuery("The query is too large");
   return Plan(Plan::Kind::kOr, std::move(any));
 }
 

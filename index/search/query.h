@@ -42,11 +42,13 @@ struct Query {
   std::vector<Query> parts;
 
   static constexpr unsigned kMaxExpansion = 100;
+  /// Other words of its stem that a word is widened to.
+  static constexpr unsigned kMaxForms = 12;
 
   friend bool operator==(const Query&, const Query&) = default;
 
-  /// Deepest tree, most nodes and, with all words widened, most terms the index takes; a larger one
-  /// is refused with an Error.
+  /// Deepest tree, most nodes and, with all words widened to as many as they could be, most terms
+  /// the index takes; a larger one is refused with an Error, whatever stands in the index.
   static constexpr unsigned kMaxDepth = 32;
   static constexpr unsigned kMaxNodes = 4096;
   static constexpr std::size_t kMaxTerms = 32'768;

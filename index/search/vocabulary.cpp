@@ -22,7 +22,6 @@ namespace {
 
 constexpr char kForms = 'f';
 constexpr char kBeginnings = 'b';
-constexpr std::size_t kMaxForms = 12;
 /// Words of a vocabulary looked at for forms of one word, and for spellings of one.
 constexpr unsigned kMaxFormCandidates = 2000;
 constexpr unsigned kMaxSpellings = 400'000;
@@ -108,7 +107,7 @@ Words Widening::In(const Xapian::Database& database, std::string_view field_pref
   const std::string begin = TermOf(field_prefix, begin_);
   unsigned candidates = 0;
   for (auto term = database.allterms_begin(begin); term != database.allterms_end(begin); ++term) {
-    if (++candidates > kMaxFormCandidates || words.size() > kMaxForms) break;
+    if (++candidates > kMaxFormCandidates || words.size() > Query::kMaxForms) break;
     std::string word = (*term).substr(field_prefix.size());
     if (word != word_ && Takes(word)) words.push_back({std::move(word), term.get_termfreq()});
   }
@@ -193,7 +192,7 @@ std::vector<std::string> Vocabulary::FormsOf(const std::string& word, std::strin
   std::vector<std::string> forms;
   for (WordCount& row : Widened(kForms, word, field_prefix)) {
     if (exact && row.word != word) continue;
-    if (forms.size() <= kMaxForms) forms.push_back(std::move(row.word));
+    if (forms.size() <= Query::kMaxForms) forms.push_back(std::move(row.word));
   }
   return forms;
 }

@@ -63,7 +63,6 @@ class TextWriter {
   TextPlace Append(std::string_view packed);
   /// All appended is on the disk afterwards.
   void Sync();
-  std::uint32_t CurrentSegment() const { return segment_; }
   /// Begins a new segment with the next text.
   void Turn();
   std::map<std::uint32_t, std::uint64_t> SegmentSizes() const;
