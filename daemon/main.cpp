@@ -11,10 +11,10 @@
 #include <string>
 
 #include "daemon/core.h"
-#include "daemon/history.h"
 #include "daemon/listener.h"
 #include "daemon/privilege.h"
 #include "daemon/server.h"
+#include "history/newest.h"
 #include "system/config.h"
 #include "system/log.h"
 
@@ -61,7 +61,7 @@ void Serve(const Config& config) {
   LibraryIndices indices(config.state_dir + "/index");
   UsageStore usage(config.state_dir + "/usage.db");
   Core core{.indices = indices, .usage = usage};
-  core.history = EarlierSearches;
+  core.history = history::NewestSearches;
   Server server(core, listener.Socket(), identity.uid, {});
   running = &server;
   for (const int signal : {SIGTERM, SIGINT}) std::signal(signal, OnSignal);

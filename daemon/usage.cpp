@@ -6,7 +6,7 @@
 #include <set>
 
 #include "common/error.h"
-#include "platform/marudbquery.h"
+#include "history/marudbquery.h"
 #include "system/log.h"
 
 namespace maru::daemon {

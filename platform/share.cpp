@@ -15,6 +15,7 @@
 #include "system/share_table.h"
 #include "system/volume_path.h"
 
+using maru::CopyOut;
 using maru::Fail;
 using maru::Guarded;
 using maru::ShareSettings;
@@ -43,13 +44,6 @@ char* Duplicate(const std::string& text) {
 
 MARUSHARE* NewRecord(const ShareSettings& settings) {
   return new MARUSHARE{Duplicate(settings.name), Duplicate(settings.VolumePath()), settings.deny};
-}
-
-bool CopyText(std::string_view text, char* buffer, std::size_t size) {
-  if (!buffer || text.size() >= size) return false;
-  memcpy(buffer, text.data(), text.size());
-  buffer[text.size()] = '\0';
-  return true;
 }
 
 }  // namespace
@@ -96,7 +90,7 @@ int MARUShareNamePathGet(const char* volume_path, char* name, std::size_t name_s
     maru::VolumePath place;
     if (!maru::SplitVolumePath(volume_path, place)) return Fail(kErrBadParameter, -1);
     if (!ShareTable::Current()->Find(std::string(place.share))) return Fail(kErrNotFound, -1);
-    if (!CopyText(place.share, name, name_size) || !CopyText(place.folder, share_path, path_size)) {
+    if (!CopyOut(place.share, name, name_size) || !CopyOut(place.folder, share_path, path_size)) {
       return Fail(kErrBadParameter, -1);
     }
     return 0;

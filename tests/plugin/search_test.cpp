@@ -11,7 +11,7 @@
 #include "plugin/plugin.h"
 #include "support/fake_daemon.h"
 #include "system/json.h"
-#include "system/preference.h"
+#include "system/preferences.h"
 
 namespace {
 
@@ -27,7 +27,7 @@ class Search : public PluginTest {
     PluginTest::SetUp();
     if (IsSkipped()) return;
     unlink(kQueryFile);
-    maruseeker::pref::Preference(60001).Set<bool>("enable_history", false);
+    maru::Preferences(60001).Set("enable_history", false);
   }
 
   static Answer Find(const Login& login, const std::string& more = "") {
