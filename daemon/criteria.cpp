@@ -68,9 +68,8 @@ Query AnyOf(std::vector<Query> queries) {
 std::string StoredValue(const Field& field, const std::string& value) {
   if (field.name == index::kOwner) {
     if (value.find_first_not_of("0123456789") == std::string::npos) return value;
-    Identity owner;
-    if (value.find('\0') != std::string::npos || !IdentityOfUser(value, owner)) return {};
-    return std::to_string(owner.uid);
+    const auto owner = IdentityOfUser(value);
+    return owner ? std::to_string(owner->uid) : std::string();
   }
   if (field.name == index::kExtension && value[0] == '.') return index::Fold(value.substr(1));
   return index::Fold(value);

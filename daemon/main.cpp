@@ -15,7 +15,9 @@
 #include "daemon/privilege.h"
 #include "daemon/server.h"
 #include "history/newest.h"
+#include "system/accounts.h"
 #include "system/config.h"
+#include "system/daemon_connection.h"
 #include "system/log.h"
 
 namespace {
@@ -32,13 +34,13 @@ void OnSignal(int) {
 }
 
 /// Whom the process will be: the service account for root, else who it is.
-Identity FutureIdentity(const std::string& account) {
-  Identity identity;
-  const bool known =
-      geteuid() == 0 ? IdentityOfUser(account, identity) : IdentityOfUID(geteuid(), identity);
-  if (!known && geteuid() == 0) throw std::runtime_error("There is no account " + account);
-  if (!known) identity.uid = geteuid();
-  return identity;
+Identity FutureIdentity() {
+  const bool root = geteuid() == 0;
+  const auto identity = root ? IdentityOfUser(kServiceAccount) : IdentityOfUID(geteuid());
+  if (!identity && root) {
+    throw std::runtime_error(std::string("There is no account ") + kServiceAccount);
+  }
+  return identity.value_or(Identity{geteuid(), {}});
 }
 
 void RaiseDescriptorLimit() {
@@ -51,9 +53,9 @@ void RaiseDescriptorLimit() {
 void Serve(const Config& config) {
   umask(077);
   RaiseDescriptorLimit();
-  const Identity identity = FutureIdentity(config.service_account);
-  const Listener listener(config.daemon_socket, identity);
-  DropPrivileges(config.service_account);
+  const Identity identity = FutureIdentity();
+  const Listener listener(kDaemonSocket, identity);
+  DropPrivileges(kServiceAccount);
   if (!MayExamineAllFiles()) {
     MARU_LOG("Running without CAP_DAC_READ_SEARCH: only files that user %u can reach are shown",
              geteuid());

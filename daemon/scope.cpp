@@ -57,13 +57,11 @@ Eyes EyesOf(const Identity& caller, const std::vector<std::string>& users) {
   for (const std::string& other : users) {
     if (other != user) return Blind();
   }
-  Identity named;
-  if (user.empty() || user.find('\0') != std::string::npos || !IdentityOfUser(user, named)) {
-    return Blind();
-  }
+  const auto named = IdentityOfUser(user);
+  if (!named) return Blind();
   if (caller.unrestricted) {
-    eyes.identity = named;
-  } else if (named.uid != caller.uid) {
+    eyes.identity = *named;
+  } else if (named->uid != caller.uid) {
     return Blind();
   }
   eyes.user_name = user;

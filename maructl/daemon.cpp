@@ -4,14 +4,13 @@
 #include <cstring>
 #include <stdexcept>
 
-#include "system/config.h"
 #include "system/json.h"
 
 namespace maru::control {
 
-Daemon::Daemon() : connection_(Config::Get().daemon_socket) {
+Daemon::Daemon() : connection_(kDaemonSocket) {
   if (!connection_.Connect()) {
-    throw std::runtime_error("the search daemon does not answer at " + Config::Get().daemon_socket +
+    throw std::runtime_error(std::string("the search daemon does not answer at ") + kDaemonSocket +
                              ": " + std::strerror(errno));
   }
 }

@@ -73,13 +73,13 @@ int MARUShareUserPrivGet(const char* user_name, const MARUSHARE* share) {
                 int{kSharePrivReadOnly} == maru::kSharePrivReadOnly &&
                 int{kSharePrivNone} == maru::kSharePrivNone);
   return Guarded("MARUShareUserPrivGet", -1, [&] {
-    maru::Identity identity;
     const auto table = ShareTable::Current();
     const ShareSettings* settings = table->Find(share->szName);
     if (!settings) return Fail(kErrNotFound, -1);
-    if (!maru::IdentityOfUser(user_name, identity)) return static_cast<int>(kSharePrivNone);
+    const std::optional<maru::Identity> identity = maru::IdentityOfUser(user_name);
+    if (!identity) return static_cast<int>(kSharePrivNone);
     if (MLIBGroupIsAdminGroupMem(user_name, 0) == 1) return static_cast<int>(kSharePrivReadWrite);
-    return maru::PrivilegeOf(*settings, user_name, identity);
+    return maru::PrivilegeOf(*settings, user_name, *identity);
   });
 }
 

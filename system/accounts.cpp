@@ -125,6 +125,11 @@ thread_local Answers recent;
 }  // namespace
 
 std::optional<Account> AccountByName(const std::string& name) {
+  // The C library would read but its beginning.
+  if (name.find('\0') != std::string::npos) {
+    errno = 0;
+    return std::nullopt;
+  }
   return recent.by_name.Get(name, [&] { return LookUpName(name); });
 }
 

@@ -59,7 +59,7 @@ std::string CopyPath(const Config& config) {
 /// Keeps the last good settings for a start with bad ones. Only root and the service keep a copy;
 /// a root without the right to write into the service's folder leaves it to the service.
 void KeepCopy(const Config& config, const std::string& text) {
-  const std::optional<Account> service = AccountByName(config.service_account);
+  const std::optional<Account> service = AccountByName(kServiceAccount);
   if (!service || (geteuid() != 0 && geteuid() != service->uid)) return;
   std::string kept;
   const std::string path = CopyPath(config);

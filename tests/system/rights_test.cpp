@@ -34,7 +34,7 @@ std::string Raw(const std::vector<Entry>& entries) {
 std::vector<Identity> Users() {
   std::vector<Identity> users;
   for (const char* name : {"alice", "bob", "carol"}) {
-    EXPECT_TRUE(maru::IdentityOfUser(name, users.emplace_back()));
+    users.push_back(maru::IdentityOfUser(name).value());
   }
   // Of many groups and of none, known to no name service.
   users.push_back({61001, {60001, 60101, 60102, 61001}});

@@ -38,7 +38,7 @@ TEST(Configuration, NamesTheBadLineAndKeepsWhatItHas) {
   for (const std::string bad :
        {"listen_port = 0", "listen_port = 65536", "listen_port = 80x", "listen_port =",
         "listen_port = 99999999999", "behind_proxy = maybe", "state_dir = relative",
-        "state_dir =", "listen_prot = 80", "no equals", "service_account = two words"}) {
+        "state_dir =", "listen_prot = 80", "no equals", "web_account = two words"}) {
     try {
       Config::Load(folder.Write("conf", "\n" + bad + "\n"));
       ADD_FAILURE() << bad;
@@ -48,6 +48,19 @@ TEST(Configuration, NamesTheBadLineAndKeepsWhatItHas) {
   }
   EXPECT_THROW(Config::Load(folder / "none"), std::runtime_error);
   EXPECT_EQ(Config::Get().listen_port, 7);
+}
+
+TEST(Configuration, SaysWhichSettingsAreNoMore) {
+  const TempFolder folder;
+  for (const std::string former : {"service_account = MaruSeeker", "daemon_socket = /run/x"}) {
+    try {
+      Config::Load(folder.Write("conf", former + "\n"));
+      ADD_FAILURE() << former;
+    } catch (const std::runtime_error& error) {
+      EXPECT_THAT(error.what(),
+                  HasSubstr("conf:1: \"" + former + "\" is no longer a setting: the "));
+    }
+  }
 }
 
 TEST(Administrators, AreMembersOfTheGroupThatIsSet) {

@@ -88,9 +88,7 @@ TEST(ShareTable, NamesTheBadLine) {
 
 int Privilege(const std::string& lines, const std::string& user = "alice") {
   const ShareTable table = ShareTable::Parse("[photo]\npath = /a\n" + lines);
-  Identity who;
-  EXPECT_TRUE(IdentityOfUser(user, who));
-  return PrivilegeOf(table.Shares().front(), user, who);
+  return PrivilegeOf(table.Shares().front(), user, IdentityOfUser(user).value());
 }
 
 TEST(SharePrivilege, FollowsSambasOrder) {
