@@ -8,7 +8,6 @@
 #include "system/config.h"
 #include "system/json.h"
 #include "system/keep_errno.h"
-#include "system/whole_file.h"
 
 namespace maru {
 namespace {
@@ -19,18 +18,12 @@ constexpr PreferenceKey kKeys[] = {
     {"max_fragment_num", false, 3, 1, 100},
 };
 
-constexpr std::size_t kMaxFile = 64u << 10;
-
 /// What the file holds; an empty object when it cannot be read.
 Json::Value Read(const std::string& path) {
   const KeepErrno keep;
-  std::string text;
   Json::Value values;
-  if (!ReadWholeFile(path, kMaxFile, text) || !json::FromString(text, values) ||
-      !values.isObject()) {
-    values = Json::Value(Json::objectValue);
-  }
-  return values;
+  if (json::FromFile(path, values) && values.isObject()) return values;
+  return Json::Value(Json::objectValue);
 }
 
 bool InBounds(const PreferenceKey& key, int number) {
@@ -65,7 +58,7 @@ bool Preferences::Set(const std::string& name, int value) const {
   const std::string folder = path_.substr(0, path_.rfind('/'));
   // The folder may be passed through by everyone, so that each user reaches the own file.
   if (mkdir(folder.c_str(), 0711) != 0 && errno != EEXIST) return false;
-  return WriteWholeFile(path_, json::ToString(values) + "\n", 0600, uid_);
+  return json::ToFile(values, path_, uid_);
 }
 
 }  // namespace maru
