@@ -222,7 +222,7 @@ void SearchAPI::Search() {
   if (!query_id_.empty() && unlink(query_info_file.c_str()) == 0) named_in_file.reset();
 }
 
-/// Ends the older query of the same client and notes this one instead, or throws when this one is
+/// Ends the client's older query and notes this one instead, or throws when this one is
 /// the older. False when the note cannot be written. Members of the file that are nobody's here
 /// stay.
 bool SearchAPI::TakeOver(const string& query_info_file) const {
