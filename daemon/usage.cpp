@@ -35,7 +35,7 @@ double Boost(double own, double others) {
 }
 
 maruseeker::Error StoreFailed(const char* why) {
-  return maruseeker::Error(maruseeker::kErrorDaemonExchange,
+  return maruseeker::Error(maruseeker::kErrorStorage,
                            std::string("The opening cannot be stored: ") + why);
 }
 

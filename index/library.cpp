@@ -170,7 +170,7 @@ std::vector<std::string> Library::IndexIds() const {
 std::unique_ptr<Reader> Library::Open(const std::vector<std::string>& index_ids) {
   for (const std::string& id : index_ids) {
     if (!Has(id)) {
-      throw maruseeker::Error(maruseeker::kErrorDaemonExchange, "There is no index " + id);
+      throw maruseeker::Error(maruseeker::kErrorStorage, "There is no index " + id);
     }
   }
   const auto open = [&]() -> std::unique_ptr<OpenIndices> {

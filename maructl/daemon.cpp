@@ -1,17 +1,15 @@
 #include "maructl/daemon.h"
 
-#include <cerrno>
-#include <cstring>
 #include <stdexcept>
 
 #include "system/json.h"
+#include "system/throw_errno.h"
 
 namespace maru::control {
 
 Daemon::Daemon() : connection_(kDaemonSocket) {
   if (!connection_.Connect()) {
-    throw std::runtime_error(std::string("the search daemon does not answer at ") + kDaemonSocket +
-                             ": " + std::strerror(errno));
+    ThrowErrno(std::string("the search daemon does not answer at ") + kDaemonSocket);
   }
 }
 

@@ -1,7 +1,5 @@
-#include <cerrno>
 #include <charconv>
 #include <cstdio>
-#include <cstring>
 #include <optional>
 #include <stdexcept>
 
@@ -9,6 +7,7 @@
 #include "system/accounts.h"
 #include "system/preferences.h"
 #include "system/text.h"
+#include "system/throw_errno.h"
 
 namespace maru::control {
 namespace {
@@ -48,7 +47,7 @@ int GetPreference(const std::string& user, const std::string& key) {
 int SetPreference(const std::string& user, const std::string& key, const std::string& value) {
   const Preferences preferences = PreferencesOf(user);
   if (!preferences.Set(key, FindPreference(key).is_flag ? Flag(value) : Number(value))) {
-    throw std::runtime_error(std::string("cannot store it: ") + std::strerror(errno));
+    ThrowErrno("cannot store it");
   }
   return kGood;
 }

@@ -4,7 +4,6 @@
 #include <stdlib.h>
 #include <string.h>
 
-#include <algorithm>
 #include <new>
 #include <string_view>
 

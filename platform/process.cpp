@@ -16,7 +16,6 @@ thread_local int last_error = 0;
 
 /// From now on the process has a low priority: nobody waits for it.
 void GiveWay() {
-  const maru::KeepErrno keep;
   const sched_param none{};
   sched_setscheduler(0, SCHED_BATCH, &none);
   setpriority(PRIO_PROCESS, 0, kFollowUpNice);

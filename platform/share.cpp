@@ -77,9 +77,9 @@ int MARUShareUserPrivGet(const char* user_name, const MARUSHARE* share) {
     const ShareSettings* settings = table->Find(share->szName);
     if (!settings) return Fail(kErrNotFound, -1);
     const std::optional<maru::Identity> identity = maru::IdentityOfUser(user_name);
-    if (!identity) return static_cast<int>(kSharePrivNone);
-    if (MLIBGroupIsAdminGroupMem(user_name, 0) == 1) return static_cast<int>(kSharePrivReadWrite);
-    return maru::PrivilegeOf(*settings, user_name, *identity);
+    if (!identity) return int{kSharePrivNone};
+    if (MLIBGroupIsAdminGroupMem(user_name, 0) == 1) return int{kSharePrivReadWrite};
+    return int{maru::PrivilegeOf(*settings, user_name, *identity)};
   });
 }
 

@@ -1,7 +1,6 @@
 #include "system/config.h"
 
 #include <errno.h>
-#include <string.h>
 
 #include <charconv>
 #include <mutex>
@@ -11,6 +10,7 @@
 
 #include "system/keep_errno.h"
 #include "system/text.h"
+#include "system/throw_errno.h"
 #include "system/whole_file.h"
 
 namespace maru {
@@ -126,7 +126,7 @@ const Config& LoadLocked(const std::string& path, bool may_be_missing) {
   const KeepErrno keep;
   std::string text;
   if (!ReadWholeFile(path, kMaxFile, text, Link::kFollow) && !(may_be_missing && errno == ENOENT)) {
-    throw std::runtime_error(path + ": " + strerror(errno));
+    ThrowErrno(path);
   }
   current = Parse(path, text);
   loaded = true;

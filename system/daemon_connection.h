@@ -32,7 +32,7 @@ class SockConnection {
   virtual bool Connect() = 0;
   /// Sends one message; a text with a line break or over kMaxMessage is refused (EMSGSIZE, EINVAL).
   bool Send(const std::string& message);
-  /// Receives exactly one whole message, without its line end.
+  /// Takes the next message, the whole of it, without its line end.
   bool Recv(std::string& message);
   void Disconnect();
 

@@ -6,7 +6,7 @@
 
 namespace maru {
 
-/// A file descriptor that its scope closes. For this room.
+/// A file descriptor that its scope closes.
 class UniqueFd {
  public:
   explicit UniqueFd(int descriptor = -1) : descriptor_(descriptor) {}

@@ -2,7 +2,7 @@
 
 #include <string_view>
 
-/// "/volume1/NAME/rest" taken apart, by its text alone. For this room.
+/// "/volume1/NAME/rest" taken apart, by its text alone.
 namespace maru {
 
 struct VolumePath {
