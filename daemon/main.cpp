@@ -8,11 +8,13 @@
 
 #include "daemon/core/capability.h"
 #include "daemon/core/core.h"
-#include "daemon/history.h"
 #include "daemon/socket/listener.h"
 #include "daemon/socket/server.h"
+#include "history/newest.h"
 #include "program/program.h"
+#include "system/accounts.h"
 #include "system/config.h"
+#include "system/daemon_connection.h"
 #include "system/log.h"
 
 namespace {
@@ -29,21 +31,21 @@ void OnSignal(int) {
 }
 
 /// Whom the process will be: the service account for root, else who it is.
-Identity FutureIdentity(const std::string& account) {
-  Identity identity;
-  const bool known =
-      geteuid() == 0 ? IdentityOfUser(account, identity) : IdentityOfUID(geteuid(), identity);
-  if (!known && geteuid() == 0) throw std::runtime_error("There is no account " + account);
-  if (!known) identity.uid = geteuid();
-  return identity;
+Identity FutureIdentity() {
+  const bool root = geteuid() == 0;
+  const auto identity = root ? IdentityOfUser(kServiceAccount) : IdentityOfUID(geteuid());
+  if (!identity && root) {
+    throw std::runtime_error(std::string("There is no account ") + kServiceAccount);
+  }
+  return identity.value_or(Identity{geteuid(), {}});
 }
 
 int Serve(const Config& config) {
   umask(077);
   RaiseDescriptorLimit();
-  const Identity identity = FutureIdentity(config.service_account);
-  const Listener listener(config.daemon_socket, identity);
-  DropPrivileges(config.service_account);
+  const Identity identity = FutureIdentity();
+  const Listener listener(kDaemonSocket, identity);
+  DropPrivileges(kServiceAccount);
   if (!HoldsReadSearch()) {
     MARU_LOG("Running without CAP_DAC_READ_SEARCH: only files that user %u can reach are shown",
              geteuid());
@@ -51,7 +53,7 @@ int Serve(const Config& config) {
   LibraryIndices indices(config.state_dir + "/index");
   UsageStore usage(config.state_dir + "/usage.db");
   Core core{.indices = indices, .usage = usage};
-  core.history = EarlierSearches;
+  core.history = history::NewestSearches;
   Server server(core, listener.Socket(), identity.uid, {});
   running = &server;
   for (const int signal : {SIGTERM, SIGINT}) std::signal(signal, OnSignal);

@@ -17,11 +17,8 @@ namespace maru::indexer {
 namespace {
 
 Account ServiceAccount() {
-  const std::string& name = Config::Get().service_account;
-  const std::optional<Account> account = AccountByName(name);
-  if (!account) {
-    throw std::runtime_error("There is no account " + name + " (setting service_account)");
-  }
+  const std::optional<Account> account = AccountByName(kServiceAccount);
+  if (!account) throw std::runtime_error(std::string("There is no account ") + kServiceAccount);
   return *account;
 }
 
@@ -54,7 +51,7 @@ Sight SettleIdentity() {
   if (geteuid() == 0) {
     const Account account = ServiceAccount();
     MakeFolders(&account);
-    BecomeForGood(Config::Get().service_account, Kept::kReadSearch);
+    BecomeForGood(kServiceAccount, Kept::kReadSearch);
   } else {
     MakeFolders(nullptr);
     GiveUpNewPrivileges();

@@ -4,13 +4,12 @@
 #include <stdlib.h>
 #include <string.h>
 
-#include <algorithm>
 #include <new>
 #include <string_view>
 
 #include "platform/guard.h"
 #include "system/accounts.h"
-#include "system/config.h"
+#include "system/acting.h"
 #include "system/share_table.h"
 
 using maru::Account;
@@ -78,8 +77,7 @@ int MARUServiceHomePathGet(const char* user_name, char* path, std::size_t size) 
     const maru::ShareSettings* homes = table->Find(maru::kHomesShare);
     if (!homes || !homes->available) return Fail(kErrNotFound, -1);
     const std::string home = homes->VolumePath() + "/" + HomeFolder(*account, homes->path);
-    if (home.size() >= size) return Fail(kErrBadParameter, -1);
-    memcpy(path, home.c_str(), home.size() + 1);
+    if (!maru::CopyOut(home, path, size)) return Fail(kErrBadParameter, -1);
     return static_cast<int>(home.size());
   });
 }
@@ -89,11 +87,8 @@ int MLIBGroupIsAdminGroupMem(const char* user_name, int) {
   return Guarded("MLIBGroupIsAdminGroupMem", -1, [&] {
     const std::optional<Account> account = maru::AccountByName(user_name);
     if (!account) return Fail(LookupError(), -1);
-    const std::optional<gid_t> admins = maru::GroupByName(maru::Config::Get().admin_group);
-    if (!admins) return errno == 0 ? 0 : Fail(kErrSystem, -1);
-    const auto groups = maru::GroupsOf(*account);
-    if (!groups) return Fail(kErrSystem, -1);
-    return std::find(groups->begin(), groups->end(), *admins) != groups->end() ? 1 : 0;
+    if (maru::IsAdministrator(*account)) return 1;
+    return errno == 0 ? 0 : Fail(kErrSystem, -1);
   });
 }
 
@@ -114,4 +109,9 @@ MLIBCSzList* MLIBGroupInfoListGet(const char* user_name, bool with_primary) {
     }
     return list;
   });
+}
+
+bool ResetCredentialsByName(const std::string& user_name, bool groups) {
+  return Guarded("ResetCredentialsByName", false,
+                 [&] { return maru::ActAs(user_name, groups) || Fail(LookupError(), false); });
 }

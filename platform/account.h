@@ -28,7 +28,7 @@ void MARUUserFree(MARUUSER* user);
 /// Whether users have home folders in the share "homes": it is configured and available.
 bool MARUServiceUserHomeIsEnabled(int auth_type, const char* user_name);
 
-/// Writes the user's home folder as a volume path ("/volume1/homes/NAME") and returns its length,
+/// Writes where the user's home is, a volume path ("/volume1/homes/NAME"), and returns its length,
 /// or -1 when the user is unknown, there are no homes, or the path does not fit `size` bytes. The
 /// folder itself need not exist yet.
 int MARUServiceHomePathGet(const char* user_name, char* path, std::size_t size);

@@ -7,35 +7,33 @@
 
 #include <algorithm>
 #include <charconv>
-#include <cstring>
 #include <string_view>
 
 #include "platform/account.h"
 #include "platform/guard.h"
 #include "system/accounts.h"
-#include "system/config.h"
 #include "system/share_table.h"
 #include "system/unique_fd.h"
 #include "system/volume_path.h"
 
 namespace {
 
-bool ToIdentity(const char* user_name, const MLIBCSzList* groups, maru::Identity& identity) {
+/// The user with these groups; administrators may all. Nothing when the user is unknown.
+std::optional<maru::Identity> IdentityWith(const char* user_name, const MLIBCSzList* groups) {
   const std::optional<maru::Account> account = maru::AccountByName(user_name);
-  if (!account) return false;
-  identity.uid = account->uid;
+  std::optional<maru::Identity> who = maru::IdentityOfUser(user_name);
+  if (!account || !who) return std::nullopt;
+  who->groups.clear();
   for (int i = 0; i < MLIBCSzListCount(groups); ++i) {
-    const char* text = MLIBCSzListGet(groups, i);
-    gid_t gid = 0;
-    const char* end = text + strlen(text);
-    if (std::from_chars(text, end, gid).ptr != end) return false;
-    identity.groups.push_back(gid);
+    const std::string_view text = MLIBCSzListGet(groups, i);
+    const char* end = text.data() + text.size();
+    if (std::from_chars(text.data(), end, who->groups.emplace_back()).ptr != end) {
+      return std::nullopt;
+    }
   }
-  std::sort(identity.groups.begin(), identity.groups.end());
-  identity.unrestricted = account->uid == 0 ||
-                          account->name == maru::Config::Get().service_account ||
-                          MLIBGroupIsAdminGroupMem(user_name, 0) == 1;
-  return true;
+  std::sort(who->groups.begin(), who->groups.end());
+  who->unrestricted = who->unrestricted || maru::IsAdministrator(*account);
+  return who;
 }
 
 bool IsLink(int descriptor) {
@@ -89,15 +87,17 @@ int MARUACLPermCalc(const char* user_name, const MLIBCSzList* groups, const char
     return -1;
   }
   return maru::Guarded("MARUACLPermCalc", -1, [&] {
-    maru::Identity who;
     maru::VolumePath place;
-    if (!maru::SplitVolumePath(path, place) ||
-        !maru::ShareTable::Current()->Find(std::string(place.share)) ||
-        !ToIdentity(user_name, groups, who)) {
+    std::optional<maru::Identity> who;
+    if (maru::SplitVolumePath(path, place) &&
+        maru::ShareTable::Current()->Find(std::string(place.share))) {
+      who = IdentityWith(user_name, groups);
+    }
+    if (!who) {
       errno = ENOENT;
       return -1;
     }
-    const int walked = Walk(who, std::string(place.folder), place.rest);
+    const int walked = Walk(*who, std::string(place.folder), place.rest);
     if (walked < 0) return -1;
     errno = 0;
     *bits = walked;

@@ -1,24 +1,18 @@
 #include "platform/file_index.h"
 
 #include <string.h>
-#include <sys/stat.h>
 
 #include "platform/guard.h"
 #include "system/config.h"
 #include "system/index_id.h"
+#include "system/indexed_shares.h"
 #include "system/share_table.h"
 #include "system/volume_path.h"
 
 namespace {
 
-int CopyOut(const std::string& text, char* buffer, std::size_t size) {
-  if (!buffer || text.size() >= size) return maru::Fail(kErrBadParameter, -1);
-  memcpy(buffer, text.c_str(), text.size() + 1);
-  return 0;
-}
-
-std::string IndexFolder(const std::string& share_name) {
-  return maru::Config::Get().state_dir + "/index/" + maru::IndexIdOf(share_name);
+int Answer(const std::string& text, char* buffer, std::size_t size) {
+  return maru::CopyOut(text, buffer, size) ? 0 : maru::Fail(kErrBadParameter, -1);
 }
 
 /// The name of the share whose own volume path this is; empty when it is none.
@@ -37,16 +31,7 @@ bool IsName(const char* name) {
 namespace maruseeker::fileindex {
 
 std::set<std::string> FolderMgr::GetIndexedShares() const {
-  const maru::KeepErrno keep;
-  std::set<std::string> names;
-  const auto table = maru::ShareTable::Current();
-  for (const maru::ShareSettings& share : table->Shares()) {
-    struct stat status;
-    if (stat(IndexFolder(share.name).c_str(), &status) == 0 && S_ISDIR(status.st_mode)) {
-      names.insert(share.name);
-    }
-  }
-  return names;
+  return maru::IndexedShares();
 }
 
 std::string elastic::GetFileIndexID(const std::string& share_name) {
@@ -74,7 +59,7 @@ int FILEIDXQueuePathCompose(const char* share_path, char* path, std::size_t size
   return maru::Guarded("FILEIDXQueuePathCompose", -1, [&] {
     const std::string name = NameOfShare(share_path);
     if (name.empty()) return maru::Fail(kErrBadParameter, -1);
-    return CopyOut(maru::Config::Get().state_dir + "/queue/" + maru::IndexIdOf(name), path, size);
+    return Answer(maru::Config::Get().state_dir + "/queue/" + maru::IndexIdOf(name), path, size);
   });
 }
 
@@ -82,12 +67,12 @@ int FILEIDXDBPathCompose(const char* share_path, char* path, std::size_t size) {
   return maru::Guarded("FILEIDXDBPathCompose", -1, [&] {
     const std::string name = NameOfShare(share_path);
     if (name.empty()) return maru::Fail(kErrBadParameter, -1);
-    return CopyOut(IndexFolder(name), path, size);
+    return Answer(maru::IndexHome() + "/" + maru::IndexIdOf(name), path, size);
   });
 }
 
 int FILEIDXGetIndexID(const char* share_name, char* id, std::size_t size) {
   if (!IsName(share_name)) return maru::Fail(kErrBadParameter, -1);
   return maru::Guarded("FILEIDXGetIndexID", -1,
-                       [&] { return CopyOut(maru::IndexIdOf(share_name), id, size); });
+                       [&] { return Answer(maru::IndexIdOf(share_name), id, size); });
 }

@@ -4,18 +4,18 @@
 #include <set>
 #include <string>
 
-/// Which shares have a full-text index, and under which ids and paths.
+/// Shares that are indexed: which, and how their indices are named and where they lie.
 
 namespace maruseeker::fileindex {
 
 class FolderMgr {
  public:
-  /// Names of the shares that have an index on the disk, in byte order. Works for every user.
+  /// Those with an index on the disk, by name, in byte order. Works for every user.
   std::set<std::string> GetIndexedShares() const;
 };
 
 namespace elastic {
-/// The id under which the daemon knows a share's index: "fileindex_" + share name.
+/// What the search daemon calls a share's index: "fileindex_" and the share's name.
 std::string GetFileIndexID(const std::string& share_name);
 }  // namespace elastic
 

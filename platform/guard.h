@@ -1,6 +1,9 @@
 #pragma once
 
+#include <string.h>
+
 #include <exception>
+#include <string_view>
 
 #include "platform/process.h"
 #include "system/keep_errno.h"
@@ -26,6 +29,14 @@ template <class Result>
 Result Fail(int code, Result result) {
   MLIBCErrSet(code);
   return result;
+}
+
+/// Writes the text and its end into the caller's buffer. False when it does not fit.
+inline bool CopyOut(std::string_view text, char* buffer, std::size_t size) {
+  if (!buffer || text.size() >= size) return false;
+  memcpy(buffer, text.data(), text.size());
+  buffer[text.size()] = '\0';
+  return true;
 }
 
 }  // namespace maru

@@ -13,11 +13,9 @@ namespace {
 constexpr int kFollowUpNice = 10;
 
 thread_local int last_error = 0;
-int reasons_to_end = 0;
 
 /// From now on the process has a low priority: nobody waits for it.
 void GiveWay() {
-  const maru::KeepErrno keep;
   const sched_param none{};
   sched_setscheduler(0, SCHED_BATCH, &none);
   setpriority(PRIO_PROCESS, 0, kFollowUpNice);
@@ -44,15 +42,3 @@ int MLIBCErrGet() {
 void MLIBCErrSet(int code) {
   last_error = code;
 }
-
-namespace maru {
-
-void EndWithRequest(bool must) {
-  reasons_to_end += must ? 1 : -1;
-}
-
-bool EndsWithRequest() {
-  return reasons_to_end > 0;
-}
-
-}  // namespace maru

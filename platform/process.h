@@ -1,5 +1,7 @@
 #pragma once
 
+#include "system/reason_to_end.h"
+
 /// Forks. 0 in the child, its process id in the parent, -1 on failure. With `close_descriptors` not
 /// zero the child closes everything above standard error, so that it keeps no client, reply or
 /// database connection of its parent alive, and it gives way; the system log is opened anew on its
@@ -15,13 +17,3 @@ constexpr int kErrOverQuota = 0x2900;
 constexpr int kErrNotFound = 0x0700;
 constexpr int kErrBadParameter = 0x0d00;
 constexpr int kErrSystem = 0x2a00;
-
-namespace maru {
-
-/// Whether this process has to end with the request that it serves: something that outlasts the
-/// request names it by its process id, or would not stand another request beside it. Each reason
-/// is told once, and once again when it is gone.
-void EndWithRequest(bool must);
-bool EndsWithRequest();
-
-}  // namespace maru

@@ -15,6 +15,7 @@
 #include "system/share_table.h"
 #include "system/volume_path.h"
 
+using maru::CopyOut;
 using maru::Fail;
 using maru::Guarded;
 using maru::ShareSettings;
@@ -45,13 +46,6 @@ MARUSHARE* NewRecord(const ShareSettings& settings) {
   return new MARUSHARE{Duplicate(settings.name), Duplicate(settings.VolumePath()), settings.deny};
 }
 
-bool CopyText(std::string_view text, char* buffer, std::size_t size) {
-  if (!buffer || text.size() >= size) return false;
-  memcpy(buffer, text.data(), text.size());
-  buffer[text.size()] = '\0';
-  return true;
-}
-
 }  // namespace
 
 int MARUShareGet(const char* name, MARUSHARE** share) {
@@ -79,13 +73,13 @@ int MARUShareUserPrivGet(const char* user_name, const MARUSHARE* share) {
                 int{kSharePrivReadOnly} == maru::kSharePrivReadOnly &&
                 int{kSharePrivNone} == maru::kSharePrivNone);
   return Guarded("MARUShareUserPrivGet", -1, [&] {
-    maru::Identity identity;
     const auto table = ShareTable::Current();
     const ShareSettings* settings = table->Find(share->szName);
     if (!settings) return Fail(kErrNotFound, -1);
-    if (!maru::IdentityOfUser(user_name, identity)) return static_cast<int>(kSharePrivNone);
-    if (MLIBGroupIsAdminGroupMem(user_name, 0) == 1) return static_cast<int>(kSharePrivReadWrite);
-    return maru::PrivilegeOf(*settings, user_name, identity);
+    const std::optional<maru::Identity> identity = maru::IdentityOfUser(user_name);
+    if (!identity) return int{kSharePrivNone};
+    if (MLIBGroupIsAdminGroupMem(user_name, 0) == 1) return int{kSharePrivReadWrite};
+    return int{maru::PrivilegeOf(*settings, user_name, *identity)};
   });
 }
 
@@ -96,7 +90,7 @@ int MARUShareNamePathGet(const char* volume_path, char* name, std::size_t name_s
     maru::VolumePath place;
     if (!maru::SplitVolumePath(volume_path, place)) return Fail(kErrBadParameter, -1);
     if (!ShareTable::Current()->Find(std::string(place.share))) return Fail(kErrNotFound, -1);
-    if (!CopyText(place.share, name, name_size) || !CopyText(place.folder, share_path, path_size)) {
+    if (!CopyOut(place.share, name, name_size) || !CopyOut(place.folder, share_path, path_size)) {
       return Fail(kErrBadParameter, -1);
     }
     return 0;

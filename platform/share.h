@@ -12,7 +12,7 @@ struct MARUSHARE {
   char* szName;
   /// The share's own volume path, "/volume1/NAME".
   char* szPath;
-  /// Parametric option `maruseeker:deny`: flag 1 forbids listing, flag 4 forbids reading.
+  /// Parametric option `maruseeker:deny`, as bits: `list` is 1, `read` is 4.
   unsigned int fFTPPriv;
 };
 

@@ -28,7 +28,7 @@ class APIParameter {
   bool IsSet() const { return set_; }
   /// Not supplied.
   bool IsReset() const { return !set_; }
-  /// The value; the type's empty value (0, "", null) when absent or bad.
+  /// The value; an empty one (0, "", null) when absent or bad.
   T Get() const { return value_; }
   /// The value, or `fallback` when absent or bad.
   T Get(const T& fallback) const { return set_ && !invalid_ ? value_ : fallback; }

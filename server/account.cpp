@@ -9,10 +9,9 @@
 #include <string.h>
 #include <time.h>
 
-#include <memory>
 #include <vector>
 
-#include "platform/account.h"
+#include "system/accounts.h"
 #include "system/log.h"
 
 namespace maru::server {
@@ -101,16 +100,16 @@ class PamTransaction {
 }  // namespace
 
 std::optional<Account> FindAccount(const std::string& name) {
-  MARUUSER* record = nullptr;
-  if (MARUUserGet(name.c_str(), &record) < 0 || !record) return std::nullopt;
-  const std::unique_ptr<MARUUSER, decltype(&MARUUserFree)> owner(record, MARUUserFree);
-  ShadowState shadow = ReadShadow(record->szName);
+  const std::optional<maru::Account> account = AccountByName(name);
+  if (!account) return std::nullopt;
+  ShadowState shadow = ReadShadow(account->name.c_str());
   if (shadow.expired) return std::nullopt;
-  return Account{record->szName, record->nUid, std::move(shadow.stamp)};
+  return Account{account->name, account->uid, std::move(shadow.stamp)};
 }
 
 bool IsAdministrator(const std::string& name) {
-  return MLIBGroupIsAdminGroupMem(name.c_str(), 0) == 1;
+  const std::optional<maru::Account> account = AccountByName(name);
+  return account && maru::IsAdministrator(*account);
 }
 
 bool IsAdmitted(const std::string& name) {

@@ -14,16 +14,16 @@
 #include <utility>
 
 #include "common/error.h"
-#include "platform/account.h"
-#include "platform/process.h"
 #include "server/account.h"
 #include "server/answer.h"
 #include "server/frames.h"
 #include "server/names.h"
 #include "system/accounts.h"
+#include "system/acting.h"
 #include "system/json.h"
 #include "system/keep_errno.h"
 #include "system/log.h"
+#include "system/reason_to_end.h"
 #include "system/share_table.h"
 
 namespace maru::server {
@@ -63,6 +63,11 @@ bool ParseParams(const std::string& body, Json::Value& params) {
   return json::FromString(RestoreBytes(body), params) && params.isObject();
 }
 
+/// The process serves no other request.
+void EndAfterThis() {
+  static const ReasonToEnd reason;
+}
+
 void Say(const Descriptor& host, char word) {
   SendPacket(host.Get(), {&word, 1}, Wait::kNo);
 }
@@ -86,7 +91,7 @@ class Reply {
       answer = Unknown();
     }
     const KeepErrno keep;
-    if (answer.body.size() > kLongAnswer) EndWithRequest(true);
+    if (answer.body.size() > kLongAnswer) EndAfterThis();
     Say(host_, kAnswered);
     sent_ = SendAnswer(front_.Get(), answer, Wait::kYes);
     // The kernel lets the front wait on this processor.
@@ -111,11 +116,11 @@ void RunMethod(const Plugin::Method& method, MARU::APIRequest& request, Reply& r
     if (method.check(&request, &response)) method.entry(&request, &response);
   } catch (const std::exception& exception) {
     MARU_LOG("An exception left the plug-in: %s", exception.what());
-    EndWithRequest(true);
+    EndAfterThis();
     return reply.Give(Reply::Unknown());
   } catch (...) {
     MARU_LOG("An exception left the plug-in");
-    EndWithRequest(true);
+    EndAfterThis();
     return reply.Give(Reply::Unknown());
   }
   if (response.IsSuccess()) return;
@@ -225,8 +230,8 @@ void RunRequestChild(Descriptor tasks, const Plugin& plugin) {
     if (ReceivePacket(tasks.Get(), packet, Wait::kYes) != ReceiveResult::kPacket) _exit(0);
     if (const int status = ServeOne(tasks, packet, plugin)) _exit(status);
     // Who says that the request is over is about to wait for the next one.
-    const bool last = served + 1 == kMostRequests || EndsWithRequest();
-    if (last || !ResetCredentialsByName("root", true)) _exit(0);
+    const bool last = served + 1 == kMostRequests || ReasonToEnd::Exists();
+    if (last || !ActAs("root")) _exit(0);
     Say(tasks, kRequestOver);
   }
 }

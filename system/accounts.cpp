@@ -94,7 +94,6 @@ std::optional<gid_t> LookUpGroup(const std::string& name) {
 }
 
 std::optional<std::vector<gid_t>> LookUpGroupsOf(const Account& account) {
-  const int before = errno;
   std::vector<gid_t> groups(64);
   int count = static_cast<int>(groups.size());
   while (getgrouplist(account.name.c_str(), account.gid, groups.data(), &count) < 0) {
@@ -110,7 +109,6 @@ std::optional<std::vector<gid_t>> LookUpGroupsOf(const Account& account) {
   std::sort(groups.begin(), groups.end());
   groups.erase(std::unique(groups.begin(), groups.end()), groups.end());
   groups.insert(groups.begin(), account.gid);
-  errno = before;
   return groups;
 }
 
@@ -125,6 +123,11 @@ thread_local Answers recent;
 }  // namespace
 
 std::optional<Account> AccountByName(const std::string& name) {
+  // The C library would read but its beginning.
+  if (name.find('\0') != std::string::npos) {
+    errno = 0;
+    return std::nullopt;
+  }
   return recent.by_name.Get(name, [&] { return LookUpName(name); });
 }
 

@@ -14,6 +14,9 @@ namespace maru {
 
 inline constexpr std::chrono::seconds kNameServiceAge{1};
 
+/// The account that owns the index and the history, and runs the search daemon and the indexer.
+inline constexpr const char* kServiceAccount = "MaruSeeker";
+
 struct Account {
   std::string name;
   uid_t uid = 0;

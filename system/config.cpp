@@ -1,15 +1,16 @@
 #include "system/config.h"
 
 #include <errno.h>
-#include <string.h>
 
 #include <charconv>
 #include <mutex>
 #include <stdexcept>
 #include <string_view>
+#include <utility>
 
 #include "system/keep_errno.h"
 #include "system/text.h"
+#include "system/throw_errno.h"
 #include "system/whole_file.h"
 
 namespace maru {
@@ -18,8 +19,6 @@ namespace {
 constexpr std::size_t kMaxFile = 1u << 20;
 
 constexpr Setting kSettings[] = {
-    {"service_account", &Config::service_account, Setting::kWord, 0, 0,
-     "Account of the search daemon and the indexer."},
     {"web_account", &Config::web_account, Setting::kWord, 0, 0,
      "Account of the part of the web server that talks to clients."},
     {"admin_group", &Config::admin_group, Setting::kText, 0, 0,
@@ -30,8 +29,6 @@ constexpr Setting kSettings[] = {
      "The Samba settings already have the form that testparm -sv prints."},
     {"state_dir", &Config::state_dir, Setting::kPath, 0, 0,
      "Folder of the index, the search history and the preferences."},
-    {"daemon_socket", &Config::daemon_socket, Setting::kPath, 0, 0,
-     "Socket on which the search daemon listens."},
     {"history_database", &Config::history_database, Setting::kText, 0, 0,
      "SOCI connection string of the search history; empty for SQLite in state_dir."},
     {"listen_address", &Config::listen_address, Setting::kWord, 0, 0,
@@ -52,6 +49,12 @@ constexpr Setting kSettings[] = {
      "Minutes without a request after which a session ends."},
     {"max_text_kib", &Config::max_text_kib, Setting::kNumber, 1, 1'048'576,
      "The most text of one file that is indexed, in KiB."},
+};
+
+/// Names that files of earlier versions may have, and what to say of them.
+constexpr std::pair<std::string_view, const char*> kFormerSettings[] = {
+    {"service_account", "is no longer a setting: the account is always MaruSeeker"},
+    {"daemon_socket", "is no longer a setting: the socket is always /var/run/maruelasticd.sock"},
 };
 
 /// Null, or what is wrong with the value.
@@ -94,6 +97,9 @@ const char* Apply(Config& config, std::string_view line) {
   for (const Setting& setting : kSettings) {
     if (name == setting.name) return Assign(config, setting, Trimmed(line.substr(equals + 1)));
   }
+  for (const auto& [former, fault] : kFormerSettings) {
+    if (name == former) return fault;
+  }
   return "is an unknown setting";
 }
 
@@ -120,7 +126,7 @@ const Config& LoadLocked(const std::string& path, bool may_be_missing) {
   const KeepErrno keep;
   std::string text;
   if (!ReadWholeFile(path, kMaxFile, text, Link::kFollow) && !(may_be_missing && errno == ENOENT)) {
-    throw std::runtime_error(path + ": " + strerror(errno));
+    ThrowErrno(path);
   }
   current = Parse(path, text);
   loaded = true;

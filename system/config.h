@@ -11,7 +11,6 @@ namespace maru {
 /// file and line.
 struct Config {
   // Accounts
-  std::string service_account = "MaruSeeker";
   std::string web_account = "maruweb";
   std::string admin_group = "administrators";
   // Shared folders: an existing smb.conf is read through testparm; `samba_config_canonical` says
@@ -20,7 +19,6 @@ struct Config {
   bool samba_config_canonical = false;
   // Places
   std::string state_dir = "/var/lib/maruseeker";
-  std::string daemon_socket = "/var/run/maruelasticd.sock";
   /// SOCI connection string; empty: SQLite in the state folder.
   std::string history_database;
   // Web server

@@ -6,13 +6,10 @@
 #include <string.h>
 #include <sys/socket.h>
 #include <sys/un.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <chrono>
 #include <utility>
-
-#include "system/unique_fd.h"
 
 namespace marudaemon {
 namespace {
@@ -70,30 +67,26 @@ bool ConnectBefore(int descriptor, const sockaddr_un& address, Clock::time_point
 
 }  // namespace
 
-SockConnection::~SockConnection() {
-  Disconnect();
-}
-
 void SockConnection::Disconnect() {
-  if (descriptor_ >= 0) close(descriptor_);
-  descriptor_ = -1;
+  descriptor_ = maru::UniqueFd();
   received_.clear();
   begin_ = 0;
 }
 
 bool SockConnection::Send(const std::string& message) {
   const int before = errno;
-  if (descriptor_ < 0) return Refuse(ENOTCONN);
+  if (!descriptor_) return Refuse(ENOTCONN);
   if (message.size() > kMaxMessage) return Refuse(EMSGSIZE);
   if (message.find('\n') != std::string::npos) return Refuse(EINVAL);
   const std::string line = message + '\n';
   const auto deadline = After(kSendTimeout);
   for (std::size_t sent = 0; sent < line.size();) {
-    const ssize_t count = send(descriptor_, line.data() + sent, line.size() - sent, MSG_NOSIGNAL);
+    const ssize_t count =
+        send(descriptor_.Get(), line.data() + sent, line.size() - sent, MSG_NOSIGNAL);
     if (count >= 0) {
       sent += static_cast<std::size_t>(count);
     } else if (errno == EAGAIN) {
-      if (!Await(descriptor_, POLLOUT, deadline)) return false;
+      if (!Await(descriptor_.Get(), POLLOUT, deadline)) return false;
     } else if (errno != EINTR) {
       return false;
     }
@@ -103,7 +96,7 @@ bool SockConnection::Send(const std::string& message) {
 
 bool SockConnection::Recv(std::string& message) {
   const int before = errno;
-  if (descriptor_ < 0) return Refuse(ENOTCONN);
+  if (!descriptor_) return Refuse(ENOTCONN);
   const auto deadline = After(kReceiveTimeout);
   for (std::size_t searched = begin_;;) {
     const std::size_t end = received_.find('\n', searched);
@@ -116,13 +109,13 @@ bool SockConnection::Recv(std::string& message) {
     received_.erase(0, std::exchange(begin_, 0));
     const std::size_t size = searched = received_.size();
     received_.resize(size + kChunk);
-    const ssize_t count = recv(descriptor_, received_.data() + size, kChunk, 0);
+    const ssize_t count = recv(descriptor_.Get(), received_.data() + size, kChunk, 0);
     const int error = errno;
     received_.resize(size + static_cast<std::size_t>(std::max<ssize_t>(count, 0)));
     if (count == 0) return Refuse(size == 0 ? 0 : EPROTO);
     if (count > 0 || error == EINTR) continue;
     if (error != EAGAIN) return Refuse(error);
-    if (!Await(descriptor_, POLLIN, deadline)) return false;
+    if (!Await(descriptor_.Get(), POLLIN, deadline)) return false;
   }
 }
 
@@ -138,7 +131,7 @@ bool DomainSockConnection::Connect() {
       fcntl(socket_file.Get(), F_SETFL, O_NONBLOCK) != 0) {
     return false;
   }
-  descriptor_ = socket_file.Release();
+  descriptor_ = std::move(socket_file);
   return Done(before);
 }
 

@@ -2,6 +2,15 @@
 
 #include <string>
 
+#include "system/unique_fd.h"
+
+namespace maru {
+
+/// Where the search daemon listens.
+inline constexpr const char* kDaemonSocket = "/var/run/maruelasticd.sock";
+
+}  // namespace maru
+
 namespace marudaemon {
 
 /// One connection to a daemon: JSON Lines, a message is one text without line breaks and "\n"
@@ -16,20 +25,20 @@ class SockConnection {
   static constexpr int kSendTimeout = 30'000;
   static constexpr int kReceiveTimeout = 60'000;
 
-  virtual ~SockConnection();
+  virtual ~SockConnection() = default;
   SockConnection(const SockConnection&) = delete;
   SockConnection& operator=(const SockConnection&) = delete;
 
   virtual bool Connect() = 0;
   /// Sends one message; a text with a line break or over kMaxMessage is refused (EMSGSIZE, EINVAL).
   bool Send(const std::string& message);
-  /// Receives exactly one whole message, without its line end.
+  /// Takes the next message, the whole of it, without its line end.
   bool Recv(std::string& message);
   void Disconnect();
 
  protected:
   SockConnection() = default;
-  int descriptor_ = -1;
+  maru::UniqueFd descriptor_;
 
  private:
   std::string received_;

@@ -1,21 +1,18 @@
 #include <algorithm>
 
 #include "system/accounts.h"
-#include "system/config.h"
 #include "system/rights.h"
 
 namespace maru {
 namespace {
 
-bool ToIdentity(const std::optional<Account>& account, Identity& identity) {
-  if (!account) return false;
+std::optional<Identity> IdentityOf(const std::optional<Account>& account) {
+  if (!account) return std::nullopt;
   std::optional<std::vector<gid_t>> groups = GroupsOf(*account);
-  if (!groups) return false;
+  if (!groups) return std::nullopt;
   std::sort(groups->begin(), groups->end());
-  identity.uid = account->uid;
-  identity.groups = std::move(*groups);
-  identity.unrestricted = account->uid == 0 || account->name == Config::Get().service_account;
-  return true;
+  const bool unrestricted = account->uid == 0 || account->name == kServiceAccount;
+  return Identity{account->uid, std::move(*groups), unrestricted};
 }
 
 }  // namespace
@@ -24,12 +21,12 @@ bool Identity::InGroup(gid_t gid) const {
   return std::binary_search(groups.begin(), groups.end(), gid);
 }
 
-bool IdentityOfUser(const std::string& user_name, Identity& identity) {
-  return ToIdentity(AccountByName(user_name), identity);
+std::optional<Identity> IdentityOfUser(const std::string& user_name) {
+  return IdentityOf(AccountByName(user_name));
 }
 
-bool IdentityOfUID(uid_t uid, Identity& identity) {
-  return ToIdentity(AccountByUID(uid), identity);
+std::optional<Identity> IdentityOfUID(uid_t uid) {
+  return IdentityOf(AccountByUID(uid));
 }
 
 }  // namespace maru

@@ -3,7 +3,7 @@
 #include <string>
 #include <string_view>
 
-/// Under which id and where a share's full-text index is.
+/// Under which id the indexer and the search daemon know a share's full-text index.
 namespace maru {
 
 inline constexpr std::string_view kIndexPrefix = "fileindex_";

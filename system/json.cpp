@@ -5,7 +5,6 @@
 #include <json/writer.h>
 
 #include <memory>
-#include <sstream>
 #include <string_view>
 
 #include "system/whole_file.h"
@@ -138,12 +137,84 @@ std::unique_ptr<Json::CharReader> NewReader() {
   return std::unique_ptr<Json::CharReader>(builder.newCharReader());
 }
 
-std::unique_ptr<Json::StreamWriter> NewWriter() {
-  Json::StreamWriterBuilder builder;
-  builder["indentation"] = "";
-  builder["commentStyle"] = "None";
-  builder["emitUTF8"] = true;
-  return std::unique_ptr<Json::StreamWriter>(builder.newStreamWriter());
+void AppendText(std::string_view text, std::string& out) {
+  constexpr std::string_view kNamed = "\b\f\n\r\t";
+  constexpr std::string_view kNames = "bfnrt";
+  constexpr std::string_view kDigits = "0123456789abcdef";
+  out += '"';
+  std::size_t run = 0;  // the start of what is not written yet
+  for (std::size_t at = 0; at < text.size(); ++at) {
+    const auto c = static_cast<unsigned char>(text[at]);
+    if (c >= ' ' && c != '"' && c != '\\') continue;
+    out.append(text, run, at - run);
+    run = at + 1;
+    out += '\\';
+    if (const std::size_t named = kNamed.find(text[at]); named != std::string_view::npos) {
+      out += kNames[named];
+    } else if (c >= ' ') {
+      out += text[at];
+    } else {
+      out.append("u00").append({kDigits[c / 16], kDigits[c % 16]});
+    }
+  }
+  out.append(text, run).append("\"");
+}
+
+void AppendValue(const Json::Value& value, std::string& out);
+
+void AppendMembers(const Json::Value& object, std::string& out) {
+  out += '{';
+  for (auto member = object.begin(); member != object.end(); ++member) {
+    if (member != object.begin()) out += ',';
+    const char* end = nullptr;
+    const char* name = member.memberName(&end);
+    AppendText({name, end}, out);
+    out += ':';
+    AppendValue(*member, out);
+  }
+  out += '}';
+}
+
+void AppendElements(const Json::Value& array, std::string& out) {
+  out += '[';
+  for (Json::ArrayIndex i = 0; i < array.size(); ++i) {
+    if (i > 0) out += ',';
+    AppendValue(array[i], out);
+  }
+  out += ']';
+}
+
+void AppendString(const Json::Value& value, std::string& out) {
+  const char* begin = nullptr;
+  const char* end = nullptr;
+  value.getString(&begin, &end);
+  AppendText({begin, end}, out);
+}
+
+void AppendValue(const Json::Value& value, std::string& out) {
+  switch (value.type()) {
+    case Json::nullValue:
+      out += "null";
+      return;
+    case Json::intValue:
+      out += std::to_string(value.asLargestInt());
+      return;
+    case Json::uintValue:
+      out += std::to_string(value.asLargestUInt());
+      return;
+    case Json::realValue:
+      out += Json::valueToString(value.asDouble());
+      return;
+    case Json::stringValue:
+      return AppendString(value, out);
+    case Json::booleanValue:
+      out += value.asBool() ? "true" : "false";
+      return;
+    case Json::arrayValue:
+      return AppendElements(value, out);
+    case Json::objectValue:
+      return AppendMembers(value, out);
+  }
 }
 
 bool Refuse(std::string* error, std::string reason) {
@@ -171,30 +242,25 @@ bool FromString(const std::string& text, Json::Value& value, std::string* error)
 }
 
 std::string ToString(const Json::Value& value) {
-  thread_local const std::unique_ptr<Json::StreamWriter> writer = NewWriter();
-  std::ostringstream stream;
-  writer->write(value, &stream);
-  return std::move(stream).str();
+  std::string text;
+  AppendValue(value, text);
+  return text;
 }
 
 void ObjectWriter::AddText(std::string_view key, std::string_view text) {
-  BeginMember(key);
-  Write(text);
+  AppendText(text, Member(key));
 }
 
 void ObjectWriter::AddNumber(std::string_view key, std::int64_t number) {
-  BeginMember(key);
-  text_ += std::to_string(number);
+  Member(key) += std::to_string(number);
 }
 
 void ObjectWriter::AddFlag(std::string_view key, bool flag) {
-  BeginMember(key);
-  text_ += flag ? "true" : "false";
+  Member(key) += flag ? "true" : "false";
 }
 
 void ObjectWriter::AddValue(std::string_view key, const Json::Value& value) {
-  BeginMember(key);
-  text_ += ToString(value);
+  AppendValue(value, Member(key));
 }
 
 std::string ObjectWriter::Take() {
@@ -202,33 +268,10 @@ std::string ObjectWriter::Take() {
   return std::move(text_);
 }
 
-void ObjectWriter::BeginMember(std::string_view key) {
+std::string& ObjectWriter::Member(std::string_view key) {
   if (text_.size() > 1) text_ += ',';
-  Write(key);
-  text_ += ':';
-}
-
-void ObjectWriter::Write(std::string_view text) {
-  constexpr std::string_view kNamed = "\b\f\n\r\t";
-  constexpr std::string_view kNames = "bfnrt";
-  constexpr std::string_view kDigits = "0123456789abcdef";
-  text_ += '"';
-  std::size_t run = 0;  // the start of what is not written yet
-  for (std::size_t at = 0; at < text.size(); ++at) {
-    const auto c = static_cast<unsigned char>(text[at]);
-    if (c >= ' ' && c != '"' && c != '\\') continue;
-    text_.append(text, run, at - run);
-    run = at + 1;
-    text_ += '\\';
-    if (const std::size_t named = kNamed.find(text[at]); named != std::string_view::npos) {
-      text_ += kNames[named];
-    } else if (c >= ' ') {
-      text_ += text[at];
-    } else {
-      text_.append("u00").append({kDigits[c / 16], kDigits[c % 16]});
-    }
-  }
-  text_.append(text, run).append("\"");
+  AppendText(key, text_);
+  return text_ += ':';
 }
 
 bool FromFile(const std::string& path, Json::Value& value) {
@@ -238,8 +281,8 @@ bool FromFile(const std::string& path, Json::Value& value) {
   return FromString(text, value);
 }
 
-bool ToFile(const Json::Value& value, const std::string& path) {
-  return WriteWholeFile(path, ToString(value) + "\n", 0600);
+bool ToFile(const Json::Value& value, const std::string& path, uid_t owner) {
+  return WriteWholeFile(path, ToString(value) + "\n", 0600, owner);
 }
 
 const Json::Value& Member(const Json::Value& object, const char* key) {

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <json/value.h>
+#include <sys/types.h>
 
 #include <cstdint>
 #include <string>
@@ -39,8 +40,8 @@ class ObjectWriter {
   std::string Take();
 
  private:
-  void BeginMember(std::string_view key);
-  void Write(std::string_view text);
+  /// Where the value of a new member is to be written.
+  std::string& Member(std::string_view key);
 
   std::string text_ = "{";
 };
@@ -50,9 +51,10 @@ class ObjectWriter {
 bool FromFile(const std::string& path, Json::Value& value);
 
 /// Writes `value` so that a reader sees the old text or the new one, never a part (temporary file
-/// in the same folder, then rename). New files get mode 0600 less the umask. False with `errno`
-/// set.
-bool ToFile(const Json::Value& value, const std::string& path);
+/// in the same folder, then rename). New files get mode 0600 less the umask, and `owner` unless
+/// that is -1. False with `errno` set.
+bool ToFile(const Json::Value& value, const std::string& path,
+            uid_t owner = static_cast<uid_t>(-1));
 
 /// Member access that never throws: null, `fallback` or false when `object` is not an object, has
 /// no such member, or the member is of another type.

@@ -4,6 +4,7 @@
 #include <sys/types.h>
 
 #include <cstdint>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -26,9 +27,9 @@ struct Identity {
   friend bool operator==(const Identity&, const Identity&) = default;
 };
 
-/// The identity of an account from the name service. False when there is none.
-bool IdentityOfUser(const std::string& user_name, Identity& identity);
-bool IdentityOfUID(uid_t uid, Identity& identity);
+/// The identity of an account from the name service. Nothing, with errno, as AccountByName.
+std::optional<Identity> IdentityOfUser(const std::string& user_name);
+std::optional<Identity> IdentityOfUID(uid_t uid);
 
 /// What the kernel consults for one file or directory.
 struct FileRights {

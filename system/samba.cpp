@@ -5,13 +5,13 @@
 #include <poll.h>
 #include <signal.h>
 #include <spawn.h>
-#include <string.h>
 #include <sys/wait.h>
 
 #include <array>
 #include <chrono>
 #include <stdexcept>
 
+#include "system/throw_errno.h"
 #include "system/unique_fd.h"
 
 namespace maru {
@@ -25,15 +25,11 @@ constexpr std::chrono::seconds kTimeLimit{20};
 constexpr std::size_t kMaxOutput = 64u << 20;
 constexpr std::size_t kMaxComplaint = 4096;
 
-[[noreturn]] void Throw(const std::string& what, int error) {
-  throw std::runtime_error("testparm: " + what + ": " + strerror(error));
-}
-
 /// A pipe whose reading end does not block.
 struct Pipe {
   Pipe() {
     int ends[2];
-    if (pipe2(ends, O_CLOEXEC) != 0) Throw("pipe", errno);
+    CheckErrno(pipe2(ends, O_CLOEXEC) == 0, "testparm: pipe");
     reading = UniqueFd(ends[0]);
     writing = UniqueFd(ends[1]);
     fcntl(ends[0], F_SETFL, O_NONBLOCK);
@@ -85,7 +81,7 @@ class Testparm {
     posix_spawn_file_actions_destroy(&files);
     if (error != 0) {
       child_ = 0;
-      Throw(kTestparm, error);
+      ThrowErrno(std::string("testparm: ") + kTestparm, error);
     }
     output_.writing = UniqueFd();
     complaint_.writing = UniqueFd();
@@ -97,11 +93,11 @@ class Testparm {
     const auto left = std::chrono::ceil<std::chrono::milliseconds>(deadline_ - Clock::now());
     const int ready =
         left.count() > 0 ? poll(ends.data(), ends.size(), static_cast<int>(left.count())) : 0;
-    if (ready == 0) Throw("no answer", ETIMEDOUT);
-    if (ready < 0 && errno != EINTR) Throw("poll", errno);
-    if (ready < 0) return;
+    if (ready == 0) ThrowErrno("testparm: no answer", ETIMEDOUT);
+    if (ready < 0 && errno == EINTR) return;
+    CheckErrno(ready > 0, "testparm: poll");
     if (ends[0].revents) Take(output_, text_, kMaxOutput);
-    if (text_.size() > kMaxOutput) Throw("output", EFBIG);
+    if (text_.size() > kMaxOutput) ThrowErrno("testparm: output", EFBIG);
     if (ends[1].revents) Take(complaint_, complaint_text_, kMaxComplaint);
   }
 
@@ -119,7 +115,7 @@ class Testparm {
   int Wait() {
     int status = -1;
     while (waitpid(child_, &status, 0) < 0) {
-      if (errno != EINTR) Throw("lost", errno);
+      CheckErrno(errno == EINTR, "testparm: lost");
     }
     child_ = 0;
     return status;
@@ -145,7 +141,7 @@ class Testparm {
 std::string CanonicalSamba(const std::string& path) {
   // testparm itself does not say why it cannot read a file.
   if (!UniqueFd(open(path.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC))) {
-    throw std::runtime_error(path + ": " + strerror(errno));
+    ThrowErrno(path);
   }
   return Testparm(path).Result();
 }

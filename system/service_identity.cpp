@@ -6,9 +6,9 @@
 #include <unistd.h>
 
 #include <stdexcept>
-#include <system_error>
 
 #include "system/accounts.h"
+#include "system/throw_errno.h"
 
 namespace maru {
 
@@ -41,9 +41,7 @@ void BecomeForGood(const std::string& account, Kept kept) {
 }
 
 void GiveUpNewPrivileges() {
-  if (prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) != 0) {
-    throw std::system_error(errno, std::generic_category(), "Cannot give up new privileges");
-  }
+  CheckErrno(prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) == 0, "Cannot give up new privileges");
 }
 
 }  // namespace maru

@@ -1,11 +1,9 @@
 #include <errno.h>
-#include <string.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <chrono>
 #include <mutex>
-#include <stdexcept>
 
 #include "system/accounts.h"
 #include "system/config.h"
@@ -13,6 +11,7 @@
 #include "system/log.h"
 #include "system/samba.h"
 #include "system/share_table.h"
+#include "system/throw_errno.h"
 #include "system/whole_file.h"
 
 namespace maru {
@@ -47,7 +46,7 @@ std::string ReadSettings(const Config& config) {
   if (!config.samba_config_canonical) return CanonicalSamba(config.samba_config);
   std::string text;
   if (!ReadWholeFile(config.samba_config, kMaxFile, text, Link::kFollow)) {
-    throw std::runtime_error(config.samba_config + ": " + strerror(errno));
+    ThrowErrno(config.samba_config);
   }
   return text;
 }
@@ -59,7 +58,7 @@ std::string CopyPath(const Config& config) {
 /// Keeps the last good settings for a start with bad ones. Only root and the service keep a copy;
 /// a root without the right to write into the service's folder leaves it to the service.
 void KeepCopy(const Config& config, const std::string& text) {
-  const std::optional<Account> service = AccountByName(config.service_account);
+  const std::optional<Account> service = AccountByName(kServiceAccount);
   if (!service || (geteuid() != 0 && geteuid() != service->uid)) return;
   std::string kept;
   const std::string path = CopyPath(config);
@@ -67,7 +66,6 @@ void KeepCopy(const Config& config, const std::string& text) {
   if (!WriteWholeFile(path, text, 0600, service->uid) && errno != EACCES && errno != ENOENT) {
     MARU_LOG("Cannot keep a copy of the shares in %s", path.c_str());
   }
-  errno = 0;
 }
 
 }  // namespace

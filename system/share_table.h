@@ -19,7 +19,7 @@ struct ShareSettings {
   bool recycle = false;
   /// Parametric option `maruseeker:index = no` keeps a share out of the index.
   bool index = true;
-  /// Parametric option `maruseeker:deny = list read`: 1 forbids listing, 4 forbids reading.
+  /// Parametric option `maruseeker:deny`, as bits: `list` is 1, `read` is 4.
   unsigned int deny = 0;
   std::vector<std::string> valid_users, invalid_users, read_list, write_list;
 
@@ -58,11 +58,12 @@ class ShareTable {
 /// What a user may do with a share as a whole.
 enum SharePrivilege { kSharePrivReadWrite = 1, kSharePrivReadOnly = 2, kSharePrivNone = 4 };
 
-/// SharePrivilege of the user on the share by `available`, `invalid users`, `valid users`, `read
+/// That of the user on the share by `available`, `invalid users`, `valid users`, `read
 /// list`, `write list` and `read only`, with @, + and & groups and %S. Administrators are not
 /// treated specially here, nor are Samba's `admin users`, whose file operations are root's but who
 /// enter no share and write to none without the lists.
-int PrivilegeOf(const ShareSettings& share, const std::string& user_name, const Identity& identity);
+SharePrivilege PrivilegeOf(const ShareSettings& share, const std::string& user_name,
+                           const Identity& identity);
 
 /// The share that holds the users' home folders.
 inline constexpr const char* kHomesShare = "homes";

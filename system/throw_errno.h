@@ -6,9 +6,9 @@
 
 namespace maru {
 
-/// Throws std::system_error of errno: "DOING: the system's words".
-[[noreturn]] inline void ThrowErrno(const std::string& doing) {
-  throw std::system_error(errno, std::generic_category(), doing);
+/// Throws std::system_error: "DOING: the system's words".
+[[noreturn]] inline void ThrowErrno(const std::string& doing, int error = errno) {
+  throw std::system_error(error, std::generic_category(), doing);
 }
 
 /// ThrowErrno unless `good`.

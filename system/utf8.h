@@ -2,13 +2,13 @@
 
 #include <cstdint>
 #include <cstring>
+#include <string>
 #include <string_view>
 
-/// Characters in UTF-8.
+/// Characters in UTF-8 (RFC 3629: no surrogates, nothing overlong).
 namespace maru {
 
-/// The length of the UTF-8 character at `at`, which is not ASCII (RFC 3629: no surrogates, nothing
-/// overlong), or 0.
+/// The length of the character at `at`, which is not ASCII, or 0.
 inline std::size_t UTF8Length(std::string_view text, std::size_t at) {
   const auto byte = [&](std::size_t i) -> std::uint8_t {
     return at + i < text.size() ? static_cast<std::uint8_t>(text[at + i]) : 0;
@@ -37,13 +37,39 @@ inline std::size_t NextNonASCII(std::string_view text, std::size_t at) {
   return at;
 }
 
-inline bool IsUTF8(std::string_view text) {
-  for (std::size_t at = 0; (at = NextNonASCII(text, at)) < text.size();) {
+/// How many bytes of the beginning are whole characters.
+inline std::size_t UTF8Beginning(std::string_view text) {
+  std::size_t at = 0;
+  while ((at = NextNonASCII(text, at)) < text.size()) {
     const std::size_t length = UTF8Length(text, at);
-    if (length == 0) return false;
+    if (length == 0) break;
     at += length;
   }
-  return true;
+  return at;
+}
+
+inline bool IsUTF8(std::string_view text) {
+  return UTF8Beginning(text) == text.size();
+}
+
+/// Whether the text is the first bytes, not all, of a character that is not ASCII.
+inline bool IsCutUTF8(std::string_view text) {
+  if (text.empty() || text.size() > 3) return false;
+  // The second byte alone tells what is overlong or a surrogate; those behind it may be any.
+  for (const char second : {'\x80', '\x90', '\xa0'}) {
+    std::string whole(text);
+    if (whole.size() == 1) whole += second;
+    whole.resize(4, '\x80');
+    if (UTF8Length(whole, 0) > text.size()) return true;
+  }
+  return false;
+}
+
+/// Cuts a text in UTF-8 to at most `limit` bytes of whole characters.
+inline void CutUTF8(std::string& text, std::size_t limit) {
+  if (text.size() <= limit) return;
+  while (limit > 0 && (static_cast<std::uint8_t>(text[limit]) & 0xc0) == 0x80) --limit;
+  text.resize(limit);
 }
 
 }  // namespace maru

@@ -5,6 +5,8 @@
 #include <time.h>
 #include <unistd.h>
 
+#include <optional>
+
 #include "common/db/search_history.h"
 #include "common/json_value.h"
 #include "common/sdk/share.h"
@@ -26,6 +28,9 @@ namespace maruseeker::webapi {
 using std::string;
 
 namespace {
+
+/// While a query's file names this process: the next query may kill it, whatever it does by then.
+std::optional<maru::ReasonToEnd> named_in_file;
 
 /// All messages of one answer together: as much as any other command may answer in one message.
 constexpr std::size_t kMaxAnswer = marudaemon::SockConnection::kMaxMessage;
@@ -214,10 +219,10 @@ void SearchAPI::Search() {
     MARU_LOG("error: %.4096s", maru::json::ToString(error).c_str());
   }
   output_ = std::move(result);
-  if (!query_id_.empty() && unlink(query_info_file.c_str()) == 0) maru::EndWithRequest(false);
+  if (!query_id_.empty() && unlink(query_info_file.c_str()) == 0) named_in_file.reset();
 }
 
-/// Ends the older query of the same client and notes this one instead, or throws when this one is
+/// Ends the client's older query and notes this one instead, or throws when this one is
 /// the older. False when the note cannot be written. Members of the file that are nobody's here
 /// stay.
 bool SearchAPI::TakeOver(const string& query_info_file) const {
@@ -231,8 +236,7 @@ bool SearchAPI::TakeOver(const string& query_info_file) const {
   } else {
     query_info = Json::Value(Json::objectValue);
   }
-  // The next query may kill this process, whatever it does by then.
-  maru::EndWithRequest(true);
+  named_in_file.emplace();
   query_info["pid"] = getpid();
   query_info["query_serial"] = query_serial_;
   // Neither a missing file nor a process already gone is a failure that the log should name.

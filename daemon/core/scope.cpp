@@ -23,12 +23,6 @@ Eyes Blind() {
 
 }  // namespace
 
-std::optional<Identity> IdentityNamed(const std::string& user) {
-  Identity identity;
-  if (user.find('\0') != std::string::npos || !IdentityOfUser(user, identity)) return std::nullopt;
-  return identity;
-}
-
 Eyes EyesOf(const Identity& caller, const std::vector<std::string>& users) {
   if (users.empty()) {
     if (caller.unrestricted) return {caller, {}};
@@ -36,7 +30,7 @@ Eyes EyesOf(const Identity& caller, const std::vector<std::string>& users) {
     return account ? Eyes{caller, account->name} : Blind();
   }
   const std::string& user = users[0];
-  const std::optional<Identity> named = IdentityNamed(user);
+  const std::optional<Identity> named = IdentityOfUser(user);
   if (!named || std::ranges::count(users, user) != std::ssize(users)) return Blind();
   if (caller.unrestricted) return {*named, user};
   return named->uid == caller.uid ? Eyes{caller, user} : Blind();

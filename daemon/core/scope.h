@@ -14,9 +14,6 @@ constexpr std::size_t kMaxIndices = 1024;
 /// Bytes of an index id.
 constexpr std::size_t kMaxIndexId = 300;
 
-/// None when there is no such account.
-std::optional<Identity> IdentityNamed(const std::string& user);
-
 /// An identity with the name that share settings know it by.
 struct Eyes {
   Identity identity;

@@ -6,7 +6,7 @@
 #include <set>
 
 #include "common/error.h"
-#include "platform/marudbquery.h"
+#include "history/marudbquery.h"
 #include "system/log.h"
 
 namespace maru::daemon {
@@ -35,7 +35,7 @@ double Boost(double own, double others) {
 }
 
 maruseeker::Error StoreFailed(const char* why) {
-  return maruseeker::Error(maruseeker::kErrorDaemonExchange,
+  return maruseeker::Error(maruseeker::kErrorStorage,
                            std::string("The opening cannot be stored: ") + why);
 }
 

@@ -49,7 +49,7 @@ std::vector<std::string> Alternatives(std::string_view text, bool commas) {
 std::string StoredValue(const Field& field, const std::string& value) {
   if (field.name == index::kOwner) {
     if (value.find_first_not_of("0123456789") == std::string::npos) return value;
-    const std::optional<Identity> owner = IdentityNamed(value);
+    const std::optional<Identity> owner = IdentityOfUser(value);
     return owner ? std::to_string(owner->uid) : "";
   }
   if (field.name == index::kExtension && value[0] == '.') return index::Fold(value.substr(1));

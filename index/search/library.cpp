@@ -110,7 +110,7 @@ std::unique_ptr<View> Library::Open(const std::vector<std::string>& index_ids, c
                                     IsCancelled cancelled) {
   for (const std::string& id : index_ids) {
     if (!Has(id)) {
-      throw maruseeker::Error(maruseeker::kErrorDaemonExchange, "There is no index " + id);
+      throw maruseeker::Error(maruseeker::kErrorStorage, "There is no index " + id);
     }
   }
   const auto open = [&](bool forget) {

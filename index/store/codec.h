@@ -37,7 +37,7 @@ class Encoder {
 };
 
 inline maruseeker::Error Damaged() {
-  return maruseeker::Error(maruseeker::kErrorDaemonExchange, "The index is damaged");
+  return maruseeker::Error(maruseeker::kErrorStorage, "The index is damaged");
 }
 
 /// Reads what Encoder wrote; anything else throws Error (121). Borrows the bytes.

@@ -15,7 +15,7 @@ auto WithEngine(const char* doing, Work&& work) -> decltype(work()) {
   try {
     return work();
   } catch (const Xapian::Error& error) {
-    throw maruseeker::Error(maruseeker::kErrorDaemonExchange,
+    throw maruseeker::Error(maruseeker::kErrorStorage,
                             std::string(doing) + ": " + error.get_type() + ": " + error.get_msg());
   }
 }

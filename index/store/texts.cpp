@@ -22,7 +22,7 @@ constexpr std::size_t kFrontBytes = 8192;
 constexpr std::uint64_t kMaxRaw = 1u << 20;
 
 maruseeker::Error DiskError(const std::string& what) {
-  return maruseeker::Error(maruseeker::kErrorDaemonExchange, what + ": " + std::strerror(errno));
+  return maruseeker::Error(maruseeker::kErrorStorage, what + ": " + std::strerror(errno));
 }
 
 }  // namespace
@@ -39,7 +39,7 @@ void TextPacker::Cut(std::size_t end) {
                      '\0');
   const int size = LZ4_compress_default(raw.data(), packed.data(), static_cast<int>(raw.size()),
                                         static_cast<int>(packed.size()));
-  if (size <= 0) throw maruseeker::Error(maruseeker::kErrorDaemonExchange, "Cannot pack a text");
+  if (size <= 0) throw maruseeker::Error(maruseeker::kErrorStorage, "Cannot pack a text");
   packed.resize(static_cast<std::size_t>(size));
   packed.shrink_to_fit();
   chunks_.push_back({raw.size(), signature_.Take(), std::move(packed)});

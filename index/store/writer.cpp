@@ -48,7 +48,7 @@ Xapian::WritableDatabase OpenIndex(const std::string& path) {
   // Left alone, the engine commits by itself after so many documents; here only Commit does.
   setenv("XAPIAN_FLUSH_THRESHOLD", "100000000", 1);
   if (mkdir(path.c_str(), 0700) != 0 && errno != EEXIST) {
-    throw maruseeker::Error(maruseeker::kErrorDaemonExchange,
+    throw maruseeker::Error(maruseeker::kErrorStorage,
                             "Cannot make " + path + ": " + std::strerror(errno));
   }
   return WithEngine("Cannot open the index", [&] {
@@ -189,7 +189,7 @@ void Writer::State::EndBulk() {
   if (renameat2(AT_FDCWD, merged.c_str(), AT_FDCWD, (folder + kDatabaseFolder).c_str(),
                 RENAME_EXCHANGE) != 0) {
     throw maruseeker::Error(
-        maruseeker::kErrorDaemonExchange,
+        maruseeker::kErrorStorage,
         std::string("Cannot put the new index in place: ") + std::strerror(errno));
   }
   main.close();

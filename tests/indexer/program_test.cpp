@@ -2,6 +2,7 @@
 #include <sys/wait.h>
 
 #include "fixture.h"
+#include "system/accounts.h"
 
 namespace maru::indexer::test {
 namespace {
@@ -13,12 +14,15 @@ class ProgramTest : public ShareTest {
     Settings("[share]\n\tpath = " + Share() + "\n");
     std::ofstream(root_ + "/maru.conf")
         << "samba_config = " << root_ << "/smb.conf\nsamba_config_canonical = yes\n"
-        << "state_dir = " << root_ << "/state\nservice_account = nobody\n";
+        << "state_dir = " << root_ << "/state\n";
     fs::remove(root_ + "/index");
     fs::create_directory_symlink("state/index", root_ + "/index");
+  }
+  void SetUp() override {
     if (geteuid() != 0) return;
+    if (!service_) GTEST_SKIP() << "needs the account " << kServiceAccount;
     fs::create_directory(root_ + "/state");
-    EXPECT_EQ(0, chown((root_ + "/state").c_str(), 65534, 65534));
+    ASSERT_EQ(0, chown((root_ + "/state").c_str(), service_->uid, service_->gid));
   }
   ~ProgramTest() override {
     if (process_ > 0) End(SIGKILL);
@@ -29,7 +33,7 @@ class ProgramTest : public ShareTest {
     fs::rename(root_ + "/smb.conf.new", root_ + "/smb.conf");
   }
 
-  void Start(std::vector<std::string> arguments, bool as_nobody = false) {
+  void Start(std::vector<std::string> arguments, bool as_service = false) {
     arguments.insert(arguments.begin(), MARU_INDEXD);
     arguments.insert(arguments.end(), {"--config", root_ + "/maru.conf"});
     std::vector<char*> list;
@@ -41,7 +45,7 @@ class ProgramTest : public ShareTest {
     const int file = open(output.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0666);
     dup2(file, STDOUT_FILENO);
     dup2(file, STDERR_FILENO);
-    if (as_nobody && setresuid(65534, 65534, 65534) != 0) _exit(126);
+    if (as_service && setresuid(service_->uid, service_->uid, service_->uid) != 0) _exit(126);
     execv(MARU_INDEXD, list.data());
     _exit(127);
   }
@@ -55,8 +59,8 @@ class ProgramTest : public ShareTest {
     kill(process_, signal);
     return Wait();
   }
-  int Run(std::vector<std::string> arguments, bool as_nobody = false) {
-    Start(std::move(arguments), as_nobody);
+  int Run(std::vector<std::string> arguments, bool as_service = false) {
+    Start(std::move(arguments), as_service);
     return Wait();
   }
   std::string Output() const {
@@ -70,6 +74,7 @@ class ProgramTest : public ShareTest {
     }
     return false;
   }
+  const std::optional<Account> service_ = AccountByName(kServiceAccount);
   pid_t process_ = -1;
 };
 
@@ -158,7 +163,8 @@ TEST_F(ProgramTest, KeepsNoRightButToRead) {
   ASSERT_TRUE(Within([&] { return Matches(); })) << Output();
   EXPECT_EQ(1u, Search("onlyroot").size()) << "reads what the service account may not";
   const std::string main = std::to_string(process_);
-  EXPECT_EQ("65534\t65534\t65534\t65534", StatusLine(main, "Uid"));
+  const std::string uid = std::to_string(service_->uid);
+  EXPECT_EQ(uid + "\t" + uid + "\t" + uid + "\t" + uid, StatusLine(main, "Uid"));
   EXPECT_EQ("0000000000000004", StatusLine(main, "CapEff")) << "CAP_DAC_READ_SEARCH";
   EXPECT_EQ("1", StatusLine(main, "NoNewPrivs"));
   const auto forkers = ChildrenOf(main);

@@ -5,7 +5,7 @@
 #include <sys/mount.h>
 #include <sys/xattr.h>
 
-#include "tests/platform/support.h"
+#include "tests/support/support.h"
 
 namespace {
 

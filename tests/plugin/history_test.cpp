@@ -11,7 +11,7 @@
 #include "common/sdk/credentials.h"
 #include "plugin/plugin.h"
 #include "support/fake_daemon.h"
-#include "system/preference.h"
+#include "system/preferences.h"
 #include "system/unique_fd.h"
 #include "system/whole_file.h"
 
@@ -234,9 +234,9 @@ TEST_F(History, ManyAtOnce) {
 }
 
 TEST_F(History, SearchRecordsWhatIsTyped) {
-  using maruseeker::pref::Preference;
-  Preference(60001).Set<bool>("enable_history", true);
-  Preference(60001).Set<int>("max_history_num", 2);
+  using maru::Preferences;
+  Preferences(60001).Set("enable_history", true);
+  Preferences(60001).Set("max_history_num", 2);
   const auto type = [](const std::string& keyword) {
     Json::Value params = FromText("{'search_weight_list':[],'indice':['private']}");
     params["keyword"] = keyword;
@@ -258,7 +258,7 @@ TEST_F(History, SearchRecordsWhatIsTyped) {
   type("second");
   type("  ");
   EXPECT_EQ(keywords(), "second||");
-  Preference(60001).Set<bool>("enable_history", false);
+  Preferences(60001).Set("enable_history", false);
   type("third");
   EXPECT_EQ(keywords(), "second||");
 }
@@ -297,7 +297,7 @@ TEST_F(History, JournalThatFails) {
   EXPECT_FALSE(Record(60001, {"nowhere"}));
   EXPECT_EQ(Get(Alice()), "1: before@1000");
   EXPECT_EQ(Delete(Alice(), "1").code, 9999);
-  maruseeker::pref::Preference(60001).Set<bool>("enable_history", true);
+  maru::Preferences(60001).Set("enable_history", true);
   const Answer search = Ask(
       Alice(), "search", FromText("{'search_weight_list':[],'indice':['private'],'keyword':'k'}"));
   EXPECT_TRUE(search.success);

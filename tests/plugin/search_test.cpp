@@ -11,7 +11,8 @@
 #include "plugin/plugin.h"
 #include "support/fake_daemon.h"
 #include "system/json.h"
-#include "system/preference.h"
+#include "system/preferences.h"
+#include "system/reason_to_end.h"
 
 namespace {
 
@@ -27,7 +28,7 @@ class Search : public PluginTest {
     PluginTest::SetUp();
     if (IsSkipped()) return;
     unlink(kQueryFile);
-    maruseeker::pref::Preference(60001).Set<bool>("enable_history", false);
+    maru::Preferences(60001).Set("enable_history", false);
   }
 
   static Answer Find(const Login& login, const std::string& more = "") {
@@ -150,6 +151,21 @@ TEST_F(Search, QueryKilledWhileItWaits) {
   int status = 0;
   waitpid(older, &status, 0);
   EXPECT_TRUE(WIFSIGNALED(status) && WTERMSIG(status) == SIGKILL);
+}
+
+TEST_F(Search, EndsTheProcessThatAFileStillNames) {
+  const auto reason_after = [](const char* query) {
+    return InChild([&] {
+             Enter(Alice(), "search", FromText(query));
+             return Json::Value(maru::ReasonToEnd::Exists());
+           })
+        .value.asBool();
+  };
+  EXPECT_TRUE(reason_after("{'query_id':'q','query_serial':1}")) << "without a daemon it stays";
+  EXPECT_FALSE(reason_after("{}"));
+  FakeDaemon daemon;
+  daemon.On("search", {FakeDaemon::Message(kGood)});
+  EXPECT_FALSE(reason_after("{'query_id':'q','query_serial':2}"));
 }
 
 TEST_F(Search, QueryFilesOfNoUse) {

@@ -59,7 +59,9 @@ void Echo(APIRequest* request, APIResponse* response) {
 /// What the process of a request looks like from within; with "last", it is to end with it.
 void Inspect(APIRequest* request, APIResponse* response) {
   Json::Value data;
-  if (!StringOf(request, "last").empty()) maru::EndWithRequest(true);
+  if (!StringOf(request, "last").empty()) {
+    static const maru::ReasonToEnd last;
+  }
   data["pid"] = getpid();
   data["euid_before"] = geteuid();
   for (const auto& entry : std::filesystem::directory_iterator("/proc/self/fd"))

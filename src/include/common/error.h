@@ -6,12 +6,14 @@
 
 namespace maruseeker {
 
-/// The number that the web client receives. The daemon's own codes share this space: any value may
-/// come back from it.
+/// What a client is told of a failure. The search daemon's errors go through as they are numbered
+/// there, which may be otherwise than here.
 enum ErrorCode : std::int32_t {
   kErrorUnknown = 117,
   kErrorBadParameter = 120,
   kErrorDaemonExchange = 121,
+  /// An index or a database cannot be read or written: to a client, the daemon has no answer.
+  kErrorStorage = kErrorDaemonExchange,
   kErrorPlatform = 502,
   kErrorSwitchUser = 503,
   kErrorNoPermission = 507,

@@ -4,8 +4,8 @@
 
 namespace maruseeker {
 
-/// A POSIX mutex with default attributes; not recursive. Each operation is true when the system's
-/// call returned 0.
+/// The system's plain mutex: whoever has it must not lock it once more. Each operation is true when
+/// the system's call returned 0.
 class Mutex {
  public:
   Mutex();
@@ -35,8 +35,8 @@ class LockMutex {
 
 namespace sdk {
 
-/// The only lock of the process: held around every account lookup, credential switch and platform
-/// call on a shared folder. Made on first use.
+/// The one lock there is. Whoever asks for an account, changes who the process is or calls the
+/// platform about a share has it meanwhile. Made on first use.
 Mutex& SDKMutex();
 
 }  // namespace sdk

@@ -8,7 +8,7 @@
 /// throws.
 namespace maruseeker {
 
-/// A regular file; a symbolic link never is one.
+/// Whether it is a regular file, and no symbolic link.
 bool IsFileExist(const std::string& path);
 
 /// A directory. With `follow_link` a symbolic link counts when the text it holds, taken as a path
@@ -16,8 +16,8 @@ bool IsFileExist(const std::string& path);
 /// longer than the kernel's own limit do not.
 bool IsDirExist(const std::string& path, bool follow_link);
 
-/// Whether a directory entry says of itself that it is a directory. An entry of unknown type counts
-/// as none: the file at `path` is not asked.
+/// Whether a directory entry says of itself that it is a directory. Where the entry does
+/// not tell, the answer is no: the file at `path` is not asked.
 bool IsDirentDir(const dirent* entry, const std::string& path);
 
 /// Whether the effective user has any of the bits of `mask` (4 read, 2 write, 1 execute) on the
@@ -28,7 +28,7 @@ bool IsMountPoint(const std::string& path);
 
 bool StringStartWith(const std::string& text, const std::string& prefix);
 
-/// What stands after the last "/"; the whole path when it has none.
+/// What stands after the last "/"; the whole path where there is none.
 std::string Basename(const std::string& path);
 
 /// What stands before the last "/": empty for an entry of the root, and the whole path (not ".")
@@ -39,7 +39,7 @@ std::string Dirname(const std::string& path);
 /// there is none.
 std::string GetFileExtension(const std::string& path, bool to_lower);
 
-/// The path without links and dots; empty when it cannot be resolved.
+/// The path without links and dots; nothing when there is no such place.
 std::string RealPath(const std::string& path);
 
 /// Removes a file. One that is already gone is no failure.

@@ -18,7 +18,7 @@ bool IsDaemonSocketThere();
 struct ExchangeRules {
   /// What the log says when the request cannot be sent.
   const char* send_failure;
-  /// Whether a reply with "success" false throws the daemon's own code and message, unlogged.
+  /// Whether a reply with "success" false is thrown as the daemon says it, unlogged.
   bool judge_success;
 };
 

@@ -17,7 +17,7 @@ class IndicateAPI : public SeekerAPI {
   void AddQueries(const Json::Value& file_types);
 
   Json::Value request_to_daemon_;
-  /// Index ids of the shares that the user may search.
+  /// Index ids of what the user may search.
   Json::Value indice_ = Json::Value(Json::arrayValue);
 };
 

@@ -6,9 +6,9 @@
 
 #include "platform/webapi.h"
 
-/// What the check functions share. A check function looks at types and presence of the raw
-/// parameters, never at their meaning. It accepts by returning true; it refuses by answering error
-/// 120 with {"name", "reason"} and returning false. It never throws on bad input.
+/// What the check functions share. They judge which of the raw parameters are there and of which
+/// type; what the values mean is for the handlers. True lets a request pass. A refusal is an answer
+/// of error 120, {"name", "reason"}, and false. No input makes one throw.
 namespace maruseeker::webapi {
 
 /// How a parameter was found, under its name.
@@ -22,12 +22,12 @@ struct ReadParam {
   bool is_invalid;
 };
 
-/// Refuses for the first invalid one: "type" when it is present, "required" when it is not.
+/// Refuses the first bad one, for its "type" or, where it is missing, as "required".
 bool CheckParams(MARU::APIResponse* response, std::initializer_list<ReadParam> params);
 
 using ElementCheck = bool (*)(const Json::Value& element);
 
-/// Refuses with "type" at the first element that fails the check. An absent array passes.
+/// One element that fails the check is enough to refuse, for the "type". An absent array passes.
 bool CheckElements(MARU::APIResponse* response, const char* name,
                    const MARU::APIParameter<Json::Value>& array, ElementCheck check);
 

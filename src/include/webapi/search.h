@@ -12,7 +12,7 @@ class SearchAPI : public SeekerAPI {
  public:
   using SeekerAPI::SeekerAPI;
   void ParseParams() override;
-  /// Records the keyword in the user's history, in a child process, and searches.
+  /// Leaves the keyword to the user's history, in a child process, and searches.
   void Execute() override;
   /// Adds to each hit what only the file server knows.
   void FormOutput() override;
@@ -31,10 +31,10 @@ class SearchAPI : public SeekerAPI {
   void FillOwners();
   void FillIsMountPoint();
 
-  /// Paging: the first hit to return, and how many.
+  /// The page: hits before it, and hits on it.
   int from_ = 0;
   int size_ = 0;
-  /// The client's number of this query; larger is newer.
+  /// Counts the client's queries: the highest is the latest.
   int query_serial_ = 0;
   bool has_criteria_ = false;
   std::string keyword_;

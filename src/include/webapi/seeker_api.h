@@ -38,7 +38,7 @@ class SeekerAPI {
   /// The web session's.
   std::string session_id_;
   sdk::SDKCredentials credentials_;
-  /// The body of the success answer.
+  /// What a success answers with.
   Json::Value output_;
 };
 

@@ -4,8 +4,8 @@
 
 namespace maruseeker::webapi {
 
-/// "boost": tells the daemon that the user opened a file of the results. The daemon's answer is
-/// read and dropped; no right on the file is asked for.
+/// "boost": a file of the results was opened, which the daemon is told. What it says to that does
+/// not matter; no right on the file is asked for.
 class SpotlightBoostAPI : public SeekerAPI {
  public:
   using SeekerAPI::SeekerAPI;

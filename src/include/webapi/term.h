@@ -15,7 +15,7 @@ class TermSuggestAPI : public SeekerAPI {
   Json::Value request_to_daemon_;
 };
 
-/// "list_avail_db": the suggestion databases that the daemon holds.
+/// "list_avail_db": what suggestions can be drawn from.
 class TermSuggestListDBAPI : public SeekerAPI {
  public:
   using SeekerAPI::SeekerAPI;

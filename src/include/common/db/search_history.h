@@ -6,7 +6,6 @@
 
 #include "common/db/base_record.h"
 #include "common/db/table_base.h"
-#include "platform/history_journal.h"
 
 namespace maruseeker::db {
 
@@ -47,14 +46,7 @@ class SearchHistoryTable : public TableBase<SearchHistory> {
   bool UpdateWithTime(SearchHistory& rec, int max);
 
  private:
-  /// Takes the journal's searches into the table; all of it happens or nothing does.
-  bool CatchUp();
   void Settle();
-  bool TakeNow(SearchHistory& rec, int max);
-  bool Take(const std::vector<HistoryJournal::Entry>& entries);
-  bool TakesAny(SearchHistory row);
-  bool Record(SearchHistory& rec);
-  bool Prune(const SearchHistory& newest, int max);
 
   /// Whether the journal was taken over, or cannot be, since the last record.
   bool settled_ = false;

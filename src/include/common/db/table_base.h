@@ -9,7 +9,7 @@
 
 namespace maruseeker::db {
 
-/// One table and its record type; short-lived, on the stack of one operation. Nothing here throws
+/// One table and its record type; made for one operation. Nothing here throws
 /// or logs: failures are results, and GetLastError tells why.
 template <class T>
 class TableBase {
@@ -30,7 +30,7 @@ class TableBase {
     return 0;
   }
 
-  /// Replaces the contents of `recs` with the rows. On failure, what it holds is not the result.
+  /// `recs` becomes the rows. On failure, what it holds is not the result.
   bool GetAll(std::vector<T>& recs, const marudbquery::Condition& cond, const SelectParam& param) {
     marudbquery::SelectStatement select(session_, table_);
     select.SetCondition(marudbquery::Condition::Null() && cond);

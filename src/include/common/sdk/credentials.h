@@ -6,7 +6,7 @@
 namespace maruseeker::sdk {
 
 /// Lets the process act as another user for a scope. Every change of identity holds SDKMutex().
-/// All failures are Error 503, logged.
+/// What fails throws Error 503, after a log line.
 class SDKCredentials {
  public:
   /// Changes nothing; the destructor comes back to who the process is now.

@@ -23,14 +23,14 @@ class FilePermission {
   FilePermission(const FilePermission&) = delete;
   FilePermission& operator=(const FilePermission&) = delete;
 
-  /// May the user read the path? The share "homes" is judged by the path's own rights alone.
+  /// May the user read the path? In "homes" only the rights of the path itself count.
   bool CheckRead(const std::string& full_path);
   /// May the user see the path in the listing of its folder? Neither the privilege on the share nor
   /// the exception for "homes" counts here.
   bool CheckList(const std::string& full_path);
 
   std::shared_ptr<sdk::SDKShare> GetShare(const std::string& share_name);
-  /// The user's permission bits on the path: 4 read, 2 write, 1 execute.
+  /// What the user may do with the path, as bits: 4 read, 2 write, 1 execute.
   int GetPathACL(const std::string& full_path);
 
  private:

@@ -8,7 +8,7 @@ struct MARUSHARE;
 
 namespace maruseeker::sdk {
 
-/// One shared folder, loaded by name. Failed queries throw Error 502, logged, unless said
+/// A share, looked up by its name. Failed queries throw Error 502, logged, unless said
 /// otherwise. Calls into the platform hold SDKMutex() but for IsHideUnReadable, GetPrivilege and
 /// Enum.
 class SDKShare {
@@ -26,10 +26,10 @@ class SDKShare {
   /// Whether 100 MiB more fit into the share. Only a full disk or an exhausted quota say no: when
   /// it cannot be told, the answer is yes.
   bool IsSpaceEnough() const;
-  /// Flag 1 forbids listing, flag 4 forbids reading.
+  /// What is denied to everybody: bit 1, to list; bit 4, to read.
   unsigned int GetFTPPrivilege() const;
-  /// The user's privilege on the share as a whole (platform/share.h); 4 means no access, and so
-  /// does a privilege that cannot be told.
+  /// What the user may do with the share as a whole (platform/share.h): 4 is nothing, also when it
+  /// cannot be told.
   int GetPrivilege(const std::string& user_name) const;
   /// Neither encrypted nor read-only.
   bool CanBeIndexed() const;

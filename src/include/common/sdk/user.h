@@ -16,9 +16,9 @@ struct User {
   std::string name;
   std::uint32_t uid = 0;
   std::uint32_t gid = 0;
-  /// Where the account comes from, for the platform's home service.
+  /// Where the account comes from, which the platform wants to know before it tells of homes.
   int auth_type = 0;
-  /// Whether the user-home service is enabled for the user.
+  /// Whether this account's files at home are shared.
   bool home_enabled = false;
 
  private:

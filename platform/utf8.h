@@ -1,3 +1,0 @@
-#pragma once
-
-#include "system/utf8.h"
