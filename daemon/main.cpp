@@ -6,11 +6,11 @@
 #include <stdexcept>
 #include <string>
 
-#include "daemon/core.h"
+#include "daemon/core/capability.h"
+#include "daemon/core/core.h"
 #include "daemon/history.h"
-#include "daemon/listener.h"
-#include "daemon/privilege.h"
-#include "daemon/server.h"
+#include "daemon/socket/listener.h"
+#include "daemon/socket/server.h"
 #include "program/program.h"
 #include "system/config.h"
 #include "system/log.h"
@@ -44,7 +44,7 @@ int Serve(const Config& config) {
   const Identity identity = FutureIdentity(config.service_account);
   const Listener listener(config.daemon_socket, identity);
   DropPrivileges(config.service_account);
-  if (!MayExamineAllFiles()) {
+  if (!HoldsReadSearch()) {
     MARU_LOG("Running without CAP_DAC_READ_SEARCH: only files that user %u can reach are shown",
              geteuid());
   }

@@ -9,6 +9,8 @@
 #include <map>
 #include <utility>
 
+#include "system/config.h"
+
 namespace maru {
 namespace {
 
@@ -140,6 +142,13 @@ std::optional<std::vector<gid_t>> GroupsOf(const Account& account) {
       recent.groups_of.Get({account.name, account.gid}, [&] { return LookUpGroupsOf(account); });
   if (groups) errno = before;
   return groups;
+}
+
+bool IsAdministrator(const Account& account) {
+  const std::optional<gid_t> administrators = GroupByName(Config::Get().admin_group);
+  if (!administrators) return false;
+  const auto groups = GroupsOf(account);
+  return groups && std::find(groups->begin(), groups->end(), *administrators) != groups->end();
 }
 
 void ForgetAccounts() {
