@@ -7,7 +7,7 @@
 
 #include "system/unique_fd.h"
 
-/// Small files, read and written whole. For this room.
+/// Small files, read and written whole.
 namespace maru {
 
 /// Whether a symbolic link in the last component is followed: only where no user can plant one.
