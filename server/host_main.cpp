@@ -5,7 +5,7 @@
 #include <exception>
 #include <string>
 
-#include "server/host.h"
+#include "server/host/host.h"
 #include "system/config.h"
 #include "system/log.h"
 
@@ -39,8 +39,7 @@ int main(int argc, char** argv) {
     }
     maru::Config config = path.empty() ? maru::Config::Get() : maru::Config::Load(path);
     if (config.plugin.empty()) config.plugin = MARU_PLUGIN;
-    return maru::server::RunHost(config, maru::server::Descriptor(control),
-                                 maru::server::Descriptor(lifeline));
+    return maru::server::RunHost(config, maru::UniqueFd(control), maru::UniqueFd(lifeline));
   } catch (const std::exception& exception) {
     MARU_LOG("The host cannot start: %s", exception.what());
     return 1;
