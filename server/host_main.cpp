@@ -3,12 +3,12 @@
 #include <stdexcept>
 
 #include "program/program.h"
-#include "server/host.h"
+#include "server/host/host.h"
 #include "system/config.h"
 
 namespace {
 
-maru::server::Descriptor Socket(int fd) {
+maru::UniqueFd Socket(int fd) {
   struct stat status;
   if (fstat(fd, &status) != 0 || !S_ISSOCK(status.st_mode)) {
     throw std::runtime_error("only maruwebd can start it");

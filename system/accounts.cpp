@@ -150,7 +150,7 @@ std::optional<std::vector<gid_t>> GroupsOf(const Account& account) {
 bool IsAdministrator(const Account& account) {
   const std::optional<gid_t> administrators = GroupByName(Config::Get().admin_group);
   if (!administrators) return false;
-  const auto groups = GroupsOf(account);
+  const std::optional<std::vector<gid_t>> groups = GroupsOf(account);
   return groups && std::find(groups->begin(), groups->end(), *administrators) != groups->end();
 }
 

@@ -31,8 +31,8 @@ std::optional<gid_t> GroupByName(const std::string& name);
 /// The account's groups, the primary one first, each once.
 std::optional<std::vector<gid_t>> GroupsOf(const Account& account);
 
-/// Whether the account is a member of the administrators' group (setting `admin_group`), by primary
-/// or supplementary membership. False leaves errno 0 when it is not, else what went wrong.
+/// Whether the account is a member of the administrators' group (setting `admin_group`), by its
+/// primary group or another. False with errno, where it cannot be told, or 0.
 bool IsAdministrator(const Account& account);
 
 /// Everything this thread has found is asked for anew.

@@ -9,7 +9,8 @@ namespace maru {
 /// Owns a file descriptor, or none (-1).
 class UniqueFd {
  public:
-  explicit UniqueFd(int descriptor = -1) : descriptor_(descriptor) {}
+  UniqueFd() = default;
+  explicit UniqueFd(int descriptor) : descriptor_(descriptor) {}
   UniqueFd(UniqueFd&& other) noexcept : descriptor_(other.Release()) {}
   UniqueFd& operator=(UniqueFd&& other) noexcept {
     const UniqueFd old(std::exchange(descriptor_, other.Release()));
@@ -26,7 +27,7 @@ class UniqueFd {
   explicit operator bool() const { return descriptor_ >= 0; }
 
  private:
-  int descriptor_;
+  int descriptor_ = -1;
 };
 
 }  // namespace maru
