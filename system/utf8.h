@@ -2,6 +2,7 @@
 
 #include <cstdint>
 #include <cstring>
+#include <string>
 #include <string_view>
 
 /// Characters in UTF-8.
@@ -37,13 +38,34 @@ inline std::size_t NextNonASCII(std::string_view text, std::size_t at) {
   return at;
 }
 
-inline bool IsUTF8(std::string_view text) {
-  for (std::size_t at = 0; (at = NextNonASCII(text, at)) < text.size();) {
+/// How many bytes of the start are UTF-8, in whole characters.
+inline std::size_t UTF8Prefix(std::string_view text) {
+  std::size_t at = 0;
+  while ((at = NextNonASCII(text, at)) < text.size()) {
     const std::size_t length = UTF8Length(text, at);
-    if (length == 0) return false;
+    if (length == 0) break;
     at += length;
   }
-  return true;
+  return at;
+}
+
+inline bool IsUTF8(std::string_view text) {
+  return UTF8Prefix(text) == text.size();
+}
+
+/// Whether this is the beginning of one character, which some ending would complete.
+inline bool IsCutUTF8(std::string_view rest) {
+  for (const char* ending : {"\x80\x80\x80", "\xBF\xBF\xBF"}) {
+    if (UTF8Length(std::string(rest.substr(0, 4)) + ending, 0) > rest.size()) return true;
+  }
+  return false;
+}
+
+/// Cuts UTF-8 to at most `limit` bytes of whole characters.
+inline void CutUTF8(std::string& text, std::size_t limit) {
+  if (text.size() <= limit) return;
+  while (limit > 0 && (static_cast<std::uint8_t>(text[limit]) & 0xc0) == 0x80) --limit;
+  text.resize(limit);
 }
 
 }  // namespace maru
