@@ -10,13 +10,14 @@
 #include <thread>
 #include <vector>
 
+#include "indexer/crawl/once.h"
 #include "indexer/extract/processes.h"
-#include "indexer/once.h"
 #include "indexer/privileges.h"
 #include "indexer/service.h"
 #include "program/program.h"
 #include "system/config.h"
 #include "system/log.h"
+#include "system/throw_errno.h"
 
 namespace maru::indexer {
 namespace {
@@ -71,7 +72,7 @@ void BlockSignals(sigset_t& signals) {
 UniqueFd LockState() {
   const std::string path = IndexHome() + "/.lock";
   UniqueFd lock(open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600));
-  if (!lock) throw std::runtime_error("Cannot open " + path + ": " + std::strerror(errno));
+  if (!lock) ThrowErrno("Cannot open " + path);
   struct flock whole {};
   whole.l_type = F_WRLCK;
   if (fcntl(lock.Get(), F_OFD_SETLK, &whole) != 0) {
@@ -120,7 +121,7 @@ int RunOnce(const Options& options, Workers& workers, const sigset_t& signals) {
 
 int Run(const Options& options) {
   if (options.once) OpenLog(kProgram, true);
-  const Sight sight = SettleIdentity();
+  const Sight sight = DropPrivileges();
   sigset_t signals;
   BlockSignals(signals);
   RaiseDescriptorLimit();
@@ -133,7 +134,7 @@ int Run(const Options& options) {
   }
   Workers workers(processes, static_cast<std::size_t>(Config::Get().max_text_kib) << 10);
   if (options.once) return RunOnce(options, workers, signals);
-  Follower::Settings settings;
+  Keeper::Settings settings;
   settings.crawl_interval = std::chrono::hours(options.crawl_hours);
   Serve(workers, settings);
   return 0;

@@ -5,13 +5,13 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <cstring>
 #include <stdexcept>
 #include <string>
 
 #include "system/accounts.h"
 #include "system/config.h"
 #include "system/service_identity.h"
+#include "system/throw_errno.h"
 
 namespace maru::indexer {
 namespace {
@@ -27,12 +27,10 @@ constexpr mode_t kFolderMode = 0711;
 
 void MakeFolder(const std::string& path, const Account* owner) {
   const bool made = mkdir(path.c_str(), kFolderMode) == 0;
-  if (!made && errno != EEXIST) {
-    throw std::runtime_error("Cannot make " + path + ": " + std::strerror(errno));
-  }
+  if (!made && errno != EEXIST) ThrowErrno("Cannot make " + path);
   const bool good = !made || (chmod(path.c_str(), kFolderMode) == 0 &&
                               (!owner || chown(path.c_str(), owner->uid, owner->gid) == 0));
-  if (!good) throw std::runtime_error("Cannot set up " + path + ": " + std::strerror(errno));
+  if (!good) ThrowErrno("Cannot set up " + path);
 }
 
 void MakeFolders(const Account* owner) {
@@ -47,7 +45,7 @@ bool ReadsEverything() {
 
 }  // namespace
 
-Sight SettleIdentity() {
+Sight DropPrivileges() {
   if (geteuid() == 0) {
     const Account account = ServiceAccount();
     MakeFolders(&account);

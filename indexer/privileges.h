@@ -13,6 +13,6 @@ enum class Sight {
 /// the service account with no right of root's but to read every file (CAP_DAC_READ_SEARCH), and
 /// never a new one. A process without such rights stays who it is. Throws std::runtime_error.
 /// Before threads.
-Sight SettleIdentity();
+Sight DropPrivileges();
 
 }  // namespace maru::indexer

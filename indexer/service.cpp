@@ -6,7 +6,7 @@
 #include <algorithm>
 #include <cerrno>
 
-#include "indexer/shares.h"
+#include "indexer/tree/shares.h"
 #include "system/log.h"
 #include "system/share_table.h"
 
@@ -32,16 +32,16 @@ bool Contains(const std::vector<std::string>& names, const std::string& name) {
 void Service::Reconcile() {
   const std::shared_ptr<const ShareTable> table = ShareTable::Current();
   const Targets targets = FindTargets(*table);
-  std::erase_if(followers_, [&](const std::unique_ptr<Follower>& follower) {
-    return std::find(targets.present.begin(), targets.present.end(), follower->Share()) ==
+  std::erase_if(keepers_, [&](const std::unique_ptr<Keeper>& keeper) {
+    return std::find(targets.present.begin(), targets.present.end(), keeper->Share()) ==
            targets.present.end();
   });
   std::vector<std::string> used;
-  for (const auto& follower : followers_) used.push_back(follower->Share().index_folder);
+  for (const auto& keeper : keepers_) used.push_back(keeper->Share().index_folder);
   RemoveForeignIndices(*table, used);
   for (const Target& target : targets.present) {
     if (Contains(used, target.index_folder)) continue;
-    followers_.push_back(std::make_unique<Follower>(target, workers_, turn_, settings_));
+    keepers_.push_back(std::make_unique<Keeper>(target, workers_, turn_, settings_));
   }
   for (const std::string& share : targets.missing) {
     errno = 0;
@@ -51,10 +51,10 @@ void Service::Reconcile() {
 }
 
 void Service::CrawlSoon() {
-  for (const auto& follower : followers_) follower->CrawlSoon();
+  for (const auto& keeper : keepers_) keeper->CrawlSoon();
 }
 
-void Serve(Workers& workers, const Follower::Settings& settings) {
+void Serve(Workers& workers, const Keeper::Settings& settings) {
   const sigset_t signals = Signals();
   Service service(workers, settings);
   while (true) {

@@ -5,18 +5,18 @@
 #include <string>
 #include <vector>
 
-#include "indexer/follower.h"
-#include "indexer/pipeline.h"
+#include "indexer/keeper.h"
+#include "indexer/update/workers.h"
 
 namespace maru::indexer {
 
 /// All shares followed, as the settings have them at each moment. One thread.
 class Service {
  public:
-  Service(Workers& workers, const Follower::Settings& settings)
+  Service(Workers& workers, const Keeper::Settings& settings)
       : workers_(workers), settings_(settings) {}
 
-  /// Brings the followers in line with the settings: shares that came, went, or have another folder
+  /// Brings the keepers in line with the settings: shares that came, went, or have another folder
   /// now (a disk was mounted). Removes the indices of shares that are gone.
   void Reconcile();
   /// A crawl of every share, one after another.
@@ -24,14 +24,14 @@ class Service {
 
  private:
   Workers& workers_;
-  const Follower::Settings settings_;
+  const Keeper::Settings settings_;
   std::mutex turn_;
-  std::vector<std::unique_ptr<Follower>> followers_;
+  std::vector<std::unique_ptr<Keeper>> keepers_;
   std::vector<std::string> missing_;
 };
 
 /// Runs the service until SIGTERM or SIGINT, which the caller has blocked in all threads along with
 /// SIGHUP.
-void Serve(Workers& workers, const Follower::Settings& settings);
+void Serve(Workers& workers, const Keeper::Settings& settings);
 
 }  // namespace maru::indexer

@@ -13,7 +13,7 @@ maru::UniqueFd Socket(int fd) {
   if (fstat(fd, &status) != 0 || !S_ISSOCK(status.st_mode)) {
     throw std::runtime_error("only maruwebd can start it");
   }
-  return maru::server::Descriptor(fd);
+  return maru::UniqueFd(fd);
 }
 
 }  // namespace

@@ -6,10 +6,11 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
-#include <cstdint>
-#include <cstring>
 #include <map>
 #include <memory>
+
+#include "system/text.h"
+#include "system/utf8.h"
 
 namespace maru::extract {
 namespace {
@@ -100,15 +101,9 @@ bool IsWide(std::string_view bytes) {
   return mark && mark->charset;
 }
 
-bool SameName(std::string_view a, std::string_view b) {
-  const auto upper = [](char c) { return c >= 'a' && c <= 'z' ? c - 'a' + 'A' : c; };
-  return std::equal(a.begin(), a.end(), b.begin(), b.end(),
-                    [&](char x, char y) { return upper(x) == upper(y); });
-}
-
 const char* ConverterOf(std::string_view charset) {
   for (const CharsetRow& row : kCharsets) {
-    if (SameName(row.name, charset)) return row.converter;
+    if (SameWord(row.name, charset)) return row.converter;
   }
   return nullptr;
 }
@@ -159,7 +154,7 @@ std::string Repair(std::string_view bytes) {
   std::string text;
   bool replaced = false;
   while (!bytes.empty()) {
-    const std::size_t good = Utf8Length(bytes);
+    const std::size_t good = UTF8Beginning(bytes);
     text += bytes.substr(0, good);
     bytes.remove_prefix(good);
     if (good > 0) replaced = false;
@@ -169,25 +164,6 @@ std::string Repair(std::string_view bytes) {
     bytes.remove_prefix(1);
   }
   return text;
-}
-
-constexpr std::size_t kCutOff = 5;
-
-/// Length of the character that begins here; 0 when there is none, kCutOff when `bytes` end before
-/// it does.
-std::size_t CharacterLength(std::string_view bytes) {
-  const auto byte = [&](std::size_t i) { return static_cast<unsigned char>(bytes[i]); };
-  const unsigned first = byte(0);
-  if (first < 0x80) return 1;
-  if (first < 0xC2 || first > 0xF4) return 0;
-  const std::size_t length = first >= 0xF0 ? 4 : first >= 0xE0 ? 3 : 2;
-  for (std::size_t i = 1; i < std::min(length, bytes.size()); ++i) {
-    // Neither longer than need be, nor surrogates, nor beyond the last code point.
-    const unsigned low = i > 1 ? 0x80 : first == 0xE0 ? 0xA0 : first == 0xF0 ? 0x90 : 0x80;
-    const unsigned high = i > 1 ? 0xBF : first == 0xED ? 0x9F : first == 0xF4 ? 0x8F : 0xBF;
-    if (byte(i) < low || byte(i) > high) return 0;
-  }
-  return bytes.size() < length ? kCutOff : length;
 }
 
 }  // namespace
@@ -208,34 +184,10 @@ std::string_view TextPart(std::string_view bytes) {
   return IsWide(bytes) ? bytes : bytes.substr(0, bytes.find('\0'));
 }
 
-std::size_t Utf8Length(std::string_view bytes) {
-  constexpr std::uint64_t kHighBits = 0x8080808080808080u;
-  std::size_t at = 0;
-  while (at < bytes.size()) {
-    std::uint64_t eight = 0;
-    if (at + sizeof eight <= bytes.size()) {
-      std::memcpy(&eight, bytes.data() + at, sizeof eight);
-      if ((eight & kHighBits) == 0) {
-        at += sizeof eight;
-        continue;
-      }
-    }
-    const std::size_t length = CharacterLength(bytes.substr(at));
-    if (length == 0 || length == kCutOff) break;
-    at += length;
-  }
-  return at;
-}
-
-bool IsUtf8(std::string_view bytes) {
-  const std::size_t good = Utf8Length(bytes);
-  return good == bytes.size() || CharacterLength(bytes.substr(good)) == kCutOff;
-}
-
-void CutUtf8(std::string& text, std::size_t limit) {
-  if (text.size() <= limit) return;
-  while (limit > 0 && (static_cast<unsigned char>(text[limit]) & 0xC0) == 0x80) --limit;
-  text.resize(limit);
+std::optional<std::string_view> UTF8Text(std::string_view bytes) {
+  const std::size_t length = UTF8Beginning(bytes);
+  if (length < bytes.size() && !IsCutUTF8(bytes.substr(length))) return std::nullopt;
+  return bytes.substr(0, length);
 }
 
 void LoadCharsets() {
@@ -244,16 +196,18 @@ void LoadCharsets() {
   }
 }
 
-std::string ToUtf8(std::string_view bytes, std::string_view declared) {
+std::string ToUTF8(std::string_view bytes, std::string_view declared) {
   const Mark* mark = FindMark(bytes);
   if (mark) bytes.remove_prefix(mark->bytes.size());
   const bool wide = mark && mark->charset;
-  if (!wide && IsUtf8(bytes)) return std::string(bytes.substr(0, Utf8Length(bytes)));
+  if (!wide) {
+    if (const auto text = UTF8Text(bytes)) return std::string(*text);
+  }
   const char* name = wide ? mark->charset : mark ? nullptr : ConverterOf(declared);
-  if (!name && !mark && !SameName(declared, "UTF-8")) {
+  if (!name && !mark && !SameWord(declared, "UTF-8")) {
     const std::string guess = Guess(bytes);
-    if (!SameName(guess, "UTF-8")) name = ConverterOf(guess);
-    if (!name && !SameName(guess, "UTF-8")) name = "WINDOWS-1252";
+    if (!SameWord(guess, "UTF-8")) name = ConverterOf(guess);
+    if (!name && !SameWord(guess, "UTF-8")) name = "WINDOWS-1252";
   }
   iconv_t* converter = name ? Converter(name) : nullptr;
   return converter ? Convert(*converter, bytes) : Repair(bytes);

@@ -9,6 +9,7 @@
 
 #include "indexer/extract/charset.h"
 #include "indexer/extract/extractor.h"
+#include "system/utf8.h"
 
 namespace maru::extract {
 namespace {
@@ -114,7 +115,7 @@ void TakeTitle(const GumboElement& title, std::string& out) {
       collector.Add(child->v.text.text);
     }
   }
-  CutUtf8(out, kMaxTitle);
+  CutUTF8(out, kMaxTitle);
 }
 
 void TakeAuthor(const GumboElement& meta, std::vector<std::string>& out) {
@@ -124,7 +125,7 @@ void TakeAuthor(const GumboElement& meta, std::vector<std::string>& out) {
   if (out.size() >= kMaxAuthors) return;
   std::string author;
   Collector(author, kMaxTitle).Add(content->value);
-  CutUtf8(author, kMaxTitle);
+  CutUTF8(author, kMaxTitle);
   if (!author.empty()) out.push_back(std::move(author));
 }
 
@@ -204,12 +205,12 @@ bool IsHtml(std::string_view head) {
 
 Extracted ExtractHtml(const Source& source) {
   std::string html = ReadStart(source.file, kMaxHtml);
-  html = ToUtf8(html, DeclaredCharset(html));
+  html = ToUTF8(html, DeclaredCharset(html));
   std::replace(html.begin(), html.end(), '\0', ' ');
   Arena arena;
   Extracted result;
   Walk(result, source.max_text).Run(*Parse(arena, html).root);
-  CutUtf8(result.text, source.max_text);
+  CutUTF8(result.text, source.max_text);
   return result;
 }
 

@@ -6,19 +6,16 @@
 
 #include <cerrno>
 #include <cstring>
-#include <system_error>
 
 #include "indexer/extract/charset.h"
 #include "indexer/extract/wire.h"
 #include "indexer/extract/worker.h"
 #include "system/log.h"
+#include "system/throw_errno.h"
+#include "system/utf8.h"
 
 namespace maru::extract {
 namespace {
-
-[[noreturn]] void ThrowSystemError(const char* doing) {
-  throw std::system_error(errno, std::generic_category(), doing);
-}
 
 bool Receive(int socket, std::string& into, std::size_t size, Deadline deadline) {
   // Grows with what really comes: the announced size is the other side's claim.
@@ -36,8 +33,8 @@ bool Receive(int socket, std::string& into, std::size_t size, Deadline deadline)
 
 /// What came from the other side is bytes to be checked, like any file.
 std::string Clean(std::string text, std::size_t limit) {
-  if (!IsUtf8(text)) text = ToUtf8(text, "UTF-8");
-  CutUtf8(text, limit);
+  if (!IsUTF8(text)) text = ToUTF8(text, "UTF-8");
+  CutUTF8(text, limit);
   return text;
 }
 
@@ -58,12 +55,12 @@ Processes::Processes(unsigned slots, std::span<const Extractor> table,
     : timeout_(timeout) {
   int ends[2];
   if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends) != 0) {
-    ThrowSystemError("cannot make a socket pair");
+    ThrowErrno("cannot make a socket pair");
   }
   forker_ = UniqueFd(ends[0]);
   UniqueFd theirs(ends[1]);
   forker_pid_ = fork();
-  if (forker_pid_ < 0) ThrowSystemError("cannot fork");
+  if (forker_pid_ < 0) ThrowErrno("cannot fork");
   if (forker_pid_ == 0) RunForker(ends[1], slots, table);
   for (unsigned slot = 0; slot < slots; ++slot) workers_.push_back(NewWorker(slot));
 }

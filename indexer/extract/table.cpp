@@ -2,11 +2,11 @@
 
 #include <array>
 #include <cerrno>
-#include <system_error>
 
 #include "index/store/fields.h"
 #include "indexer/extract/charset.h"
 #include "indexer/extract/extractor.h"
+#include "system/throw_errno.h"
 
 namespace maru::extract {
 namespace {
@@ -57,9 +57,7 @@ std::string ReadStart(int file, std::size_t limit) {
     bytes.resize(std::min(limit, before + kStep));
     const ssize_t got =
         pread(file, bytes.data() + before, bytes.size() - before, static_cast<off_t>(before));
-    if (got < 0 && errno != EINTR) {
-      throw std::system_error(errno, std::generic_category(), "cannot read");
-    }
+    if (got < 0 && errno != EINTR) ThrowErrno("cannot read");
     bytes.resize(before + static_cast<std::size_t>(std::max<ssize_t>(got, 0)));
     if (got == 0) break;
   }

@@ -1,6 +1,7 @@
 #include <gtest/gtest.h>
 
 #include "indexer/extract/charset.h"
+#include "system/utf8.h"
 
 namespace maru::extract {
 namespace {
@@ -18,47 +19,51 @@ TEST(CharsetTest, TellsTextFromBinary) {
   EXPECT_EQ(6u, TextPart("\xFF\xFEh\0i\0"s).size());
 }
 
-TEST(CharsetTest, KnowsUtf8) {
-  EXPECT_TRUE(IsUtf8("caf\xC3\xA9 \xE2\x82\xAC \xF0\x9F\x98\x80"));
-  EXPECT_TRUE(IsUtf8("cut \xF0\x9F\x98")) << "a last character may be cut off";
-  EXPECT_EQ(4u, Utf8Length("cut \xF0\x9F\x98"));
+TEST(CharsetTest, KnowsUTF8) {
+  EXPECT_TRUE(IsUTF8("caf\xC3\xA9 \xE2\x82\xAC \xF0\x9F\x98\x80"));
   for (const char* bad : {"\xC0\x80", "\xE0\x80\x80", "\xED\xA0\x80", "\xF4\x90\x80\x80", "\xF5",
                           "\x80", "\xC3(", "caf\xE9!"}) {
-    EXPECT_FALSE(IsUtf8(bad)) << bad;
+    EXPECT_FALSE(IsUTF8(bad)) << bad;
+    EXPECT_FALSE(UTF8Text(bad)) << bad;
+  }
+  // Cut off at its end, each in another way.
+  for (const char* rest :
+       {"\xC3", "\xE0", "\xE0\xA0", "\xED\x9F", "\xF0", "\xF4\x8F", "\xF0\x9F\x98"}) {
+    EXPECT_EQ("cut ", UTF8Text(std::string("cut ") + rest)) << rest;
   }
   std::string text = "ab\xE2\x82\xAC";
-  CutUtf8(text, 4);
+  CutUTF8(text, 4);
   EXPECT_EQ("ab", text);
 }
 
 TEST(CharsetTest, ConvertsWhatItIsToldSeesOrGuesses) {
   LoadCharsets();
-  EXPECT_EQ("h\xC3\xA9", ToUtf8("\xFF\xFEh\0\xE9\0"s, ""));
-  EXPECT_EQ("h\xC3\xA9", ToUtf8("\xFE\xFF\0h\0\xE9"s, "utf-8"));
-  EXPECT_EQ("h\xF0\x9F\x98\x80", ToUtf8("\xFF\xFE\0\0h\0\0\0\0\xF6\x01\0"s, ""));
-  EXPECT_EQ("plain", ToUtf8("\xEF\xBB\xBFplain", "koi8-r"));
+  EXPECT_EQ("h\xC3\xA9", ToUTF8("\xFF\xFEh\0\xE9\0"s, ""));
+  EXPECT_EQ("h\xC3\xA9", ToUTF8("\xFE\xFF\0h\0\xE9"s, "utf-8"));
+  EXPECT_EQ("h\xF0\x9F\x98\x80", ToUTF8("\xFF\xFE\0\0h\0\0\0\0\xF6\x01\0"s, ""));
+  EXPECT_EQ("plain", ToUTF8("\xEF\xBB\xBFplain", "koi8-r"));
   EXPECT_EQ("\xD0\xBF\xD1\x80\xD0\xB8\xD0\xB2\xD0\xB5\xD1\x82",
-            ToUtf8("\xD0\xD2\xC9\xD7\xC5\xD4", "koi8-r"));
-  EXPECT_EQ("\xE2\x82\xAC \xE2\x80\x93", ToUtf8("\x80 \x96", "ISO-8859-1")) << "as browsers do";
-  const std::string russian = ToUtf8(
+            ToUTF8("\xD0\xD2\xC9\xD7\xC5\xD4", "koi8-r"));
+  EXPECT_EQ("\xE2\x82\xAC \xE2\x80\x93", ToUTF8("\x80 \x96", "ISO-8859-1")) << "as browsers do";
+  const std::string russian = ToUTF8(
       "\xCF\xF0\xE8\xE2\xE5\xF2, \xFD\xF2\xEE \xEE\xE1\xFB\xF7\xED\xFB\xE9 \xF2\xE5\xEA\xF1\xF2 "
       "\xED\xE0 \xF0\xF3\xF1\xF1\xEA\xEE\xEC \xFF\xE7\xFB\xEA\xE5",
       "");
   EXPECT_EQ(0u, russian.find("\xD0\x9F\xD1\x80\xD0\xB8\xD0\xB2\xD0\xB5\xD1\x82")) << russian;
-  const std::string japanese = ToUtf8(
+  const std::string japanese = ToUTF8(
       "\x93\xFA\x96\x7B\x8C\xEA\x82\xCC\x83\x65\x83\x4C\x83\x58\x83\x67\x82\xC5\x82\xB7\x81\x42",
       "");
   EXPECT_EQ(0u, japanese.find("\xE6\x97\xA5\xE6\x9C\xAC\xE8\xAA\x9E")) << japanese;
 }
 
-TEST(CharsetTest, NonsenseBecomesValidUtf8) {
+TEST(CharsetTest, NonsenseBecomesValidUTF8) {
   std::string noise;
   for (int i = 1; i < 100'000; ++i) noise += static_cast<char>(i * 7919 >> 3);
   for (const char* declared : {"", "utf-8", "shift_jis", "utf-16le", "no-such-charset", "gb18030",
                                "iso-2022-kr", "../../etc/passwd"}) {
-    EXPECT_TRUE(IsUtf8(ToUtf8(noise, declared))) << declared;
+    EXPECT_TRUE(IsUTF8(ToUTF8(noise, declared))) << declared;
   }
-  EXPECT_EQ("a\xEF\xBF\xBDz", ToUtf8("a\xff\xff\xffz", "utf-8"));
+  EXPECT_EQ("a\xEF\xBF\xBDz", ToUTF8("a\xff\xff\xffz", "utf-8"));
 }
 
 }  // namespace

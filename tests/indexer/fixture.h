@@ -20,7 +20,7 @@
 
 #include "common/error.h"
 #include "index/search/library.h"
-#include "indexer/crawler.h"
+#include "indexer/crawl/crawl.h"
 #include "indexer/extract/processes.h"
 
 namespace maru::indexer::test {
@@ -97,7 +97,7 @@ class ShareTest : public testing::Test {
     ASSERT_EQ(0, chmod((Share() + "/" + path).c_str(), mode));
   }
 
-  /// What changed within the current tick of the clock is not taken for settled.
+  /// What changed within the current tick of the clock is compared once more.
   static void LetClockTick() { std::this_thread::sleep_for(std::chrono::milliseconds(25)); }
 
   struct Outcome {
@@ -107,10 +107,9 @@ class ShareTest : public testing::Test {
     LetClockTick();
     Counts counts;
     {
-      Catalog catalog(IndexFolder(), counts, nullptr);
-      Crawler crawler(catalog, TheWorkers(), counts, stop_, nullptr, Catalog::Bounds{});
-      UniqueFd top(open(Share().c_str(), O_RDONLY | O_DIRECTORY));
-      compared_ = crawler.CrawlShare(std::move(top), "share");
+      Tree tree(IndexFolder(), counts, nullptr);
+      Updater updater(tree, TheWorkers(), stop_);
+      compared_ = indexer::Crawl(updater).Run(OpenTop(Share()).Get(), "share");
     }
     return {counts.added,  counts.changed,    counts.unchanged, counts.removed,
             counts.failed, counts.unreadable, counts.bytes};

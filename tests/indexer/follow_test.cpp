@@ -1,5 +1,5 @@
 #include "fixture.h"
-#include "indexer/follower.h"
+#include "indexer/keeper.h"
 
 namespace maru::indexer::test {
 namespace {
@@ -7,8 +7,8 @@ namespace {
 class FollowTest : public ShareTest {
  protected:
   void Follow() {
-    follower_ = std::make_unique<Follower>(Target{"share", Share(), IndexFolder(), {}},
-                                           TheWorkers(), turn_, settings_);
+    keeper_ = std::make_unique<Keeper>(Target{"share", Share(), IndexFolder(), {}}, TheWorkers(),
+                                       turn_, settings_);
   }
 
   /// Waits until the index says what the disk says.
@@ -22,8 +22,8 @@ class FollowTest : public ShareTest {
   }
 
   std::mutex turn_;
-  Follower::Settings settings_;
-  std::unique_ptr<Follower> follower_;
+  Keeper::Settings settings_;
+  std::unique_ptr<Keeper> keeper_;
 };
 
 TEST_F(FollowTest, FindsEveryKindOfChange) {
@@ -40,11 +40,11 @@ TEST_F(FollowTest, FindsEveryKindOfChange) {
   EXPECT_TRUE(Search("before").empty());
 
   const index::DocumentId deeper = DocumentOf("/deep/er/and/deeper.txt");
-  const std::uint64_t read = follower_->Done().bytes;
+  const std::uint64_t read = keeper_->Done().bytes;
   Rename("deep/er", "old/moved");
   ExpectCaughtUp("moved folder");
   EXPECT_EQ(deeper, DocumentOf("/old/moved/and/deeper.txt"));
-  EXPECT_EQ(read, follower_->Done().bytes) << "a moved folder is not read again";
+  EXPECT_EQ(read, keeper_->Done().bytes) << "a moved folder is not read again";
   Write("old/moved/and/later.txt", "its folder is still watched");
   ExpectCaughtUp("in the moved folder");
 
@@ -90,7 +90,7 @@ TEST_F(FollowTest, AnyMixOfChangesIsCaughtUpWith) {
     ExpectCaughtUp("round " + std::to_string(round));
     if (HasFailure()) return;
   }
-  follower_.reset();
+  keeper_.reset();
   const Snapshot followed = Indexed();
   Crawl();
   EXPECT_EQ("", Differences(followed, Indexed())) << "a crawl finds nothing that was missed";
@@ -120,7 +120,7 @@ TEST_F(FollowTest, SharesCrawlOneAfterAnotherAndEndPromptly) {
   EXPECT_FALSE(library_.Has("fileindex_share"));
   busy.unlock();
   ExpectCaughtUp();
-  follower_.reset();
+  keeper_.reset();
   Write("f0", "changed while nobody looked");
   Follow();
   ExpectCaughtUp("after a new start");

@@ -5,6 +5,7 @@
 #include "indexer/extract/charset.h"
 #include "indexer/extract/extractor.h"
 #include "system/unique_fd.h"
+#include "system/utf8.h"
 
 namespace maru::extract {
 namespace {
@@ -77,7 +78,7 @@ TEST(HtmlTest, HostilePagesEndAndStayWithinBounds) {
     EXPECT_LE(page.text.size(), 1000u);
     EXPECT_LE(page.title.size(), 1024u);
     EXPECT_LE(page.authors.size(), 16u);
-    EXPECT_TRUE(IsUtf8(page.text));
+    EXPECT_TRUE(IsUTF8(page.text));
   }
   EXPECT_EQ("deep", Html(hostile[0]).text);
 }

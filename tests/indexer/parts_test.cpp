@@ -1,6 +1,6 @@
 #include "fixture.h"
-#include "indexer/pending.h"
-#include "indexer/progress.h"
+#include "indexer/crawl/progress.h"
+#include "indexer/follow/pending.h"
 
 namespace maru::indexer::test {
 namespace {
@@ -22,9 +22,7 @@ TEST(PendingTest, AFileComesToRestButNotForEver) {
   // Closed: a moment.
   pending.Add(2, "b", true, start);
   pending.Add(2, "a", true, start);
-  const auto batches = pending.TakeDue(start + Pending::kMoment, 10);
-  ASSERT_EQ(1u, batches.size());
-  EXPECT_EQ((std::vector<std::string>{"a", "b"}), batches[0].names);
+  EXPECT_EQ((NamesByFolder{{2, {"a", "b"}}}), pending.TakeDue(start + Pending::kMoment, 10));
 }
 
 TEST(PendingTest, TooManyAreForACrawlToFind) {

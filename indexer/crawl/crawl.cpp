@@ -1,0 +1,46 @@
+#include "indexer/crawl/crawl.h"
+
+#include <cerrno>
+
+#include "indexer/update/settle.h"
+#include "system/log.h"
+
+namespace maru::indexer {
+
+using index::Writer;
+
+bool Crawl::Run(int top, const std::string& share_name) {
+  if (LooksUnmounted(top)) {
+    errno = 0;
+    MARU_LOG("Share %s is empty and not the folder it was: left as it was indexed",
+             share_name.c_str());
+    return false;
+  }
+  Tree& tree = updater_.Indexed();
+  const bool is_first = !tree.HasRoot();
+  if (!updater_.UpdateTop(top, share_name)) return false;
+  if (is_first) {
+    NewTree(updater_).Run(top, Writer::kRoot);
+  } else {
+    Walk::Run(top, Writer::kRoot);
+  }
+  Settle(updater_, top);
+  tree.Commit();
+  return true;
+}
+
+/// It may have been moved here from where the crawl has not been yet.
+void Crawl::Meet(int dir_fd, Folder& folder, const Found& found) {
+  if (updater_.Adopt(dir_fd, folder, found)) return;
+  if (updater_.Moved().AddArrival(folder.id, std::string(found.name))) return;
+  updater_.TakeIn(dir_fd, folder, found);
+}
+
+bool Crawl::LooksUnmounted(int top) {
+  Tree& tree = updater_.Indexed();
+  if (!tree.HasRoot() || tree.Root().stamp.inode == IdOf(top).inode) return false;
+  return !tree.Open(Writer::kRoot)->entries.empty() && listing_.Read(top) &&
+         listing_.Entries().empty();
+}
+
+}  // namespace maru::indexer

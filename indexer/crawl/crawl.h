@@ -1,0 +1,23 @@
+#pragma once
+
+#include <string>
+
+#include "indexer/update/full_walk.h"
+
+namespace maru::indexer {
+
+/// Brings a whole share up to date: everything on the disk is compared with the index.
+class Crawl : private FullWalk {
+ public:
+  explicit Crawl(Updater& updater) : FullWalk(updater) {}
+
+  /// `top` is the share's folder, open. False when it was not compared: it cannot be read, or is an
+  /// empty one in place of another (a disk that is not mounted). Commits.
+  bool Run(int top, const std::string& share_name);
+
+ private:
+  void Meet(int dir_fd, Folder& folder, const Found& found) override;
+  bool LooksUnmounted(int top);
+};
+
+}  // namespace maru::indexer

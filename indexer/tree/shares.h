@@ -1,0 +1,41 @@
+#pragma once
+
+#include <string>
+#include <vector>
+
+#include "indexer/tree/listing.h"
+#include "system/share_table.h"
+
+namespace maru::indexer {
+
+/// A share with its index.
+struct Target {
+  std::string share;
+  std::string path;
+  std::string index_folder;
+  /// Which folder lies there now.
+  FileId top;
+
+  friend bool operator==(const Target&, const Target&) = default;
+};
+
+/// The folder that holds the index folders.
+std::string IndexHome();
+
+struct Targets {
+  /// In the settings' order.
+  std::vector<Target> present;
+  /// Shares that are to be indexed, but whose folder is not there now.
+  std::vector<std::string> missing;
+};
+Targets FindTargets(const ShareTable& table);
+
+/// Removes the indices of shares that are gone from the settings, or are not to be indexed any
+/// more, after a log line each. Touches nothing but folders named fileindex_*, and nothing at all
+/// while the newest settings have an error. `used` names indices that are still open.
+void RemoveForeignIndices(const ShareTable& table, const std::vector<std::string>& used);
+
+/// Empties one index. The caller holds the indexer's lock, and the index is not open.
+void RemoveIndex(const std::string& index_folder);
+
+}  // namespace maru::indexer
