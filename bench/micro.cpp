@@ -5,13 +5,13 @@
 #include <filesystem>
 #include <string>
 
-#include "daemon/keyword.h"
-#include "index/fields.h"
-#include "index/fragments.h"
-#include "index/reader.h"
-#include "index/signature.h"
-#include "index/tokenizer.h"
-#include "index/writer.h"
+#include "daemon/language/keyword.h"
+#include "index/search/library.h"
+#include "index/store/fields.h"
+#include "index/store/writer.h"
+#include "index/text/fragments.h"
+#include "index/text/signature.h"
+#include "index/text/tokenizer.h"
 #include "system/json.h"
 
 namespace {
@@ -64,15 +64,15 @@ void PrepareDocument(benchmark::State& state) {
 BENCHMARK(PrepareDocument);
 
 void MatchWords(benchmark::State& state) {
-  const Matcher matcher({{"", {"berth", "berths"}, false}, {"", {"tide", "is", "out"}, true}});
-  for (auto _ : state) benchmark::DoNotOptimize(matcher.MatchesIn(Text()));
+  const WordFinder finder({{"", {"berth", "berths"}, false}, {"", {"tide", "is", "out"}, true}});
+  for (auto _ : state) benchmark::DoNotOptimize(finder.MatchesIn(Text()));
   Bytes(state);
 }
 BENCHMARK(MatchWords);
 
 void BestFragments(benchmark::State& state) {
-  const Matcher matcher({{"", {"berth"}, false}, {"", {"tide"}, false}});
-  const std::vector<Match> matches = matcher.MatchesIn(Text());
+  const WordFinder finder({{"", {"berth"}, false}, {"", {"tide"}, false}});
+  const std::vector<Match> matches = finder.MatchesIn(Text());
   for (auto _ : state) {
     for (const Window& window : BestWindows(Text(), matches, {"", 100, 3})) {
       benchmark::DoNotOptimize(RenderWindow(Text(), window, matches));
@@ -96,10 +96,10 @@ void ParseAndWriteJson(benchmark::State& state) {
 BENCHMARK(ParseAndWriteJson);
 
 void ReadKeyword(benchmark::State& state) {
-  const maru::daemon::KeywordOptions options{{{std::string(kName), 3}, {std::string(kText), 1}}};
+  const std::vector<FieldWeight> fields{{std::string(kName), 3}, {std::string(kText), 1}};
   for (auto _ : state) {
     benchmark::DoNotOptimize(
-        maru::daemon::ParseKeyword("harbour (berth OR \"low tide\") -storm ship*", options));
+        maru::daemon::ParseKeyword("harbour (berth OR \"low tide\") -storm ship*", fields));
   }
 }
 BENCHMARK(ReadKeyword);
@@ -149,9 +149,7 @@ class SmallIndex : public benchmark::Fixture {
     SearchOptions options;
     options.size = 50;
     for (auto _ : state) {
-      auto reader = library_->Open({"fileindex_bench"});
-      reader->SetEyes(who);
-      const SearchResult result = reader->Search(query, options);
+      const SearchResult result = library_->Open({"fileindex_bench"}, who)->Search(query, options);
       if (result.total == 0) state.SkipWithError("nothing found");
     }
   }
@@ -175,10 +173,11 @@ BENCHMARK_F(SmallIndex, SearchPhrase)(benchmark::State& state) {
 BENCHMARK_F(SmallIndex, StoredFragments)(benchmark::State& state) {
   const Query query = QueryOf(Query::Kind::kWord, {"berth"});
   const FragmentOptions options{std::string(kText), 100, 3};
-  auto reader = library_->Open({"fileindex_bench"});
-  reader->SetEyes(kSomebody);
+  const auto view = library_->Open({"fileindex_bench"}, kSomebody);
+  const auto hit = view->Find(0, DocumentId{1000});
+  Highlighter highlighter(*view, query);
   for (auto _ : state) {
-    if (reader->Fragments(0, 1000, query, options).empty()) state.SkipWithError("no fragment");
+    if (highlighter.FragmentsOf(*hit, options).empty()) state.SkipWithError("no fragment");
   }
 }
 

@@ -1,20 +1,17 @@
 #include <pwd.h>
-#include <sys/resource.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <CLI/CLI.hpp>
 #include <csignal>
-#include <exception>
-#include <iostream>
 #include <stdexcept>
 #include <string>
 
-#include "daemon/core.h"
-#include "daemon/listener.h"
-#include "daemon/privilege.h"
-#include "daemon/server.h"
+#include "daemon/core/capability.h"
+#include "daemon/core/core.h"
+#include "daemon/socket/listener.h"
+#include "daemon/socket/server.h"
 #include "history/newest.h"
+#include "program/program.h"
 #include "system/accounts.h"
 #include "system/config.h"
 #include "system/daemon_connection.h"
@@ -43,20 +40,13 @@ Identity FutureIdentity() {
   return identity.value_or(Identity{geteuid(), {}});
 }
 
-void RaiseDescriptorLimit() {
-  rlimit limit;
-  if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return;
-  limit.rlim_cur = limit.rlim_max;
-  setrlimit(RLIMIT_NOFILE, &limit);
-}
-
-void Serve(const Config& config) {
+int Serve(const Config& config) {
   umask(077);
   RaiseDescriptorLimit();
   const Identity identity = FutureIdentity();
   const Listener listener(kDaemonSocket, identity);
   DropPrivileges(kServiceAccount);
-  if (!MayExamineAllFiles()) {
+  if (!HoldsReadSearch()) {
     MARU_LOG("Running without CAP_DAC_READ_SEARCH: only files that user %u can reach are shown",
              geteuid());
   }
@@ -70,26 +60,14 @@ void Serve(const Config& config) {
   std::signal(SIGPIPE, SIG_IGN);
   server.Run();
   for (const int signal : {SIGTERM, SIGINT}) std::signal(signal, SIG_IGN);
+  return 0;
 }
 
 }  // namespace
 
 int main(int argc, char** argv) {
-  CLI::App app("The search daemon of MaruSeeker.", "maruelasticd");
-  std::string config_file = Config::kDefaultPath;
-  bool foreground = false;
-  app.add_option("--config", config_file, "Configuration file")->type_name("FILE");
-  app.add_flag("--foreground", foreground, "Log to standard error, too");
-  app.set_version_flag("--version", MARUSEEKER_VERSION);
-  CLI11_PARSE(app, argc, argv);
-  OpenLog("maruelasticd", foreground);
-  try {
-    Serve(app.count("--config") ? Config::Load(config_file) : Config::Get());
-    return 0;
-  } catch (const std::exception& error) {
-    errno = 0;
-    MARU_LOG("%s", error.what());
-    if (!foreground) std::cerr << "maruelasticd: " << error.what() << "\n";
-    return 1;
-  }
+  return RunProgram({{.name = "maruelasticd",
+                      .help = "The search daemon of MaruSeeker.",
+                      .run = [] { return Serve(Config::Get()); }}},
+                    argc, argv);
 }

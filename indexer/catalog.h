@@ -8,7 +8,7 @@
 #include <unordered_map>
 #include <vector>
 
-#include "index/writer.h"
+#include "index/store/writer.h"
 #include "indexer/counts.h"
 
 namespace maru::indexer {

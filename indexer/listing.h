@@ -7,7 +7,7 @@
 #include <string_view>
 #include <vector>
 
-#include "index/document.h"
+#include "index/store/document.h"
 #include "system/unique_fd.h"
 
 /// What lies in a folder, seen through its descriptor: paths are never put together, so names may

@@ -1,13 +1,9 @@
-#include <CLI/CLI.hpp>
-
 #include <fcntl.h>
 #include <signal.h>
-#include <sys/resource.h>
 
 #include <algorithm>
 #include <atomic>
 #include <cerrno>
-#include <cstdio>
 #include <cstring>
 #include <stdexcept>
 #include <string>
@@ -18,14 +14,15 @@
 #include "indexer/once.h"
 #include "indexer/privileges.h"
 #include "indexer/service.h"
+#include "program/program.h"
 #include "system/config.h"
 #include "system/log.h"
 
 namespace maru::indexer {
 namespace {
 
+constexpr const char* kProgram = "maruindexd";
 constexpr int kExitFailed = 1;
-constexpr int kExitUsage = 2;
 /// As a shell tells of a process that a signal ended.
 constexpr int kExitSignal = 128;
 /// What the crawling thread sends the waiting one.
@@ -35,26 +32,32 @@ struct Options {
   bool once = false;
   bool full = false;
   bool quiet = false;
-  bool foreground = false;
   std::vector<std::string> shares;
-  std::string config;
   int crawl_hours = 24;
 };
 
-void Describe(CLI::App& app, Options& options) {
-  app.set_version_flag("--version", MARU_VERSION);
-  app.add_flag("--once", options.once, "Crawl once, with progress, and end");
-  app.add_option("--share", options.shares, "With --once: only this share; may be repeated")
-      ->needs("--once");
-  app.add_flag("--full", options.full, "With --once: forget the index and crawl anew")
-      ->needs("--once");
-  app.add_flag("--quiet", options.quiet, "With --once: no progress and no summary")
-      ->needs("--once");
-  app.add_flag("--foreground", options.foreground, "Copy the log to standard error");
-  app.add_option("--crawl-hours", options.crawl_hours, "Hours between two comparing crawls")
-      ->check(CLI::Range(1, 24 * 30))
-      ->capture_default_str();
-  app.add_option("--config", options.config, "Configuration file");
+std::vector<Argument> Arguments(Options& options) {
+  constexpr const char* kOnce = "--once";
+  return {
+      {.names = kOnce, .help = "Crawl once, with progress, and end", .value = &options.once},
+      {.names = "--share",
+       .help = "With --once: only this share; may be repeated",
+       .value = &options.shares,
+       .needs = kOnce},
+      {.names = "--full",
+       .help = "With --once: forget the index and crawl anew",
+       .value = &options.full,
+       .needs = kOnce},
+      {.names = "--quiet",
+       .help = "With --once: no progress and no summary",
+       .value = &options.quiet,
+       .needs = kOnce},
+      {.names = "--crawl-hours",
+       .help = "Hours between two comparing crawls",
+       .value = &options.crawl_hours,
+       .minimum = 1,
+       .maximum = 24 * 30},
+  };
 }
 
 void BlockSignals(sigset_t& signals) {
@@ -62,13 +65,6 @@ void BlockSignals(sigset_t& signals) {
   for (const int signal : {SIGTERM, SIGINT, SIGHUP, kCrawlEnded}) sigaddset(&signals, signal);
   pthread_sigmask(SIG_BLOCK, &signals, nullptr);
   signal(SIGPIPE, SIG_IGN);
-}
-
-void RaiseDescriptorLimit() {
-  rlimit limit{};
-  if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return;
-  limit.rlim_cur = limit.rlim_max;
-  setrlimit(RLIMIT_NOFILE, &limit);
 }
 
 /// One indexer a state folder. Held as long as the process lives.
@@ -123,8 +119,7 @@ int RunOnce(const Options& options, Workers& workers, const sigset_t& signals) {
 }
 
 int Run(const Options& options) {
-  if (!options.config.empty()) Config::Load(options.config);
-  OpenLog("maruindexd", options.foreground || options.once);
+  if (options.once) OpenLog(kProgram, true);
   const Sight sight = SettleIdentity();
   sigset_t signals;
   BlockSignals(signals);
@@ -150,17 +145,9 @@ int Run(const Options& options) {
 int main(int argc, char** argv) {
   using namespace maru::indexer;
   Options options;
-  CLI::App app("Keeps the index of the shared folders up to date.", "maruindexd");
-  Describe(app, options);
-  try {
-    app.parse(argc, argv);
-  } catch (const CLI::ParseError& error) {
-    return app.exit(error) == 0 ? 0 : kExitUsage;
-  }
-  try {
-    return Run(options);
-  } catch (const std::exception& error) {
-    std::fprintf(stderr, "maruindexd: %s\n", error.what());
-    return kExitFailed;
-  }
+  return maru::RunProgram({{.name = kProgram,
+                            .help = "Keeps the index of the shared folders up to date.",
+                            .arguments = Arguments(options),
+                            .run = [&] { return Run(options); }}},
+                          argc, argv);
 }

@@ -7,7 +7,7 @@
 #include <utility>
 #include <vector>
 
-#include "index/document.h"
+#include "index/store/document.h"
 
 namespace maru::indexer {
 

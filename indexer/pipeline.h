@@ -9,7 +9,7 @@
 #include <thread>
 #include <vector>
 
-#include "index/writer.h"
+#include "index/store/writer.h"
 #include "indexer/counts.h"
 #include "indexer/extract/processes.h"
 #include "system/unique_fd.h"

@@ -4,7 +4,7 @@
 #include <string>
 #include <vector>
 
-#include "index/document.h"
+#include "index/store/document.h"
 #include "indexer/listing.h"
 #include "system/unique_fd.h"
 

@@ -6,7 +6,7 @@
 #include <unordered_map>
 #include <vector>
 
-#include "index/document.h"
+#include "index/store/document.h"
 #include "system/unique_fd.h"
 
 namespace maru::indexer {

@@ -1,48 +1,38 @@
 #include <sys/stat.h>
 
-#include <CLI/CLI.hpp>
-#include <cstdio>
-#include <exception>
-#include <string>
+#include <stdexcept>
 
-#include "server/host.h"
+#include "program/program.h"
+#include "server/host/host.h"
 #include "system/config.h"
-#include "system/log.h"
 
 namespace {
 
-bool IsSocket(int fd) {
+maru::UniqueFd Socket(int fd) {
   struct stat status;
-  return fstat(fd, &status) == 0 && S_ISSOCK(status.st_mode);
+  if (fstat(fd, &status) != 0 || !S_ISSOCK(status.st_mode)) {
+    throw std::runtime_error("only maruwebd can start it");
+  }
+  return maru::server::Descriptor(fd);
 }
 
 }  // namespace
 
 int main(int argc, char** argv) {
-  std::string path;
-  bool foreground = false;
   int control = -1;
   int lifeline = -1;
-  CLI::App app("The host of MaruSeeker's web server. maruwebd starts it; nobody else should.",
-               "maruweb-host");
-  app.add_option("--config", path, "Configuration file")->type_name("FILE");
-  app.add_flag("--foreground", foreground, "Copy the log to standard error");
-  app.add_option("control", control, "Socket that leads to the front")->required();
-  app.add_option("lifeline", lifeline, "Socket that leads to the supervisor")->required();
-  app.set_version_flag("--version", "maruweb-host " MARU_VERSION);
-  CLI11_PARSE(app, argc, argv);
-  maru::OpenLog("maruwebd", foreground);
-  try {
-    if (!IsSocket(control) || !IsSocket(lifeline)) {
-      fprintf(stderr, "maruweb-host: only maruwebd can start it\n");
-      return 1;
-    }
-    maru::Config config = path.empty() ? maru::Config::Get() : maru::Config::Load(path);
+  const auto serve = [&] {
+    maru::Config config = maru::Config::Get();
     if (config.plugin.empty()) config.plugin = MARU_PLUGIN;
-    return maru::server::RunHost(config, maru::server::Descriptor(control),
-                                 maru::server::Descriptor(lifeline));
-  } catch (const std::exception& exception) {
-    MARU_LOG("The host cannot start: %s", exception.what());
-    return 1;
-  }
+    return maru::server::RunHost(config, Socket(control), Socket(lifeline));
+  };
+  return maru::RunProgram(
+      {.command =
+           {.name = "maruweb-host",
+            .help = "The host of MaruSeeker's web server. maruwebd starts it; nobody else should.",
+            .arguments = {{"control", "Socket that leads to the front", &control, true},
+                          {"lifeline", "Socket that leads to the supervisor", &lifeline, true}},
+            .run = serve},
+       .log_name = "maruwebd"},
+      argc, argv);
 }

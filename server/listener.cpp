@@ -1,14 +1,14 @@
 #include "server/listener.h"
 
 #include <arpa/inet.h>
-#include <errno.h>
 #include <netinet/in.h>
 #include <sys/socket.h>
 
 #include <cstring>
 #include <stdexcept>
 #include <string>
-#include <system_error>
+
+#include "system/throw_errno.h"
 
 namespace maru::server {
 namespace {
@@ -47,7 +47,7 @@ Address Parse(const Config& config) {
 
 }  // namespace
 
-Descriptor OpenListener(const Config& config) {
+UniqueFd OpenListener(const Config& config) {
   if (config.tls_certificate.empty() != config.tls_key.empty())
     throw std::runtime_error("tls_certificate and tls_key belong together");
   const Address address = Parse(config);
@@ -55,17 +55,14 @@ Descriptor OpenListener(const Config& config) {
     throw std::runtime_error("beyond loopback (" + config.listen_address +
                              ") a certificate (tls_certificate, tls_key) is needed, or "
                              "behind_proxy = yes when a proxy holds it");
-  const auto demand = [](bool good, const char* what) {
-    if (!good) throw std::system_error(errno, std::generic_category(), what);
-  };
-  Descriptor listener(socket(address.storage.ss_family, SOCK_STREAM | SOCK_CLOEXEC, 0));
-  demand(static_cast<bool>(listener), "socket");
+  UniqueFd listener(socket(address.storage.ss_family, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  CheckErrno(listener.Get() >= 0, "socket");
   const int yes = 1;
   setsockopt(listener.Get(), SOL_SOCKET, SO_REUSEADDR, &yes, sizeof(yes));
-  demand(
+  CheckErrno(
       bind(listener.Get(), reinterpret_cast<const sockaddr*>(&address.storage), address.size) == 0,
       "bind");
-  demand(listen(listener.Get(), kBacklog) == 0, "listen");
+  CheckErrno(listen(listener.Get(), kBacklog) == 0, "listen");
   return listener;
 }
 

@@ -1,15 +1,15 @@
 #include "server/mounts.h"
 
 #include <errno.h>
-#include <sched.h>
 #include <sys/mount.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <set>
-#include <system_error>
 
+#include "server/kernel/confinement.h"
 #include "system/log.h"
+#include "system/throw_errno.h"
 
 namespace maru::server {
 namespace {
@@ -22,17 +22,12 @@ bool IsMountable(const ShareSettings& share) {
 }  // namespace
 
 ShareMounts::ShareMounts() {
-  const auto demand = [](int result, const char* what) {
-    if (result < 0) throw std::system_error(errno, std::generic_category(), what);
-  };
-  demand(unshare(CLONE_NEWNS), "unshare");
-  demand(mount(nullptr, "/", nullptr, MS_REC | MS_SLAVE, nullptr), "mount /");
-  if (mkdir(kVolume, 0755) < 0 && errno != EEXIST) demand(-1, kVolume);
-  demand(mount("tmpfs", kVolume, "tmpfs", MS_NOSUID | MS_NODEV | MS_NOEXEC,
-               "mode=755,size=1m,nr_inodes=16384"),
-         kVolume);
-  demand(mount(nullptr, kVolume, nullptr, MS_SHARED, nullptr), kVolume);
-  errno = 0;
+  EnterMountNamespace();
+  CheckErrno(mkdir(kVolume, 0755) == 0 || errno == EEXIST, kVolume);
+  CheckErrno(mount("tmpfs", kVolume, "tmpfs", MS_NOSUID | MS_NODEV | MS_NOEXEC,
+                   "mode=755,size=1m,nr_inodes=16384") == 0,
+             kVolume);
+  CheckErrno(mount(nullptr, kVolume, nullptr, MS_SHARED, nullptr) == 0, kVolume);
 }
 
 void ShareMounts::Apply(const ShareTable& table) {
@@ -60,7 +55,6 @@ void ShareMounts::Mount(const ShareSettings& share) {
       mount(share.path.c_str(), target.c_str(), nullptr, MS_BIND | MS_REC, nullptr) == 0;
   if (!good && !failed_before)
     MARU_LOG("Share %s cannot be mounted from %s", share.name.c_str(), share.path.c_str());
-  if (good) errno = 0;
   mounted_[share.name] = good ? share.path : std::string();
 }
 
@@ -69,7 +63,6 @@ void ShareMounts::Unmount(const std::string& name) {
   if (!mounted_[name].empty() && umount2(target.c_str(), MNT_DETACH | UMOUNT_NOFOLLOW) < 0)
     MARU_LOG("Share %s cannot be unmounted", name.c_str());
   rmdir(target.c_str());
-  errno = 0;
   mounted_.erase(name);
 }
 

@@ -16,16 +16,17 @@
 #include <cstring>
 #include <functional>
 #include <string>
-#include <system_error>
+#include <utility>
 #include <vector>
 
-#include "server/frames.h"
-#include "server/front.h"
+#include "server/front/front.h"
+#include "server/kernel/signals.h"
 #include "server/listener.h"
 #include "server/mounts.h"
-#include "server/signals.h"
+#include "server/wire/letters.h"
 #include "system/log.h"
 #include "system/share_table.h"
+#include "system/throw_errno.h"
 
 namespace maru::server {
 namespace {
@@ -38,13 +39,9 @@ constexpr int kEndWithin = 5000;  // milliseconds
 struct Part {
   const char* name;
   pid_t pid = -1;
-  Descriptor lifeline;
+  UniqueFd lifeline;
   bool ready = false;
 };
-
-void Demand(bool good, const char* what) {
-  if (!good) throw std::system_error(errno, std::generic_category(), what);
-}
 
 /// Tells systemd, when it asked to be told.
 void NotifyReady() {
@@ -54,7 +51,7 @@ void NotifyReady() {
   if (!path || strlen(path) >= sizeof(address.sun_path)) return;
   strcpy(address.sun_path, path);
   if (path[0] == '@') address.sun_path[0] = '\0';
-  const Descriptor socket(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
+  const UniqueFd socket(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
   const auto size = static_cast<socklen_t>(offsetof(sockaddr_un, sun_path) + strlen(path));
   constexpr std::string_view text = "READY=1";
   if (sendto(socket.Get(), text.data(), text.size(), MSG_NOSIGNAL,
@@ -69,31 +66,27 @@ class Supervisor {
         host_command_(std::move(host_command)),
         listener_(OpenListener(config)),
         signals_(OpenSignals({SIGCHLD, SIGTERM, SIGINT, SIGHUP})) {
-    shares_ = ShareTable::Current();
-    mounts_.Apply(*shares_);
+    mounts_.Apply(*ShareTable::Current());
   }
 
   int Run();
 
  private:
   void StartParts();
-  void Start(Part& part, const std::function<int(Descriptor lifeline)>& body);
-  int BecomeHost(Descriptor control, Descriptor lifeline);
+  void Start(Part& part, const std::function<int(UniqueFd lifeline)>& body);
+  int BecomeHost(UniqueFd control, UniqueFd lifeline);
   void Watch();
   void TakeSignals();
   void TakeLifeline(Part& part);
-  void LookAtShares();
   void End(Part& part);
   bool Reap(Part& part);
 
   const Config& config_;
   std::vector<std::string> host_command_;
-  Descriptor listener_;
-  Descriptor signals_;
+  UniqueFd listener_;
+  UniqueFd signals_;
   ShareMounts mounts_;
-  std::shared_ptr<const ShareTable> shares_;
   std::array<Part, 2> parts_{Part{"front", -1, {}}, Part{"host", -1, {}}};
-  bool ready_ = false;
   bool over_ = false;
   int status_ = 0;
 };
@@ -109,35 +102,33 @@ int Supervisor::Run() {
 void Supervisor::StartParts() {
   SocketPair control = MakeSocketPair();
   auto& [front, host] = parts_;
-  Start(front, [&](Descriptor lifeline) {
+  Start(front, [&](UniqueFd lifeline) {
     control.second.Close();
     return RunFront(config_, std::move(listener_), std::move(control.first), std::move(lifeline));
   });
   // Only the next child gets the new PID namespace; this process keeps its own.
-  const Descriptor own(open("/proc/self/ns/pid", O_RDONLY | O_CLOEXEC));
-  Demand(static_cast<bool>(own), "/proc/self/ns/pid");
-  Demand(unshare(CLONE_NEWPID) == 0, "unshare");
-  Start(host, [&](Descriptor lifeline) {
+  const UniqueFd own(open("/proc/self/ns/pid", O_RDONLY | O_CLOEXEC));
+  CheckErrno(own.Get() >= 0, "/proc/self/ns/pid");
+  CheckErrno(unshare(CLONE_NEWPID) == 0, "unshare");
+  Start(host, [&](UniqueFd lifeline) {
     control.first.Close();
     listener_.Close();
     return BecomeHost(std::move(control.second), std::move(lifeline));
   });
-  Demand(setns(own.Get(), CLONE_NEWPID) == 0, "setns");
+  CheckErrno(setns(own.Get(), CLONE_NEWPID) == 0, "setns");
   listener_.Close();
 }
 
-void Supervisor::Start(Part& part, const std::function<int(Descriptor)>& body) {
+void Supervisor::Start(Part& part, const std::function<int(UniqueFd)>& body) {
   SocketPair lifeline = MakeSocketPair();
   part.pid = fork();
-  Demand(part.pid >= 0, "fork");
+  CheckErrno(part.pid >= 0, "fork");
   if (part.pid > 0) {
     part.lifeline = std::move(lifeline.first);
     return;
   }
   prctl(PR_SET_PDEATHSIG, SIGKILL);
-  sigset_t none;
-  sigemptyset(&none);
-  sigprocmask(SIG_SETMASK, &none, nullptr);
+  UnblockSignals();
   signal(SIGPIPE, SIG_IGN);
   lifeline.first.Close();
   signals_.Close();
@@ -148,8 +139,8 @@ void Supervisor::Start(Part& part, const std::function<int(Descriptor)>& body) {
 
 /// Request children are forked off the host all the time: it is a program of its own, without what
 /// the front and this process have in memory.
-int Supervisor::BecomeHost(Descriptor control, Descriptor lifeline) {
-  for (const Descriptor* kept : {&control, &lifeline}) {
+int Supervisor::BecomeHost(UniqueFd control, UniqueFd lifeline) {
+  for (const UniqueFd* kept : {&control, &lifeline}) {
     fcntl(kept->Get(), F_SETFD, 0);
     host_command_.push_back(std::to_string(kept->Get()));
   }
@@ -166,7 +157,6 @@ void Supervisor::Watch() {
                                 pollfd{parts_[0].lifeline.Get(), POLLIN, 0},
                                 pollfd{parts_[1].lifeline.Get(), POLLIN, 0}};
   poll(sources.data(), sources.size(), kLookEvery);
-  errno = 0;
   if (sources[0].revents) TakeSignals();
   for (std::size_t i = 0; i < parts_.size(); ++i)
     if (sources[i + 1].revents) TakeLifeline(parts_[i]);
@@ -176,7 +166,8 @@ void Supervisor::Watch() {
     status_ = 1;
     over_ = true;
   }
-  LookAtShares();
+  // Also when nothing changed: a share that could not be mounted may be there by now.
+  mounts_.Apply(*ShareTable::Current());
 }
 
 void Supervisor::TakeSignals() {
@@ -188,31 +179,23 @@ void Supervisor::TakeSignals() {
 }
 
 void Supervisor::TakeLifeline(Part& part) {
-  char byte;
-  if (read(part.lifeline.Get(), &byte, 1) != 1) {
+  if (!HeardWord<PartWord>(part.lifeline.Get())) {
     // It has ended, or is about to: its signal follows.
     part.lifeline.Close();
     return;
   }
-  part.ready = true;
-  if (ready_ || !parts_[0].ready || !parts_[1].ready) return;
-  ready_ = true;
+  const bool known = std::exchange(part.ready, true);
+  if (known || !parts_[0].ready || !parts_[1].ready) return;
+  errno = 0;
   MARU_LOG("Ready at %s port %d", config_.listen_address.c_str(), config_.listen_port);
   NotifyReady();
-}
-
-void Supervisor::LookAtShares() {
-  auto newest = ShareTable::Current();
-  errno = 0;
-  // Also when nothing changed: a share that could not be mounted may be there by now.
-  mounts_.Apply(*newest);
-  shares_ = std::move(newest);
 }
 
 bool Supervisor::Reap(Part& part) {
   if (part.pid <= 0) return false;
   int status = 0;
   if (waitpid(part.pid, &status, WNOHANG) != part.pid) return false;
+  errno = 0;
   if (WIFSIGNALED(status)) MARU_LOG("The %s was ended by signal %d", part.name, WTERMSIG(status));
   part.pid = -1;
   return true;
@@ -226,6 +209,7 @@ void Supervisor::End(Part& part) {
     if (Reap(part)) return;
     poll(nullptr, 0, step);
   }
+  errno = 0;
   MARU_LOG("The %s does not end and is killed", part.name);
   kill(part.pid, SIGKILL);
   waitpid(part.pid, nullptr, 0);

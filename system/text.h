@@ -3,7 +3,7 @@
 #include <optional>
 #include <string_view>
 
-/// Words of settings files.
+/// Words of settings files and headers.
 namespace maru {
 
 /// Without white space at both ends.

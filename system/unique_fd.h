@@ -6,26 +6,28 @@
 
 namespace maru {
 
-/// A file descriptor that its scope closes.
+/// Owns a file descriptor, or none (-1).
 class UniqueFd {
  public:
-  explicit UniqueFd(int descriptor = -1) : descriptor_(descriptor) {}
-  UniqueFd(UniqueFd&& other) noexcept : descriptor_(std::exchange(other.descriptor_, -1)) {}
+  UniqueFd() = default;
+  explicit UniqueFd(int descriptor) : descriptor_(descriptor) {}
+  UniqueFd(UniqueFd&& other) noexcept : descriptor_(other.Release()) {}
   UniqueFd& operator=(UniqueFd&& other) noexcept {
-    std::swap(descriptor_, other.descriptor_);
+    const UniqueFd old(std::exchange(descriptor_, other.Release()));
     return *this;
   }
-  ~UniqueFd() {
-    if (descriptor_ >= 0) close(descriptor_);
-  }
+  ~UniqueFd() { Close(); }
 
   int Get() const { return descriptor_; }
   /// Hands the descriptor over to the caller.
   int Release() { return std::exchange(descriptor_, -1); }
+  void Close() {
+    if (descriptor_ >= 0) close(Release());
+  }
   explicit operator bool() const { return descriptor_ >= 0; }
 
  private:
-  int descriptor_;
+  int descriptor_ = -1;
 };
 
 }  // namespace maru

@@ -4,7 +4,7 @@
 #include <cerrno>
 #include <system_error>
 
-#include "index/fields.h"
+#include "index/store/fields.h"
 #include "indexer/extract/charset.h"
 #include "indexer/extract/extractor.h"
 

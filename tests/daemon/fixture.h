@@ -14,8 +14,8 @@
 #include <string>
 #include <vector>
 
-#include "daemon/core.h"
-#include "index/writer.h"
+#include "daemon/core/core.h"
+#include "index/store/writer.h"
 #include "system/json.h"
 
 namespace maru::daemon::test {
@@ -141,7 +141,7 @@ class DaemonTest : public testing::Test {
   Identity bin_, games_;
   std::int64_t now_ = 1'800'000'000;
   std::map<uid_t, Strings> history_;
-  Cancelled cancelled_ = [] { return false; };
+  CancelCheck cancelled_ = [] { return false; };
   std::string settings_ = "[global]\n";
   std::shared_ptr<const ShareTable> table_;
   LibraryIndices indices_;

@@ -1,12 +1,13 @@
-#include "daemon/keyword.h"
+#include "daemon/language/keyword.h"
 
 #include <gtest/gtest.h>
 
-#include "daemon/arguments.h"
-#include "daemon/criteria.h"
-#include "daemon/question.h"
-#include "daemon/range.h"
-#include "index/fields.h"
+#include "daemon/core/arguments.h"
+#include "daemon/language/clauses.h"
+#include "daemon/language/criteria.h"
+#include "daemon/language/query_tree.h"
+#include "daemon/language/range.h"
+#include "index/store/fields.h"
 #include "system/json.h"
 
 namespace maru::daemon {
@@ -14,7 +15,7 @@ namespace {
 
 /// The query as text, without the field behind each word.
 std::string Read(const std::string& keyword, bool any_word = false) {
-  const auto query = ParseKeyword(keyword, {{{"F", 1}}, any_word});
+  const auto query = ParseKeyword(keyword, {{"F", 1}}, any_word);
   if (!query) return "blank";
   std::string text = Explain(*query);
   for (std::size_t at; (at = text.find("@F:1")) != std::string::npos;) text.erase(at, 4);
@@ -143,13 +144,13 @@ TEST(Ranges, OfSizesAndTimes) {
   }
 }
 
-TEST(Question, WeightsFieldsAndRefusesWhatIsUnknown) {
+TEST(Clauses, WeightsFieldsAndRefusesWhatIsUnknown) {
   const auto read = [](const std::string& text) {
     Json::Value value;
     EXPECT_TRUE(json::FromString(text, value)) << text;
     const Arguments arguments(value, "data",
                               {"keyword", "criteria_list", "file_type", "search_weight_list"});
-    return Explain(ToQuery(ReadQuestion(arguments), false));
+    return Explain(ToQuery(ReadClauses(arguments), false));
   };
   EXPECT_EQ(read(R"({"keyword": "a", "search_weight_list": [{"field": "MARUMDFSName", "weight": 9},
                      {"field": "MARUMDTextContent", "weight": 0},

@@ -1,4 +1,4 @@
-#include "daemon/server.h"
+#include "daemon/socket/server.h"
 
 #include <poll.h>
 #include <sys/socket.h>
@@ -8,7 +8,7 @@
 #include <condition_variable>
 #include <thread>
 
-#include "daemon/listener.h"
+#include "daemon/socket/listener.h"
 #include "system/unique_fd.h"
 #include "tests/daemon/fixture.h"
 
@@ -74,8 +74,9 @@ class Client {
   std::string received_;
 };
 
-/// A reader whose searches go on until they are cancelled or released.
-class SlowReader : public index::Reader {
+/// Indices that take a search until it is cancelled, or they are released, to open; there is
+/// nothing in them.
+class SlowIndices : public Indices {
  public:
   struct Gate {
     std::mutex mutex;
@@ -90,50 +91,31 @@ class SlowReader : public index::Reader {
     }
   };
 
-  explicit SlowReader(Gate& gate) : gate_(gate) {}
-  void SetEyes(const Identity&) override {}
-  index::SearchResult Search(const index::Query&, const index::SearchOptions& options) override {
-    std::unique_lock lock(gate_.mutex);
-    ++gate_.running;
-    gate_.changed.notify_all();
-    while (!gate_.released) {
-      gate_.changed.wait_for(lock, std::chrono::milliseconds(5));
-      if (!options.cancelled()) continue;
-      ++gate_.cancelled;
-      gate_.changed.notify_all();
-      throw index::Cancelled();
-    }
-    return {};
-  }
-  std::vector<std::uint64_t> Count(const index::Query&, const std::vector<index::Query>&,
-                                   const std::function<bool()>&) override {
-    return {};
-  }
-  std::vector<index::Fragment> Fragments(std::size_t, index::DocumentId, const index::Query&,
-                                         const index::FragmentOptions&) override {
-    return {};
-  }
-  std::optional<index::Hit> Find(std::size_t, index::DocumentId) override { return {}; }
-  std::optional<index::Hit> Find(std::size_t, std::string_view) override { return {}; }
-  std::vector<std::string> Complete(const std::string&, const std::string&, std::size_t) override {
-    return {};
-  }
-  std::vector<std::string> Correct(const std::string&, std::size_t) override { return {}; }
-  std::uint64_t Documents() const override { return 0; }
-
- private:
-  Gate& gate_;
-};
-
-class SlowIndices : public Indices {
- public:
-  std::unique_ptr<index::Reader> Open(const std::vector<std::string>&) override {
-    return std::make_unique<SlowReader>(gate);
+  std::unique_ptr<index::View> Open(const std::vector<std::string>&, const Identity& who,
+                                    index::IsCancelled cancelled) override {
+    if (cancelled) WaitForRelease(cancelled);
+    return nothing_.Open({}, who);
   }
   bool Has(const std::string&) const override { return true; }
   std::vector<std::string> Ids() const override { return {"fileindex_photo"}; }
 
-  SlowReader::Gate gate;
+  Gate gate;
+
+ private:
+  void WaitForRelease(const index::IsCancelled& cancelled) {
+    std::unique_lock lock(gate.mutex);
+    ++gate.running;
+    gate.changed.notify_all();
+    while (!gate.released) {
+      gate.changed.wait_for(lock, std::chrono::milliseconds(5));
+      if (!cancelled()) continue;
+      ++gate.cancelled;
+      gate.changed.notify_all();
+      throw index::Cancelled();
+    }
+  }
+
+  index::Library nothing_{"/nonexistent"};
 };
 
 class ServerTest : public DaemonTest {

@@ -1,4 +1,4 @@
-#include "daemon/usage.h"
+#include "daemon/core/usage.h"
 
 #include <signal.h>
 #include <sys/stat.h>

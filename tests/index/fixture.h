@@ -7,11 +7,13 @@
 #include <memory>
 #include <string>
 
-#include "index/fields.h"
-#include "index/reader.h"
-#include "index/writer.h"
+#include "index/search/library.h"
+#include "index/store/fields.h"
+#include "index/store/writer.h"
 
 namespace maru::index::test {
+
+inline const Identity kRoot{0, {}, true};
 
 /// A folder of its own for each case, with one index "fileindex_photo" in it.
 class IndexTest : public testing::Test {
@@ -56,10 +58,14 @@ class IndexTest : public testing::Test {
     return writer_->Add(Prepared(Doc(name, text, rights)));
   }
 
-  std::unique_ptr<Reader> Read(const Identity& who = {0, {}, true}) {
-    auto reader = library_.Open({"fileindex_photo"});
-    reader->SetEyes(who);
-    return reader;
+  std::unique_ptr<View> Read(const Identity& who = kRoot) {
+    return library_.Open({"fileindex_photo"}, who);
+  }
+
+  static std::vector<Fragment> Fragments(View& view, DocumentId document, const Query& query,
+                                         const FragmentOptions& options) {
+    const auto hit = view.Find(0, document);
+    return hit ? Highlighter(view, query).FragmentsOf(*hit, options) : std::vector<Fragment>();
   }
 
   static Query Word(const std::string& word, const std::string& field = std::string(kText)) {

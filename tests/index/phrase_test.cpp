@@ -1,8 +1,8 @@
 #include <algorithm>
 #include <random>
 
-#include "index/matcher.h"
-#include "index/tokenizer.h"
+#include "index/text/tokenizer.h"
+#include "index/text/word_finder.h"
 #include "tests/index/fixture.h"
 
 namespace maru::index::test {
@@ -77,7 +77,7 @@ bool Holds(const std::vector<std::string>& text, const std::vector<std::string>&
   return std::search(text.begin(), text.end(), phrase.begin(), phrase.end()) != text.end();
 }
 
-TEST(MatcherTest, FindsWhatTheTokenizerFinds) {
+TEST(WordFinderTest, FindsWhatTheTokenizerFinds) {
   Babble babble(1);
   for (int round = 0; round < 300; ++round) {
     std::string text = babble.Text();
@@ -106,7 +106,7 @@ TEST(MatcherTest, FindsWhatTheTokenizerFinds) {
       }
     }
     std::vector<std::pair<std::size_t, std::size_t>> found;
-    for (const Match& match : Matcher(groups).MatchesIn(text)) {
+    for (const Match& match : WordFinder(groups).MatchesIn(text)) {
       found.emplace_back(match.begin, match.end);
     }
     std::sort(expected.begin(), expected.end());
@@ -135,7 +135,7 @@ TEST_F(IndexTest, PhrasesAreFoundWhereverTheyStandInATextAndNowhereElse) {
     some += expected > 0 && expected < texts.size();
     for (const Hit& hit : result.hits) {
       const auto fragments =
-          reader->Fragments(0, hit.document, Phrase(phrase), {std::string(kText), 60, 2});
+          Fragments(*reader, hit.document, Phrase(phrase), {std::string(kText), 60, 2});
       ASSERT_FALSE(fragments.empty()) << hit.path << testing::PrintToString(phrase);
       ASSERT_NE(fragments[0].html.find("<mark>"), std::string::npos);
     }
@@ -148,7 +148,7 @@ TEST_F(IndexTest, NothingBetweenTwoWordsMayBeLongerThanAChunk) {
   writer_->Commit();
   EXPECT_EQ(Read()->Search(Phrase({"front", "middle"}), Page()).total, 1u);
   const auto fragments =
-      Read()->Fragments(0, id, Phrase({"middle", "rear"}), {std::string(kText), 60, 1});
+      Fragments(*Read(), id, Phrase({"middle", "rear"}), {std::string(kText), 60, 1});
   ASSERT_EQ(fragments.size(), 1u);
   EXPECT_EQ(fragments[0].html, "<mark>middle, rear</mark>");
 }
@@ -156,9 +156,8 @@ TEST_F(IndexTest, NothingBetweenTwoWordsMayBeLongerThanAChunk) {
 TEST_F(IndexTest, APhraseOfManyTextsEndsWhenNobodyWaits) {
   for (int i = 0; i < 200; ++i) Add(std::to_string(i), "one two");
   writer_->Commit();
-  SearchOptions options = Page();
-  options.cancelled = [] { return true; };
-  EXPECT_THROW(Read()->Search(Phrase({"one", "two"}), options), Cancelled);
+  const auto view = library_.Open({"fileindex_photo"}, kRoot, [] { return true; });
+  EXPECT_THROW(view->Search(Phrase({"one", "two"}), Page()), Cancelled);
 }
 
 }  // namespace

@@ -1,4 +1,4 @@
-#include "index/tokenizer.h"
+#include "index/text/tokenizer.h"
 
 #include <gtest/gtest.h>
 

@@ -3,7 +3,7 @@
 #include <sys/un.h>
 
 #include "fixture.h"
-#include "index/fields.h"
+#include "index/store/fields.h"
 
 namespace maru::indexer::test {
 namespace {

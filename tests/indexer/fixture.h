@@ -19,7 +19,7 @@
 #include <vector>
 
 #include "common/error.h"
-#include "index/reader.h"
+#include "index/search/library.h"
 #include "indexer/crawler.h"
 #include "indexer/extract/processes.h"
 
@@ -124,13 +124,11 @@ class ShareTest : public testing::Test {
     EXPECT_EQ(0u, outcome.bytes);
   }
 
-  std::unique_ptr<index::Reader> Read(const Identity& who = {0, {}, true}) {
-    std::unique_ptr<index::Reader> reader = library_.Open({"fileindex_share"});
-    reader->SetEyes(who);
-    return reader;
+  std::unique_ptr<index::View> Read(const Identity& who = {0, {}, true}) {
+    return library_.Open({"fileindex_share"}, who);
   }
 
-  static std::vector<index::Hit> All(index::Reader& reader, const index::Query& query) {
+  static std::vector<index::Hit> All(index::View& reader, const index::Query& query) {
     index::SearchOptions options;
     options.size = 1'000'000;
     return reader.Search(query, options).hits;

@@ -276,12 +276,13 @@ class HttpTest(WebTest):
         head = self.call_text({}, b"Transfer-Encoding: chunked\r\n")
         head = head[:head.index(b"Content-Length")] + b"\r\n"
         self.assertEqual(json.loads(responses(self.raw(head + body), 1)[0][1])["data"]["text"], "a")
-        text = self.call_text({"text": "b"}, b"Expect: 100-continue\r\n")
-        head, body = text.split(b"\r\n\r\n", 1)
-        connection = self.raw(head + b"\r\n\r\n")
-        self.assertEqual(connection.recv(100), b"HTTP/1.1 100 Continue\r\n\r\n")
-        connection.sendall(body)
-        self.assertEqual(json.loads(responses(connection, 1)[0][1])["data"]["text"], "b")
+        for more in (b"", b"Connection: close\r\n"):
+            text = self.call_text({"text": "b"}, more + b"Expect: 100-continue\r\n")
+            head, body = text.split(b"\r\n\r\n", 1)
+            connection = self.raw(head + b"\r\n\r\n")
+            self.assertEqual(connection.recv(100), b"HTTP/1.1 100 Continue\r\n\r\n", more)
+            connection.sendall(body)
+            self.assertEqual(json.loads(responses(connection, 1)[0][1])["data"]["text"], "b")
 
     def test_what_is_no_request_is_refused_and_cut_off(self):
         huge = b"POST %secho HTTP/1.1\r\nHost: x\r\nContent-Length: 2000000\r\n\r\n" % CALL.encode()

@@ -1,0 +1,58 @@
+#pragma once
+
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "daemon/core/core.h"
+
+/// What a request may see: whose eyes, and which indices.
+namespace maru::daemon {
+
+constexpr std::size_t kMaxIndices = 1024;
+/// Bytes of an index id.
+constexpr std::size_t kMaxIndexId = 300;
+
+/// An identity with the name that share settings know it by.
+struct Eyes {
+  Identity identity;
+  std::string user_name;
+  /// Sees nothing at all.
+  bool blind = false;
+};
+
+/// The caller's eyes, narrowed by "permission" filters. For root and the service they become the
+/// named user's. Anybody else may name just himself: another name, an unknown one, or two different
+/// ones see nothing, so that no filter ever shows more than its absence. A user id without an
+/// account sees nothing either.
+Eyes EyesOf(const Identity& caller, const std::vector<std::string>& users);
+
+/// One admitted index, and whose it is.
+struct ShareIndex {
+  std::string id;
+  const ShareSettings* share;
+};
+
+struct Scope {
+  Eyes eyes;
+  std::vector<ShareIndex> indices;
+  /// Owns the shares.
+  std::shared_ptr<const ShareTable> table;
+
+  std::vector<std::string> Ids() const;
+};
+
+/// Of the index ids those that exist and whose share the eyes may use. A malformed one throws Error
+/// (120).
+Scope ScopeOf(const Core& core, Eyes eyes, const std::vector<std::string>& ids);
+
+/// Throws Error (120) for what can be no index id at all: empty, with a slash or a control
+/// character, "." or "..".
+void CheckIndexId(const std::string& id);
+
+/// The scope's indices, in their order, through its eyes.
+std::unique_ptr<index::View> OpenView(const Core& core, const Scope& scope,
+                                      const CancelCheck& cancelled);
+
+}  // namespace maru::daemon

@@ -1,0 +1,87 @@
+#pragma once
+
+#include <xapian.h>
+
+#include <functional>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "index/search/eyes.h"
+#include "index/search/matcher.h"
+#include "index/search/plan.h"
+#include "index/search/reader.h"
+#include "index/search/share.h"
+#include "index/search/view.h"
+#include "index/store/engine.h"
+
+namespace maru::index {
+
+/// Inside of a View: a reader and eyes for each share, complete from the beginning.
+class View::State {
+ public:
+  State(std::vector<std::string> ids, std::vector<std::shared_ptr<Share>> shares, Identity who,
+        IsCancelled cancelled);
+  ~State();
+  State(const State&) = delete;
+  State& operator=(const State&) = delete;
+
+  std::size_t Shares() const { return shares_.size(); }
+  const std::vector<std::string>& Ids() const { return ids_; }
+  const std::vector<Reader*>& Readers() const { return reader_pointers_; }
+  Reader& At(std::size_t share) { return readers_[share]; }
+  bool Sees(std::size_t share, const Place& place) const {
+    return !eyes_[share] || eyes_[share]->Sees(place);
+  }
+  /// Throws Cancelled when nobody waits any more.
+  void PollCancelled() const;
+
+  /// Calls `use(share, block)` for each block of matches, only those that these eyes see in it,
+  /// until it returns false.
+  template <class Use>
+  void ForEachSeen(const Plan& plan, const Scorer* scorer, Use&& use) {
+    const auto block = std::make_unique<MatchBlock>();
+    const std::function<void()> poll = [this] { PollCancelled(); };
+    for (std::size_t share = 0; share < shares_.size(); ++share) {
+      Matcher matcher(readers_[share], share, plan, scorer, poll);
+      while (matcher.Next(*block)) {
+        if (eyes_[share]) eyes_[share]->Screen(readers_[share], block->first, block->matches);
+        if (!use(share, *block)) return;
+      }
+    }
+  }
+
+  /// Runs `work` on one state of the indices, and again on a newer one when the writer overtook it.
+  template <class Work>
+  auto OnOneState(const char* doing, Work&& work) -> decltype(work()) {
+    return WithEngine(doing, [&] {
+      for (int left = kTries; left > 1; --left) {
+        try {
+          return work();
+        } catch (const Xapian::DatabaseModifiedError&) {
+          Renew();
+        }
+      }
+      return work();
+    });
+  }
+
+ private:
+  static constexpr int kTries = 5;
+
+  void Open();
+  void GiveBack();
+  void Renew();
+
+  const std::vector<std::string> ids_;
+  const std::vector<std::shared_ptr<Share>> shares_;
+  const Identity who_;
+  const IsCancelled cancelled_;
+  std::vector<Share::Handle> handles_;
+  std::vector<Reader> readers_;
+  std::vector<Reader*> reader_pointers_;
+  /// A null: sees everything.
+  std::vector<std::shared_ptr<const Eyes>> eyes_;
+};
+
+}  // namespace maru::index
