@@ -12,6 +12,7 @@
 #include "system/config.h"
 #include "system/json.h"
 #include "system/unique_fd.h"
+#include "system/whole_file.h"
 
 namespace maru::history {
 namespace {
@@ -19,6 +20,8 @@ namespace {
 // A hundred or two searches: taken over in a few milliseconds.
 constexpr off_t kLongEnough = off_t{16} << 10;
 constexpr off_t kMost = off_t{4} << 20;
+/// With the longest line behind it.
+constexpr std::size_t kMostRead = 64u << 20;
 constexpr int kHow = O_RDWR | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC;
 
 /// Waits until nobody else has the file locked. False with errno.
@@ -61,30 +64,6 @@ std::vector<Journal::Entry> EntriesOf(std::string_view text) {
   return entries;
 }
 
-bool ReadAll(const UniqueFd& file, off_t size, std::string& text) {
-  text.resize(static_cast<std::size_t>(size));
-  std::size_t got = 0;
-  while (got < text.size()) {
-    const ssize_t count =
-        pread(file.Get(), text.data() + got, text.size() - got, static_cast<off_t>(got));
-    if (count < 0 && errno == EINTR) continue;
-    if (count < 0) return false;
-    if (count == 0) break;
-    got += static_cast<std::size_t>(count);
-  }
-  text.resize(got);
-  return true;
-}
-
-/// What stands in a file; nothing when it cannot be read, with errno.
-std::string TextOf(const std::string& path) {
-  const UniqueFd file(open(path.c_str(), kHow));
-  struct stat status;
-  std::string text;
-  if (!file || fstat(file.Get(), &status) != 0 || !ReadAll(file, status.st_size, text)) return {};
-  return text;
-}
-
 }  // namespace
 
 Journal Journal::OfService() {
@@ -119,8 +98,10 @@ bool Journal::Add(const Entry& entry, bool& long_enough) const {
 
 std::vector<Journal::Entry> Journal::Entries() const {
   // What is set aside in between is seen twice, not never.
-  const std::string newer = TextOf(path_);
-  return EntriesOf(TextOf(aside_) + newer);
+  std::string newer, older;
+  ReadWholeFile(path_, kMostRead, newer);
+  ReadWholeFile(aside_, kMostRead, older);
+  return EntriesOf(older + newer);
 }
 
 bool Journal::HandOver(const std::function<bool(const std::vector<Entry>&)>& take) const {
@@ -162,7 +143,7 @@ bool Journal::TakeAside(const std::function<bool(const std::vector<Entry>&)>& ta
   // Whoever adds a line to it at this moment has it locked.
   if (!Lock(file, status)) return false;
   if (status.st_nlink == 0) return true;
-  if (!ReadAll(file, status.st_size, text)) return false;
+  if (!ReadToEnd(file, kMostRead, text)) return false;
   const std::vector<Entry> entries = EntriesOf(text);
   if (!entries.empty() && !take(entries)) {
     errno = 0;

@@ -1,10 +1,7 @@
 #include "platform/account.h"
 
 #include <errno.h>
-#include <stdlib.h>
-#include <string.h>
 
-#include <new>
 #include <string_view>
 
 #include "platform/guard.h"
@@ -22,15 +19,21 @@ int LookupError() {
   return errno == 0 ? kErrNotFound : kErrSystem;
 }
 
-/// The record and its name in one piece of memory.
+/// A record with what it points to.
+struct Record : MARUUSER {
+  explicit Record(const Account& account)
+      : MARUUSER{nullptr, account.uid, account.gid, 0}, name(account.name) {
+    szName = name.c_str();
+  }
+  Record(const Record&) = delete;
+  Record& operator=(const Record&) = delete;
+
+  std::string name;
+};
+
 int ToRecord(const std::optional<Account>& account, MARUUSER** user) {
   if (!account) return Fail(LookupError(), -1);
-  const std::size_t size = account->name.size() + 1;
-  void* memory = malloc(sizeof(MARUUSER) + size);
-  if (!memory) return Fail(kErrSystem, -1);
-  char* name = static_cast<char*>(memory) + sizeof(MARUUSER);
-  memcpy(name, account->name.c_str(), size);
-  *user = new (memory) MARUUSER{name, account->uid, account->gid, 0};
+  *user = new Record(*account);
   return 0;
 }
 
@@ -57,7 +60,7 @@ int MARUUserGetByUID(uid_t uid, MARUUSER** user) {
 }
 
 void MARUUserFree(MARUUSER* user) {
-  free(user);
+  delete static_cast<Record*>(user);
 }
 
 bool MARUServiceUserHomeIsEnabled(int, const char*) {

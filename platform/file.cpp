@@ -21,25 +21,22 @@ namespace {
 
 constexpr std::size_t kChunk = 1u << 20;
 
-bool CopyByHand(int from, int to) {
-  std::vector<char> buffer(kChunk);
+bool CopyByHand(const maru::UniqueFd& from, const maru::UniqueFd& to) {
+  std::string buffer(kChunk, '\0');
   for (;;) {
-    const ssize_t count = read(from, buffer.data(), buffer.size());
+    const ssize_t count = read(from.Get(), buffer.data(), buffer.size());
     if (count < 0 && errno == EINTR) continue;
     if (count <= 0) return count == 0;
-    for (ssize_t done = 0; done < count;) {
-      const ssize_t written =
-          write(to, buffer.data() + done, static_cast<std::size_t>(count - done));
-      if (written < 0 && errno != EINTR) return false;
-      if (written > 0) done += written;
+    if (!maru::WriteAll(to, std::string_view(buffer).substr(0, static_cast<std::size_t>(count)))) {
+      return false;
     }
   }
 }
 
 /// Both descriptors stand at their start, or where the kernel's own copy gave up.
-bool CopyContent(int from, int to) {
+bool CopyContent(const maru::UniqueFd& from, const maru::UniqueFd& to) {
   for (;;) {
-    const ssize_t count = copy_file_range(from, nullptr, to, nullptr, kChunk, 0);
+    const ssize_t count = copy_file_range(from.Get(), nullptr, to.Get(), nullptr, kChunk, 0);
     if (count > 0 || (count < 0 && errno == EINTR)) continue;
     // Some file systems cannot, and some files claim to be empty until they are read.
     return CopyByHand(from, to);
@@ -92,8 +89,8 @@ bool Copy(const char* source, const char* destination, bool overwrite) {
   std::string temporary;
   const maru::UniqueFd to = maru::NewFileBeside(destination, 0600, temporary);
   if (!to) return false;
-  if (CopyContent(from.Get(), to.Get()) && CopyStatus(from.Get(), to.Get()) &&
-      fsync(to.Get()) == 0 && Rename(temporary.c_str(), destination, overwrite)) {
+  if (CopyContent(from, to) && CopyStatus(from.Get(), to.Get()) && fsync(to.Get()) == 0 &&
+      Rename(temporary.c_str(), destination, overwrite)) {
     return true;
   }
   const int error = errno;

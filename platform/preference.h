@@ -2,7 +2,11 @@
 
 #include <sys/types.h>
 
+#include <stdexcept>
 #include <string>
+#include <type_traits>
+
+#include "system/preferences.h"
 
 namespace maruseeker::pref {
 
@@ -15,15 +19,15 @@ class Preference {
 
   /// T is bool or int. Throws std::invalid_argument for a key that there is not with that type.
   template <class T>
-  T Get(const std::string& key) const;
+  T Get(const std::string& key) const {
+    if (maru::FindPreference(key).is_flag != std::is_same_v<T, bool>) {
+      throw std::invalid_argument("no such preference: " + key);
+    }
+    return static_cast<T>(maru::Preferences(uid_).Get(key));
+  }
 
  private:
   uid_t uid_;
 };
-
-template <>
-bool Preference::Get<bool>(const std::string& key) const;
-template <>
-int Preference::Get<int>(const std::string& key) const;
 
 }  // namespace maruseeker::pref

@@ -2,12 +2,9 @@
 
 #include <errno.h>
 #include <fcntl.h>
-#include <stdlib.h>
-#include <string.h>
 #include <sys/stat.h>
 #include <sys/statvfs.h>
 
-#include <new>
 #include <string>
 
 #include "platform/account.h"
@@ -36,15 +33,19 @@ int AskSettings(const char* operation, const MARUSHARE* share, int* value, Ask a
   });
 }
 
-char* Duplicate(const std::string& text) {
-  char* copy = strdup(text.c_str());
-  if (!copy) throw std::bad_alloc();
-  return copy;
-}
+/// A record with what it points to.
+struct Record : MARUSHARE {
+  explicit Record(const ShareSettings& settings)
+      : name(settings.name), path(settings.VolumePath()) {
+    szName = name.data();
+    szPath = path.data();
+    fFTPPriv = settings.deny;
+  }
+  Record(const Record&) = delete;
+  Record& operator=(const Record&) = delete;
 
-MARUSHARE* NewRecord(const ShareSettings& settings) {
-  return new MARUSHARE{Duplicate(settings.name), Duplicate(settings.VolumePath()), settings.deny};
-}
+  std::string name, path;
+};
 
 }  // namespace
 
@@ -55,16 +56,13 @@ int MARUShareGet(const char* name, MARUSHARE** share) {
     const auto table = ShareTable::Current();
     const ShareSettings* settings = table->Find(name);
     if (!settings) return Fail(kErrNotFound, -1);
-    *share = NewRecord(*settings);
+    *share = new Record(*settings);
     return 0;
   });
 }
 
 void MARUShareFree(MARUSHARE* share) {
-  if (!share) return;
-  free(share->szName);
-  free(share->szPath);
-  delete share;
+  delete static_cast<Record*>(share);
 }
 
 int MARUShareUserPrivGet(const char* user_name, const MARUSHARE* share) {
@@ -133,10 +131,8 @@ int MLIBShareEnum(MLIBCSzList** list, MLIBShareFilter filter) {
     int count = 0;
     const auto table = ShareTable::Current();
     for (const ShareSettings& settings : table->Shares()) {
-      MARUSHARE* share = NewRecord(settings);
-      const bool selected = filter(share) == 0;
-      MARUShareFree(share);
-      if (!selected) continue;
+      const Record share(settings);
+      if (filter(&share) != 0) continue;
       if (MLIBCSzListPush(list, settings.name.c_str()) < 0) return Fail(kErrSystem, -1);
       ++count;
     }

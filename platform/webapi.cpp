@@ -4,44 +4,16 @@ namespace MARU {
 namespace {
 
 template <class T>
-bool Read(const Json::Value& value, T& result);
-
-template <>
-bool Read(const Json::Value& value, std::string& result) {
-  if (!value.isString()) return false;
-  result = value.asString();
+bool Read(const Json::Value& value, T& result) {
+  if (!value.is<T>()) return false;
+  result = value.as<T>();
   return true;
 }
 
-template <>
-bool Read(const Json::Value& value, int& result) {
-  if (!value.isInt()) return false;
-  result = value.asInt();
-  return true;
-}
-
-template <>
-bool Read(const Json::Value& value, double& result) {
-  if (!value.isNumeric()) return false;
-  result = value.asDouble();
-  return true;
-}
-
-template <>
-bool Read(const Json::Value& value, bool& result) {
-  if (!value.isBool()) return false;
-  result = value.asBool();
-  return true;
-}
-
-bool ReadObject(const Json::Value& value, Json::Value& result) {
-  if (!value.isObject()) return false;
-  result = value;
-  return true;
-}
-
-bool ReadArray(const Json::Value& value, Json::Value& result) {
-  if (!value.isArray()) return false;
+/// An object or an array.
+template <Json::ValueType type>
+bool ReadWhole(const Json::Value& value, Json::Value& result) {
+  if (value.type() != type) return false;
   result = value;
   return true;
 }
@@ -91,13 +63,15 @@ APIParameter<int> APIRequest::GetAndCheckInt(const std::string& name, PARAM_NECE
 APIParameter<Json::Value> APIRequest::GetAndCheckObject(
     const std::string& name, PARAM_NECESSITY necessity,
     const Validator<Json::Value>& validator) const {
-  return ReadMember<Json::Value>(params_, name, necessity == REQUIRED, validator, ReadObject);
+  return ReadMember<Json::Value>(params_, name, necessity == REQUIRED, validator,
+                                 ReadWhole<Json::objectValue>);
 }
 
 APIParameter<Json::Value> APIRequest::GetAndCheckArray(
     const std::string& name, PARAM_NECESSITY necessity,
     const Validator<Json::Value>& validator) const {
-  return ReadMember<Json::Value>(params_, name, necessity == REQUIRED, validator, ReadArray);
+  return ReadMember<Json::Value>(params_, name, necessity == REQUIRED, validator,
+                                 ReadWhole<Json::arrayValue>);
 }
 
 APIParameter<Json::Value> APIRequest::GetAndCheckUnitArray(

@@ -7,6 +7,7 @@
 #include <algorithm>
 #include <chrono>
 #include <map>
+#include <type_traits>
 #include <utility>
 
 #include "system/config.h"
@@ -18,20 +19,26 @@ namespace {
 constexpr std::size_t kMaxBuffer = 16u << 20;
 constexpr int kMaxGroups = 65'536;  // the kernel's own limit
 
-/// Calls `look(buffer)` with a growing buffer until it no longer answers ERANGE. True when it
-/// answered 0; errno is what it answered.
-template <class Look>
-bool WithBuffer(std::vector<char>& buffer, Look look) {
+/// Asks a function of the C library with a growing buffer until it no longer answers ERANGE, and
+/// gives the entry to `take`. errno is what it answered.
+template <class Key, class Entry, class Take>
+auto LookUp(int (*function)(Key, Entry*, char*, std::size_t, Entry**),
+            std::type_identity_t<Key> key, Take take)
+    -> std::optional<decltype(take(std::declval<Entry>()))> {
+  std::vector<char> buffer;
+  Entry entry;
+  Entry* found = nullptr;
   int error = ERANGE;
   for (std::size_t size = 1024; error == ERANGE && size <= kMaxBuffer; size *= 4) {
     buffer.resize(size);
     do {
-      error = look();
+      error = function(key, &entry, buffer.data(), size, &found);
     } while (error == EINTR);
   }
   // Some sources of the name service say so when there is no such entry.
   errno = error == ENOENT || error == ESRCH ? 0 : error;
-  return error == 0;
+  if (error != 0 || !found) return std::nullopt;
+  return take(*found);
 }
 
 /// Answers of the last moment, for each thread its own. A request asks for the same account a dozen
@@ -58,39 +65,8 @@ class Recent {
   std::map<Key, std::pair<std::chrono::steady_clock::time_point, Value>> answers_;
 };
 
-std::optional<Account> ToAccount(const passwd* entry) {
-  if (!entry) return std::nullopt;
-  return Account{entry->pw_name, entry->pw_uid, entry->pw_gid, entry->pw_dir ? entry->pw_dir : ""};
-}
-
-std::optional<Account> LookUpName(const std::string& name) {
-  std::vector<char> buffer;
-  passwd entry;
-  passwd* found = nullptr;
-  const bool answered = WithBuffer(buffer, [&] {
-    return getpwnam_r(name.c_str(), &entry, buffer.data(), buffer.size(), &found);
-  });
-  return answered ? ToAccount(found) : std::nullopt;
-}
-
-std::optional<Account> LookUpUID(uid_t uid) {
-  std::vector<char> buffer;
-  passwd entry;
-  passwd* found = nullptr;
-  const bool answered = WithBuffer(
-      buffer, [&] { return getpwuid_r(uid, &entry, buffer.data(), buffer.size(), &found); });
-  return answered ? ToAccount(found) : std::nullopt;
-}
-
-std::optional<gid_t> LookUpGroup(const std::string& name) {
-  std::vector<char> buffer;
-  group entry;
-  group* found = nullptr;
-  const bool answered = WithBuffer(buffer, [&] {
-    return getgrnam_r(name.c_str(), &entry, buffer.data(), buffer.size(), &found);
-  });
-  if (!answered || !found) return std::nullopt;
-  return found->gr_gid;
+Account ToAccount(const passwd& entry) {
+  return {entry.pw_name, entry.pw_uid, entry.pw_gid, entry.pw_dir ? entry.pw_dir : ""};
 }
 
 std::optional<std::vector<gid_t>> LookUpGroupsOf(const Account& account) {
@@ -128,15 +104,17 @@ std::optional<Account> AccountByName(const std::string& name) {
     errno = 0;
     return std::nullopt;
   }
-  return recent.by_name.Get(name, [&] { return LookUpName(name); });
+  return recent.by_name.Get(name, [&] { return LookUp(getpwnam_r, name.c_str(), ToAccount); });
 }
 
 std::optional<Account> AccountByUID(uid_t uid) {
-  return recent.by_uid.Get(uid, [&] { return LookUpUID(uid); });
+  return recent.by_uid.Get(uid, [&] { return LookUp(getpwuid_r, uid, ToAccount); });
 }
 
 std::optional<gid_t> GroupByName(const std::string& name) {
-  return recent.groups.Get(name, [&] { return LookUpGroup(name); });
+  return recent.groups.Get(name, [&] {
+    return LookUp(getgrnam_r, name.c_str(), [](const group& entry) { return entry.gr_gid; });
+  });
 }
 
 std::optional<std::vector<gid_t>> GroupsOf(const Account& account) {

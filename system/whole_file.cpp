@@ -7,25 +7,15 @@
 #include <sys/stat.h>
 
 namespace maru {
-namespace {
-
-bool WriteAll(int descriptor, std::string_view text) {
-  while (!text.empty()) {
-    const ssize_t written = write(descriptor, text.data(), text.size());
-    if (written < 0 && errno == EINTR) continue;
-    if (written < 0) return false;
-    text.remove_prefix(static_cast<std::size_t>(written));
-  }
-  return true;
-}
-
-}  // namespace
 
 bool ReadWholeFile(const std::string& path, std::size_t limit, std::string& text, Link link) {
   // Without O_NONBLOCK a planted FIFO would hold the process here.
   const int no_link = link == Link::kRefuse ? O_NOFOLLOW : 0;
   const UniqueFd file(open(path.c_str(), O_RDONLY | no_link | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
-  if (!file) return false;
+  return file && ReadToEnd(file, limit, text);
+}
+
+bool ReadToEnd(const UniqueFd& file, std::size_t limit, std::string& text) {
   struct stat status;
   if (fstat(file.Get(), &status) != 0) return false;
   if (!S_ISREG(status.st_mode)) {
@@ -52,6 +42,16 @@ bool ReadWholeFile(const std::string& path, std::size_t limit, std::string& text
   return true;
 }
 
+bool WriteAll(const UniqueFd& file, std::string_view text) {
+  while (!text.empty()) {
+    const ssize_t written = write(file.Get(), text.data(), text.size());
+    if (written < 0 && errno == EINTR) continue;
+    if (written < 0) return false;
+    text.remove_prefix(static_cast<std::size_t>(written));
+  }
+  return true;
+}
+
 UniqueFd NewFileBeside(const std::string& path, mode_t mode, std::string& temporary) {
   const std::size_t slash = path.rfind('/');
   const std::string folder = slash == std::string::npos ? "" : path.substr(0, slash + 1);
@@ -69,7 +69,7 @@ bool WriteWholeFile(const std::string& path, std::string_view text, mode_t mode,
   const UniqueFd file = NewFileBeside(path, mode, temporary);
   if (!file) return false;
   const bool written =
-      WriteAll(file.Get(), text) &&
+      WriteAll(file, text) &&
       (owner == static_cast<uid_t>(-1) || fchown(file.Get(), owner, static_cast<gid_t>(-1)) == 0) &&
       rename(temporary.c_str(), path.c_str()) == 0;
   if (written) return true;

@@ -18,6 +18,12 @@ enum class Link { kRefuse, kFollow };
 bool ReadWholeFile(const std::string& path, std::size_t limit, std::string& text,
                    Link link = Link::kRefuse);
 
+/// The same of an open file, from where it stands.
+bool ReadToEnd(const UniqueFd& file, std::size_t limit, std::string& text);
+
+/// False with errno; a part may then be written.
+bool WriteAll(const UniqueFd& file, std::string_view text);
+
 /// A new empty file of `mode` less the umask in the folder of `path`, under a short name of its
 /// own, to be renamed to it; `temporary` is its path. False with errno.
 UniqueFd NewFileBeside(const std::string& path, mode_t mode, std::string& temporary);

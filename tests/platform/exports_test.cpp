@@ -9,8 +9,7 @@ namespace {
 
 /// Whether it is a name, or what belongs to a class, that the plug-in has from the platform.
 bool IsOfTheFacade(std::string symbol) {
-  for (const std::string before :
-       {"bool ", "int ", "vtable for ", "typeinfo for ", "typeinfo name for "}) {
+  for (const std::string before : {"vtable for ", "typeinfo for ", "typeinfo name for "}) {
     if (symbol.starts_with(before)) symbol.erase(0, before.size());
   }
   constexpr std::array kFacade{"FILEIDX",       "MARU",         "MLIB",
