@@ -46,6 +46,7 @@ TEST(Keyword, MeansWhatTheSearchLanguageSays) {
            {"a -(b OR c)", "(a WITHOUT ((b OR c)))"},
            {"a OR -b", "(a OR (everything WITHOUT (b)))"},
            {"(a b) OR (c d)", "((a AND b) OR (c AND d))"},
+           {"a (-b c)", "(a AND (c WITHOUT (b)))"},
            {"well-known", "\"well known\""},
            // Malformed: taken literally.
            {"\"old harbour", "(old AND harbour)"},
@@ -54,6 +55,7 @@ TEST(Keyword, MeansWhatTheSearchLanguageSays) {
            {"OR", "or"},
            {"old OR", "(old AND or)"},
            {"OR old", "(or AND old)"},
+           {"(AND old)", "(and AND old)"},
            {"old - harbour", "(old AND harbour)"},
            {"--old", "old"},
            {"-(", "nothing"},
@@ -74,16 +76,30 @@ TEST(Keyword, AnyWordTurnsTheOperatorsRound) {
   EXPECT_EQ(Read("a b", true), "(a OR b)");
   EXPECT_EQ(Read("a b AND c", true), "(a OR (b AND c))");
   EXPECT_EQ(Read("a b -c", true), "((a OR b) WITHOUT (c))");
+  EXPECT_EQ(Read("a ?!", true), "a");
+}
+
+unsigned Depth(const index::Query& query) {
+  unsigned deepest = 0;
+  for (const index::Query& part : query.parts) deepest = std::max(deepest, Depth(part));
+  return deepest + 1;
 }
 
 TEST(Keyword, IsBounded) {
   std::string deep;
   for (int i = 0; i < 20; ++i) deep += "(a -(b OR ";
-  EXPECT_NE(Read(deep + std::string(40, ')')), "") << "depth is no error";
+  for (const bool any_word : {false, true}) {
+    EXPECT_LE(Depth(*ParseKeyword(deep, {{"F", 1}}, any_word)), index::Query::kMaxDepth);
+    EXPECT_LE(Depth(*ParseKeyword(deep + std::string(40, ')'), {{"F", 1}}, any_word)),
+              index::Query::kMaxDepth);
+  }
   std::string words;
   for (int i = 0; i < 64; ++i) words += "w ";
   EXPECT_NO_THROW(Read(words));
   EXPECT_THROW(Read(words + "w"), maruseeker::Error);
+  for (int i = 1; i < 8; ++i) words += words.substr(0, 128);
+  EXPECT_NO_THROW(Read('"' + words + '"'));
+  EXPECT_THROW(Read('"' + words + "w\""), maruseeker::Error);
   EXPECT_THROW(Read(std::string(5000, 'a')), maruseeker::Error);
 }
 
@@ -168,6 +184,8 @@ TEST(Clauses, WeightsFieldsAndRefusesWhatIsUnknown) {
            R"({"keyword": 5})",
            R"({"keywords": "a"})",
            R"({"search_weight_list": [{"field": "MARUMDFSName", "weight": -1}]})",
+           R"({"search_weight_list": [{"field": "MARUMDFSName", "weight": 1001}]})",
+           R"({"search_weight_list": [{"field": "MARUMDFSName", "weight": "9"}]})",
            R"({"search_weight_list": [{"field": "MARUMDFSName"}]})",
            R"({"search_weight_list": [{"field": "MARUMDFSSize", "weight": 1}]})",
            R"({"search_weight_list": [{"field": "Name", "weight": 1}]})",
