@@ -42,6 +42,10 @@ TEST_F(SearchTest, AnswersTotalThenHitsThenSuccess) {
             R"("MARUMDFSSize":16,"MARUMDIsDir":false,"MARUMDKind":"image",)"
             R"("MARUMDOwnerUserID":"2","MARUMDPath":"/volume1/photo/trip/Lisbon.JPG",)"
             R"("highlight":{"MARUMDFSName":["<mark>Lisbon</mark>.JPG"]},"id":"fileindex_photo"})");
+  const auto folder = Ask(
+      bin_, "search", Parsed(R"({"pre_query": {"keyword": "trip"}, "fields": ["MARUMDKind"]})"));
+  ASSERT_EQ(folder.size(), 3u);
+  EXPECT_EQ(folder[1]["MARUMDKind"], "folder");
 }
 
 TEST_F(SearchTest, NarrowsByTypeCriteriaAndPlace) {
@@ -109,6 +113,12 @@ TEST_F(SearchTest, PagesSortAndStayExact) {
   EXPECT_EQ(sizes.size(), 25u);
   EXPECT_TRUE(std::is_sorted(sizes.begin(), sizes.end()));
   EXPECT_EQ(std::set(sizes.begin(), sizes.end()).size(), 25u);
+  const auto largest = Ask(bin_, "search", Parsed(R"({"pre_query": {"keyword": "word"}, "size": 1,
+      "sort": {"field": "MARUMDFSSize"}, "fields": ["MARUMDFSSize"],
+      "highlight": {"frag_length": 1000000000000, "num_fragments": 1000000000000}})"));
+  ASSERT_EQ(largest.size(), 3u) << json::ToString(largest.back());
+  EXPECT_EQ(largest[1]["MARUMDFSSize"].asUInt64(), sizes.back());
+  EXPECT_EQ(largest[1]["highlight"]["MARUMDTextContent"].size(), 1u) << "one is a list, too";
 }
 
 TEST_F(SearchTest, ThePageIsCheckedAgainstTheFilesOnceMore) {
@@ -286,6 +296,7 @@ TEST_F(SearchTest, RefusesWhatIsMalformed) {
            R"({"size": "5"})",
            R"({"default_search_op": "XOR"})",
            R"({"load_field": ["Name"]})",
+           R"({"lazy_field": ["Name"]})",
            R"({"fields": [1]})",
            R"({"filters": [{"name": "owner", "data": "x"}]})",
            R"({"filters": [{"name": "permission"}]})",
