@@ -29,7 +29,6 @@ class Walk {
   }
 
   bool Readable(std::string_view path) {
-    if (!way_[0].folder) return false;
     const std::size_t slash = path.rfind('/');
     if (slash == std::string_view::npos) return Allows(way_[0].folder.Get(), "", kACLRead);
     if (!Enter(path.substr(0, slash))) return false;

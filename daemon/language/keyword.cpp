@@ -43,7 +43,7 @@ bool Excludes(std::string_view text, std::size_t at) {
 TokenKind KindOf(std::string_view word) {
   if (word == "OR" || word == "|") return TokenKind::kOr;
   if (word == "AND") return TokenKind::kAnd;
-  return word.size() > 1 && word.back() == '*' ? TokenKind::kPrefix : TokenKind::kWord;
+  return word.back() == '*' ? TokenKind::kPrefix : TokenKind::kWord;
 }
 
 std::vector<Token> Tokenize(std::string_view text) {

@@ -6,6 +6,7 @@
 #include <ctime>
 #include <limits>
 #include <string>
+#include <tuple>
 
 #include "system/text.h"
 
@@ -118,12 +119,12 @@ bool TakeDate(std::string_view& text, std::tm& time, int std::tm::*& step) {
   step = &std::tm::tm_year;
   if (!TakeMark(text, "-")) return true;
   const std::optional<int> month = TakeNumber(text, 1, 2);
-  if (!month || *month < 1 || *month > 12) return false;
+  if (!month) return false;
   time.tm_mon = *month - 1;
   step = &std::tm::tm_mon;
   if (!TakeMark(text, "-")) return true;
   const std::optional<int> day = TakeNumber(text, 1, 2);
-  if (!day || *day < 1) return false;
+  if (!day) return false;
   time.tm_mday = *day;
   step = &std::tm::tm_mday;
   return true;
@@ -144,14 +145,17 @@ bool TakeClock(std::string_view& text, std::tm& time, int std::tm::*& step) {
     time.tm_sec = *second;
     step = &std::tm::tm_sec;
   }
-  return time.tm_hour < 24 && time.tm_min < 60 && time.tm_sec < 60;
+  return true;
 }
 
-bool IsDay(const std::tm& time) {
-  std::tm same = time;
-  same.tm_isdst = 0;
-  timegm(&same);
-  return same.tm_mon == time.tm_mon && same.tm_mday == time.tm_mday;
+/// Whether the calendar and the clock know that moment: what they do not know they carry over.
+bool Exists(const std::tm& time) {
+  const auto parts = [](const std::tm& of) {
+    return std::tie(of.tm_mon, of.tm_mday, of.tm_hour, of.tm_min, of.tm_sec);
+  };
+  std::tm carried = time;
+  timegm(&carried);
+  return parts(carried) == parts(time);
 }
 
 std::optional<Range> ParseTime(std::string_view text) {
@@ -164,7 +168,7 @@ std::optional<Range> ParseTime(std::string_view text) {
       !(TakeClock(text, time, step) && TakeZone(text, zone))) {
     return std::nullopt;
   }
-  if (!text.empty() || !IsDay(time)) return std::nullopt;
+  if (!text.empty() || !Exists(time)) return std::nullopt;
   std::tm next = time;
   ++(next.*step);
   return Range{SecondsOf(time, zone), SecondsOf(next, zone) - 1};

@@ -29,7 +29,8 @@ TEST_F(DaemonTest, TheServiceCanExamineAllFilesAndOpenNone) {
   const std::string secret = root_ + "/photo/shut/secret.txt";
   const int result = InChild([&] {
     DropPrivileges("bin");
-    if (!HoldsReadSearch() || geteuid() != bin_.uid) return 1;
+    if (!HoldsReadSearch() || geteuid() != bin_.uid || open(secret.c_str(), O_RDONLY) >= 0)
+      return 1;
     // As in the daemon: in a thread, again and again.
     int fault = 0;
     std::thread([&] {

@@ -1,3 +1,4 @@
+#include "common/error.h"
 #include "tests/daemon/fixture.h"
 
 namespace maru::daemon::test {
@@ -104,6 +105,19 @@ TEST_F(CommandsTest, SuggestsFromWhatTheCallerMayRead) {
   const Json::Value list = Data(bin_, "list_term_sugg_db", Json::objectValue);
   EXPECT_EQ(list["suggesters"].size(), 4u);
   EXPECT_EQ(list["indices"], Parsed(R"(["fileindex_photo"])"));
+}
+
+TEST_F(CommandsTest, AFaultEndsInAnErrorThatTellsNothingMore) {
+  const auto fault = [&] {
+    const Json::Value data = Parsed(R"({"terms": "a", "suggester": ["history"]})");
+    return json::ToString(Ask(bin_, "term_suggest", data).back()["error"]);
+  };
+  core_.history = [](uid_t) -> Strings { throw std::runtime_error("in /secret/place"); };
+  EXPECT_EQ(fault(), R"({"code":117,"msg":"Internal error"})");
+  core_.history = [](uid_t) -> Strings {
+    throw maruseeker::Error(maruseeker::kErrorDaemonExchange, "It is gone");
+  };
+  EXPECT_EQ(fault(), R"({"code":121,"msg":"It is gone"})");
 }
 
 TEST_F(CommandsTest, IndicateCountsEachTypeOnItsOwn) {

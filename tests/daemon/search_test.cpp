@@ -4,6 +4,7 @@
 #include <random>
 #include <set>
 
+#include "daemon/core/page_check.h"
 #include "tests/daemon/fixture.h"
 
 namespace maru::daemon::test {
@@ -41,6 +42,10 @@ TEST_F(SearchTest, AnswersTotalThenHitsThenSuccess) {
             R"("MARUMDFSSize":16,"MARUMDIsDir":false,"MARUMDKind":"image",)"
             R"("MARUMDOwnerUserID":"2","MARUMDPath":"/volume1/photo/trip/Lisbon.JPG",)"
             R"("highlight":{"MARUMDFSName":["<mark>Lisbon</mark>.JPG"]},"id":"fileindex_photo"})");
+  const auto folder = Ask(
+      bin_, "search", Parsed(R"({"pre_query": {"keyword": "trip"}, "fields": ["MARUMDKind"]})"));
+  ASSERT_EQ(folder.size(), 3u);
+  EXPECT_EQ(folder[1]["MARUMDKind"], "folder");
 }
 
 TEST_F(SearchTest, NarrowsByTypeCriteriaAndPlace) {
@@ -48,6 +53,7 @@ TEST_F(SearchTest, NarrowsByTypeCriteriaAndPlace) {
   File("photo/trip/deep/b.md", std::string(5000, 'x') + " harbour");
   File("photo/c.mp3", "harbour");
   AddShare("docs");
+  AddShare("unindexed");
   File("docs/d.txt", "harbour");
   Index();
   Index("docs");
@@ -66,7 +72,8 @@ TEST_F(SearchTest, NarrowsByTypeCriteriaAndPlace) {
   EXPECT_EQ(with(harbour + R"(, "file_type": "audio")"), (Strings{"c.mp3"}));
   EXPECT_EQ(with(harbour, R"(, "filters": [{"name": "file_type", "data": "audio"}])"),
             (Strings{"c.mp3"}));
-  EXPECT_EQ(with(harbour, R"(, "indice": ["fileindex_docs", "fileindex_none", "other"])"),
+  EXPECT_EQ(with(harbour, R"(, "indice": ["fileindex_docs", "fileindex_docs", "fileindex_none",
+            "fileindex_unindexed", "other"])"),
             (Strings{"d.txt"}));
   EXPECT_EQ(with(harbour, R"(, "indice": [])"), (Strings{}));
   EXPECT_EQ(with(R"("keyword": "boats -lake")"), (Strings{"a.txt"}));
@@ -106,6 +113,12 @@ TEST_F(SearchTest, PagesSortAndStayExact) {
   EXPECT_EQ(sizes.size(), 25u);
   EXPECT_TRUE(std::is_sorted(sizes.begin(), sizes.end()));
   EXPECT_EQ(std::set(sizes.begin(), sizes.end()).size(), 25u);
+  const auto largest = Ask(bin_, "search", Parsed(R"({"pre_query": {"keyword": "word"}, "size": 1,
+      "sort": {"field": "MARUMDFSSize"}, "fields": ["MARUMDFSSize"],
+      "highlight": {"frag_length": 1000000000000, "num_fragments": 1000000000000}})"));
+  ASSERT_EQ(largest.size(), 3u) << json::ToString(largest.back());
+  EXPECT_EQ(largest[1]["MARUMDFSSize"].asUInt64(), sizes.back());
+  EXPECT_EQ(largest[1]["highlight"]["MARUMDTextContent"].size(), 1u) << "one is a list, too";
 }
 
 TEST_F(SearchTest, ThePageIsCheckedAgainstTheFilesOnceMore) {
@@ -132,6 +145,24 @@ TEST_F(SearchTest, ThePageIsCheckedAgainstTheFilesOnceMore) {
   EXPECT_EQ(messages.size(), 22u);
   EXPECT_LE(messages[0]["total"].asInt(), 33);
   EXPECT_GE(messages[0]["total"].asInt(), 29);
+  // The share's own folder counts, too: to be read itself, and to be passed.
+  EXPECT_EQ(Names(bin_, "photo"), (Strings{"photo"}));
+  chmod((root_ + "/photo").c_str(), 0711);
+  EXPECT_EQ(Names(bin_, "photo"), (Strings{}));
+  EXPECT_EQ(Names(bin_, "word").size(), 29u);
+  chmod((root_ + "/photo").c_str(), 0700);
+  EXPECT_EQ(Names(bin_, "word"), (Strings{}));
+}
+
+TEST_F(SearchTest, NoPathIsFollowedWithoutEnd) {
+  std::string path = "/photo";
+  for (std::size_t depth = 1; depth < kMaxPathDepth; ++depth) path += "/d";
+  File(path + "/d/f", "word");
+  const Scope scope{{bin_, "bin"}, {{"fileindex_photo", table_->Find("photo")}}, table_};
+  index::Hit last, deeper;
+  last.path = path.substr(std::string("/photo").size()) + "/d";
+  deeper.path = last.path + "/f";
+  EXPECT_EQ(ReadableNow(scope, {last, deeper}), (std::vector<bool>{true, false}));
 }
 
 TEST_F(SearchTest, NobodySeesMoreThanTheirOwn) {
@@ -256,6 +287,8 @@ TEST_F(SearchTest, RefusesWhatIsMalformed) {
            R"({"indice": ["fileindex_a/b"]})",
            R"({"indice": [""]})",
            R"({"indice": ["a\u0000b"]})",
+           R"({"indice": ["a\u007fb"]})",
+           R"({"indice": [".."]})",
            R"({"indice": "fileindex_photo"})",
            R"({"indice": [5]})",
            R"({"from": -1})",
@@ -263,6 +296,7 @@ TEST_F(SearchTest, RefusesWhatIsMalformed) {
            R"({"size": "5"})",
            R"({"default_search_op": "XOR"})",
            R"({"load_field": ["Name"]})",
+           R"({"lazy_field": ["Name"]})",
            R"({"fields": [1]})",
            R"({"filters": [{"name": "owner", "data": "x"}]})",
            R"({"filters": [{"name": "permission"}]})",
@@ -278,6 +312,17 @@ TEST_F(SearchTest, RefusesWhatIsMalformed) {
        }) {
     EXPECT_EQ(Code(bin_, "search", Parsed(bad)), 120) << bad;
   }
+  Json::Value long_list, long_text, long_item;
+  for (int i = 0; i < 65; ++i) long_list["fields"].append("MARUMDPath");
+  long_text["collector"]["agent"] = std::string(257, 'x');
+  long_item["indice"].append(std::string(301, 'x'));
+  for (const Json::Value& bad : {long_list, long_text, long_item}) {
+    EXPECT_EQ(Code(bin_, "search", bad), 120) << json::ToString(bad);
+  }
+  std::string name = "x";
+  for (int i = 0; i < 31; ++i) name += "é";
+  EXPECT_EQ(Ask(bin_, name).back()["error"]["msg"],
+            "Unknown command \"" + name.substr(0, 59) + "…\"");
   for (const char* bad :
        {"", "abc", "[]", "{}", "{\"command\": 1}", "{\"command\": \"drop\"}",
         "{\"command\": \"search\", \"data\": []}", "{\"command\": \"search\", \"more\": 1}",

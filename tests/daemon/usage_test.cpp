@@ -36,13 +36,17 @@ TEST_F(UsageTest, FadesAndCountsOthersALittle) {
   const double once = BoostOf(*usage, 1, 7);
   usage->Record(1, "i", 7, "/a");
   const double twice = BoostOf(*usage, 1, 7);
+  EXPECT_DOUBLE_EQ(once, UsageStore::kOwnBoost / 2) << "own openings are not counted as others'";
   EXPECT_GT(twice, once);
   EXPECT_LT(twice, UsageStore::kOwnBoost);
   EXPECT_GT(BoostOf(*usage, 2, 7), 0);
   EXPECT_LT(BoostOf(*usage, 2, 7), UsageStore::kOthersBoost);
   now_ += UsageStore::kHalfLife;
   EXPECT_DOUBLE_EQ(BoostOf(*usage, 1, 7), once);
+  usage->Record(1, "i", 7, "/a");
+  EXPECT_DOUBLE_EQ(BoostOf(*usage, 1, 7), twice) << "half of two, and one";
   EXPECT_TRUE(usage->Strongest(1, {"other"}).empty());
+  EXPECT_TRUE(usage->Strongest(2, {"other"}).empty());
 }
 
 TEST_F(UsageTest, SurvivesRestartsAndStaysBounded) {
@@ -60,6 +64,17 @@ TEST_F(UsageTest, SurvivesRestartsAndStaysBounded) {
   EXPECT_EQ(usage->Size(), 2 * UsageStore::kMaxFiles + 20);
   EXPECT_DOUBLE_EQ(BoostOf(*usage, 1, 220), boost);
   EXPECT_LE(usage->Strongest(1, {"i"}).size(), UsageStore::kMaxStrongest);
+}
+
+TEST_F(UsageTest, ForgetsTheUserWhoWasAwayLongest) {
+  const auto usage = Open();
+  for (unsigned uid = 0; uid <= UsageStore::kMaxUsers; ++uid) {
+    usage->Record(uid, "i", 1, "/a");
+    ++now_;
+  }
+  EXPECT_EQ(usage->Size(), UsageStore::kMaxUsers + 1);
+  EXPECT_LT(BoostOf(*usage, 0, 1), UsageStore::kOthersBoost);
+  EXPECT_GT(BoostOf(*usage, 1, 1), UsageStore::kOthersBoost);
 }
 
 TEST_F(UsageTest, SurvivesAKill) {
