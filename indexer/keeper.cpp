@@ -8,7 +8,6 @@
 #include <utility>
 
 #include "indexer/crawl/crawl.h"
-#include "indexer/follow/round.h"
 #include "system/log.h"
 
 namespace maru::indexer {
@@ -119,8 +118,7 @@ void Keeper::Follow() {
   const UniqueFd top = due.empty() || !compared_ ? UniqueFd() : OpenTop(target_.path);
   if (!top) return;
   Updater updater(*tree_, workers_, stop_);
-  Round(updater).Run(top.Get(), target_.share, due);
-  follower_.TryAgain(due);
+  follower_.CatchUp(updater, top.Get(), std::move(due));
   tree_->Commit();
 }
 

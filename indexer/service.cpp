@@ -5,6 +5,10 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <vector>
 
 #include "indexer/tree/shares.h"
 #include "system/log.h"
@@ -27,7 +31,27 @@ bool Contains(const std::vector<std::string>& names, const std::string& name) {
   return std::find(names.begin(), names.end(), name) != names.end();
 }
 
-}  // namespace
+/// All shares followed, as the settings have them at each moment.
+class Service {
+ public:
+  Service(Workers& workers, const Keeper::Settings& settings)
+      : workers_(workers), settings_(settings) {}
+
+  /// Brings the keepers in line with the settings: shares that came, went, or have another folder
+  /// now (a disk was mounted). Removes the indices of shares that are gone.
+  void Reconcile();
+  /// A crawl of every share, one after another.
+  void CrawlSoon() {
+    for (const auto& keeper : keepers_) keeper->CrawlSoon();
+  }
+
+ private:
+  Workers& workers_;
+  const Keeper::Settings& settings_;
+  std::mutex turn_;
+  std::vector<std::unique_ptr<Keeper>> keepers_;
+  std::vector<std::string> missing_;
+};
 
 void Service::Reconcile() {
   const std::shared_ptr<const ShareTable> table = ShareTable::Current();
@@ -50,9 +74,7 @@ void Service::Reconcile() {
   missing_ = targets.missing;
 }
 
-void Service::CrawlSoon() {
-  for (const auto& keeper : keepers_) keeper->CrawlSoon();
-}
+}  // namespace
 
 void Serve(Workers& workers, const Keeper::Settings& settings) {
   const sigset_t signals = Signals();

@@ -2,7 +2,6 @@
 
 #include <cerrno>
 
-#include "indexer/update/settle.h"
 #include "system/log.h"
 
 namespace maru::indexer {
@@ -20,7 +19,7 @@ bool Crawl::Run(int top, const std::string& share_name) {
   const bool is_first = !tree.HasRoot();
   if (!updater_.UpdateTop(top, share_name)) return false;
   if (is_first) {
-    NewTree(updater_).Run(top, Writer::kRoot);
+    FullWalk(updater_).Run(top, Writer::kRoot);
   } else {
     Walk::Run(top, Writer::kRoot);
   }
@@ -32,7 +31,7 @@ bool Crawl::Run(int top, const std::string& share_name) {
 /// It may have been moved here from where the crawl has not been yet.
 void Crawl::Meet(int dir_fd, Folder& folder, const Found& found) {
   if (updater_.Adopt(dir_fd, folder, found)) return;
-  if (updater_.Moved().AddArrival(folder.id, std::string(found.name))) return;
+  if (updater_.Moved().AddArrival(folder, found.name)) return;
   updater_.TakeIn(dir_fd, folder, found);
 }
 

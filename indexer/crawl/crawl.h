@@ -2,7 +2,7 @@
 
 #include <string>
 
-#include "indexer/update/full_walk.h"
+#include "indexer/update/walks.h"
 
 namespace maru::indexer {
 

@@ -34,7 +34,6 @@ class Counter : private Walk {
       if (found.IsFolder()) children.push_back({std::string(found.name), 0});
     }
   }
-  void Unreadable(const Child&) override {}
   bool Stopped() override { return stop_ || done_; }
 
   Counts& counts_;
@@ -45,38 +44,17 @@ class Counter : private Walk {
   std::thread thread_;
 };
 
-/// Shows progress from a thread of its own while a crawl runs.
-class Show {
- public:
-  Show(Progress& progress, const std::string& share, const Counts& counts)
-      : progress_(progress), counts_(counts) {
-    progress.Begin(share);
-    thread_ = std::thread([this] { Run(); });
+/// Shows how a crawl goes until it is asked to stop.
+void Show(const std::stop_token& ended, Progress& progress, const Counts& counts) {
+  std::mutex mutex;
+  std::unique_lock lock(mutex);
+  std::condition_variable_any never;
+  while (true) {
+    never.wait_for(lock, ended, progress.Interval(), [] { return false; });
+    if (ended.stop_requested()) return;
+    progress.Show(counts);
   }
-  ~Show() {
-    {
-      const std::lock_guard lock(mutex_);
-      done_ = true;
-    }
-    ended_.notify_one();
-    thread_.join();
-  }
-
- private:
-  void Run() {
-    std::unique_lock lock(mutex_);
-    while (!ended_.wait_for(lock, progress_.Interval(), [this] { return done_; })) {
-      progress_.Show(counts_);
-    }
-  }
-
-  Progress& progress_;
-  const Counts& counts_;
-  std::mutex mutex_;
-  std::condition_variable ended_;
-  bool done_ = false;
-  std::thread thread_;
-};
+}
 
 bool CrawlTarget(const Target& target, Workers& workers, Counts& counts,
                  const std::atomic<bool>& stop) {
@@ -116,10 +94,10 @@ bool CrawlOnce(const std::vector<Target>& targets, Workers& workers, const OnceO
     if (stop) break;
     if (options.full) RemoveIndex(target.index_folder);
     Counts counts;
-    {
-      const Show show(progress, target.share, counts);
-      good = CrawlNoThrow(target, workers, counts, stop) && good;
-    }
+    progress.Begin(target.share);
+    std::jthread show([&](const std::stop_token& ended) { Show(ended, progress, counts); });
+    good = CrawlNoThrow(target, workers, counts, stop) && good;
+    show = {};
     progress.End(counts);
   }
   return good;

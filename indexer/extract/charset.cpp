@@ -19,63 +19,35 @@ namespace {
 constexpr std::size_t kGuessBytes = 64u << 10;
 constexpr std::string_view kReplacement = "\xEF\xBF\xBD";
 
-/// Every charset that is converted from: the name it is known by, and the converter's name where a
-/// larger charset holds it.
-struct CharsetRow {
-  const char* name;
-  const char* converter;
-};
+/// Charsets that are converted from, by the converter's names.
 constexpr std::array kCharsets = {
-    CharsetRow{"UTF-16LE", "UTF-16LE"},
-    CharsetRow{"UTF-16BE", "UTF-16BE"},
-    CharsetRow{"UTF-32LE", "UTF-32LE"},
-    CharsetRow{"UTF-32BE", "UTF-32BE"},
-    CharsetRow{"WINDOWS-1252", "WINDOWS-1252"},
-    CharsetRow{"ISO-8859-1", "WINDOWS-1252"},
-    CharsetRow{"LATIN1", "WINDOWS-1252"},
-    CharsetRow{"ISO-8859-2", "ISO-8859-2"},
-    CharsetRow{"ISO-8859-3", "ISO-8859-3"},
-    CharsetRow{"ISO-8859-4", "ISO-8859-4"},
-    CharsetRow{"ISO-8859-5", "ISO-8859-5"},
-    CharsetRow{"ISO-8859-6", "ISO-8859-6"},
-    CharsetRow{"ISO-8859-7", "ISO-8859-7"},
-    CharsetRow{"ISO-8859-8", "ISO-8859-8"},
-    CharsetRow{"ISO-8859-9", "WINDOWS-1254"},
-    CharsetRow{"ISO-8859-10", "ISO-8859-10"},
-    CharsetRow{"ISO-8859-11", "CP874"},
-    CharsetRow{"ISO-8859-13", "ISO-8859-13"},
-    CharsetRow{"ISO-8859-15", "ISO-8859-15"},
-    CharsetRow{"ISO-8859-16", "ISO-8859-16"},
-    CharsetRow{"TIS-620", "CP874"},
-    CharsetRow{"WINDOWS-1250", "WINDOWS-1250"},
-    CharsetRow{"WINDOWS-1251", "WINDOWS-1251"},
-    CharsetRow{"WINDOWS-1253", "WINDOWS-1253"},
-    CharsetRow{"WINDOWS-1254", "WINDOWS-1254"},
-    CharsetRow{"WINDOWS-1255", "WINDOWS-1255"},
-    CharsetRow{"WINDOWS-1256", "WINDOWS-1256"},
-    CharsetRow{"WINDOWS-1257", "WINDOWS-1257"},
-    CharsetRow{"WINDOWS-1258", "WINDOWS-1258"},
-    CharsetRow{"KOI8-R", "KOI8-R"},
-    CharsetRow{"KOI8-U", "KOI8-U"},
-    CharsetRow{"IBM852", "IBM852"},
-    CharsetRow{"IBM855", "IBM855"},
-    CharsetRow{"IBM862", "IBM862"},
-    CharsetRow{"IBM865", "IBM865"},
-    CharsetRow{"IBM866", "IBM866"},
-    CharsetRow{"MAC-CYRILLIC", "MAC-CYRILLIC"},
-    CharsetRow{"MAC-CENTRALEUROPE", "MAC-CENTRALEUROPE"},
-    CharsetRow{"VISCII", "VISCII"},
-    CharsetRow{"SHIFT_JIS", "CP932"},
-    CharsetRow{"EUC-JP", "EUC-JP"},
-    CharsetRow{"ISO-2022-JP", "ISO-2022-JP"},
-    CharsetRow{"EUC-KR", "UHC"},
-    CharsetRow{"UHC", "UHC"},
-    CharsetRow{"ISO-2022-KR", "ISO-2022-KR"},
-    CharsetRow{"BIG5", "BIG5-HKSCS"},
-    CharsetRow{"EUC-TW", "EUC-TW"},
-    CharsetRow{"GB18030", "GB18030"},
-    CharsetRow{"GB2312", "GB18030"},
-    CharsetRow{"GBK", "GB18030"},
+    "UTF-16LE",     "UTF-16BE",     "UTF-32LE",
+    "UTF-32BE",     "WINDOWS-1252", "ISO-8859-2",
+    "ISO-8859-3",   "ISO-8859-4",   "ISO-8859-5",
+    "ISO-8859-6",   "ISO-8859-7",   "ISO-8859-8",
+    "ISO-8859-10",  "ISO-8859-13",  "ISO-8859-15",
+    "ISO-8859-16",  "WINDOWS-1250", "WINDOWS-1251",
+    "WINDOWS-1253", "WINDOWS-1254", "WINDOWS-1255",
+    "WINDOWS-1256", "WINDOWS-1257", "WINDOWS-1258",
+    "KOI8-R",       "KOI8-U",       "IBM852",
+    "IBM855",       "IBM862",       "IBM865",
+    "IBM866",       "MAC-CYRILLIC", "MAC-CENTRALEUROPE",
+    "VISCII",       "EUC-JP",       "ISO-2022-JP",
+    "UHC",          "ISO-2022-KR",  "EUC-TW",
+    "GB18030",
+};
+/// Those that a larger one holds, with that one's converter.
+constexpr std::pair<const char*, const char*> kHeld[] = {
+    {"ISO-8859-1", "WINDOWS-1252"},
+    {"LATIN1", "WINDOWS-1252"},
+    {"ISO-8859-9", "WINDOWS-1254"},
+    {"ISO-8859-11", "CP874"},
+    {"TIS-620", "CP874"},
+    {"SHIFT_JIS", "CP932"},
+    {"EUC-KR", "UHC"},
+    {"BIG5", "BIG5-HKSCS"},
+    {"GB2312", "GB18030"},
+    {"GBK", "GB18030"},
 };
 
 struct Mark {
@@ -102,8 +74,11 @@ bool IsWide(std::string_view bytes) {
 }
 
 const char* ConverterOf(std::string_view charset) {
-  for (const CharsetRow& row : kCharsets) {
-    if (SameWord(row.name, charset)) return row.converter;
+  for (const auto& [name, converter] : kHeld) {
+    if (SameWord(name, charset)) return converter;
+  }
+  for (const char* name : kCharsets) {
+    if (SameWord(name, charset)) return name;
   }
   return nullptr;
 }
@@ -191,9 +166,11 @@ std::optional<std::string_view> UTF8Text(std::string_view bytes) {
 }
 
 void LoadCharsets() {
-  for (const CharsetRow& row : kCharsets) {
-    if (iconv_t* converter = Converter(row.converter)) Convert(*converter, "a");
-  }
+  const auto load = [](const char* name) {
+    if (iconv_t* converter = Converter(name)) Convert(*converter, "a");
+  };
+  for (const char* name : kCharsets) load(name);
+  for (const auto& [name, converter] : kHeld) load(converter);
 }
 
 std::string ToUTF8(std::string_view bytes, std::string_view declared) {

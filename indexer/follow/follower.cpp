@@ -2,16 +2,22 @@
 
 #include <sys/inotify.h>
 
+#include <algorithm>
 #include <cerrno>
+#include <unordered_set>
 #include <utility>
 
-#include "indexer/follow/round.h"
+#include "indexer/update/walks.h"
 #include "system/log.h"
 
 namespace maru::indexer {
 namespace {
 
 using index::DirectoryId;
+using index::Writer;
+
+/// Stands for the folder above the share's own: its only name, "", is that folder itself.
+constexpr DirectoryId kAboveRoot = 0;
 
 /// Names dealt with between two commits.
 constexpr std::size_t kMaxDue = 2'000;
@@ -20,6 +26,46 @@ bool IsComplete(std::uint32_t mask) {
   return (mask & (IN_CLOSE_WRITE | IN_MOVED_FROM | IN_MOVED_TO | IN_DELETE | IN_ATTRIB)) != 0 ||
          (mask & (IN_CREATE | IN_ISDIR)) == (IN_CREATE | IN_ISDIR);
 }
+
+/// One round of following.
+class Round : public PartialWalk {
+ public:
+  explicit Round(Updater& updater) : PartialWalk(updater) {}
+
+  /// What is left of `names` stands in folders that are not where they were.
+  void Run(int top, NamesByFolder& names) {
+    // Of a folder that is gone nothing is to be known any more.
+    std::erase_if(names, [this](const auto& item) {
+      return item.first != Writer::kRoot && updater_.Indexed().ParentOf(item.first) == 0;
+    });
+    changed_.clear();
+    for (const auto& [folder, wanted] : names) changed_.insert(folder);
+    PartialWalk::Run(top, names);
+    Settle(updater_, top);
+  }
+
+ private:
+  void Reach(int dir_fd, const FolderHandle& folder, std::vector<std::string> names) override {
+    for (const index::Entry& entry : folder->entries) {
+      if (changed_.contains(entry.directory) && !IsOrphan(entry)) names.push_back(entry.name);
+    }
+    std::sort(names.begin(), names.end());
+    names.erase(std::unique(names.begin(), names.end()), names.end());
+    listing_.LookAt(dir_fd, names);
+    // What is a folder only now is walked when this is settled: what happened in it before its
+    // place was known went unseen. There is room for as many as are ever due.
+    for (const Found& found : listing_.Entries()) {
+      const index::Entry* entry = folder->Find(found.name);
+      const bool is_known = entry && entry->stamp.inode == found.stamp.inode;
+      if (found.IsFolder() && !is_known) updater_.Moved().AddArrival(*folder, found.name);
+    }
+    updater_.Update(dir_fd, folder, Compare(*folder, names, listing_.Entries()));
+  }
+
+  Listing listing_;
+  /// Folders in which something has changed, and so their own times.
+  std::unordered_set<DirectoryId> changed_;
+};
 
 }  // namespace
 
@@ -32,28 +78,36 @@ void Follower::Entering(int dir_fd, DirectoryId id) {
 void Follower::Hear() {
   std::vector<Watcher::Event> events;
   watcher_.Read(events);
-  for (const Watcher::Event& event : events) Note(event);
+  for (const Watcher::Event& event : events) {
+    if (event.mask == IN_Q_OVERFLOW) {
+      Lose();
+    } else if (!event.name.empty()) {
+      Await(event.folder, event.name, IsComplete(event.mask));
+    } else if (event.folder == Writer::kRoot) {
+      Await(kAboveRoot, {}, true);
+    }
+  }
 }
 
 NamesByFolder Follower::TakeDue() {
   return pending_.TakeDue(Clock::now(), kMaxDue);
 }
 
-void Follower::TryAgain(const NamesByFolder& names) {
-  for (const auto& [folder, wanted] : names) {
-    for (const std::string& name : wanted) Await(folder, name, false);
+void Follower::CatchUp(Updater& updater, int top, NamesByFolder due) {
+  if (due.erase(kAboveRoot) > 0 || due.contains(Writer::kRoot)) updater.UpdateTop(top, share_);
+  Round round(updater);
+  round.Run(top, due);
+  // What was not where it was may have been moved along with what has just been settled. If not,
+  // more is yet to be heard of it.
+  if (!due.empty()) round.Run(top, due);
+  for (const auto& [folder, names] : due) {
+    for (const std::string& name : names) Await(folder, name, false);
   }
 }
 
 void Follower::Renew() {
   watcher_.Renew();
   lost_ = false;
-}
-
-void Follower::Note(const Watcher::Event& event) {
-  if (event.mask == IN_Q_OVERFLOW) return Lose();
-  if (!event.name.empty()) return Await(event.folder, event.name, IsComplete(event.mask));
-  if (event.folder == index::Writer::kRoot) Await(kAboveRoot, {}, true);
 }
 
 void Follower::Await(DirectoryId folder, const std::string& name, bool complete) {

@@ -4,7 +4,7 @@
 
 #include "indexer/follow/pending.h"
 #include "indexer/follow/watcher.h"
-#include "indexer/tree/tree.h"
+#include "indexer/update/updater.h"
 
 namespace maru::indexer {
 
@@ -28,8 +28,8 @@ class Follower : public FolderListener {
   Clock::time_point NextDue() const { return pending_.NextDue(); }
   /// Takes out some names that have come to rest.
   NamesByFolder TakeDue();
-  /// Names that could not be looked at now come again.
-  void TryAgain(const NamesByFolder& names);
+  /// Compares them, and the folders in which they stand. `top` is the share's folder.
+  void CatchUp(Updater& updater, int top, NamesByFolder due);
 
   /// A crawl begins, which finds all that was lost.
   void Renew();
@@ -39,7 +39,6 @@ class Follower : public FolderListener {
   bool HearsAll() const { return watcher_.Complete(); }
 
  private:
-  void Note(const Watcher::Event& event);
   void Await(index::DirectoryId folder, const std::string& name, bool complete);
   void Lose();
 

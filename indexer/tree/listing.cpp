@@ -71,7 +71,6 @@ std::optional<Found> Look(int dir_fd, const char* name) {
 
 bool Listing::ReadNames(int dir_fd) {
   if (!buffer_) buffer_ = std::make_unique<char[]>(kBuffer);
-  bytes_.clear();
   names_.clear();
   if (lseek(dir_fd, 0, SEEK_SET) != 0) return false;
   while (true) {
@@ -81,26 +80,25 @@ bool Listing::ReadNames(int dir_fd) {
     for (ssize_t at = 0; at < got;) {
       const auto* entry = reinterpret_cast<const dirent64*>(buffer_.get() + at);
       at += entry->d_reclen;
-      if (!MayBeIndexed(*entry)) continue;
-      const std::size_t length = std::strlen(entry->d_name);
-      names_.push_back({bytes_.size(), length});
-      bytes_.append(entry->d_name, length + 1);
+      if (MayBeIndexed(*entry)) names_.append(entry->d_name, std::strlen(entry->d_name) + 1);
     }
+  }
+}
+
+void Listing::Add(int dir_fd, const char* name) {
+  if (const std::optional<Found> found = Look(dir_fd, name)) {
+    entries_.push_back(*found);
+  } else if (errno != 0 && !HasVanished(errno)) {
+    entries_.push_back({.name = name});
   }
 }
 
 bool Listing::Read(int dir_fd) {
   entries_.clear();
   if (!ReadNames(dir_fd)) return false;
-  for (const Name& name : names_) {
-    const std::string_view text = std::string_view(bytes_).substr(name.offset, name.length);
-    if (const std::optional<Found> found = Look(dir_fd, text.data())) {
-      entries_.push_back(*found);
-    } else if (errno == EACCES) {
-      return false;
-    } else if (errno != 0 && errno != ENOENT) {
-      entries_.push_back({.name = text});
-    }
+  for (std::size_t at = 0; at < names_.size(); at = names_.find('\0', at) + 1) {
+    Add(dir_fd, &names_[at]);
+    if (errno == EACCES) return false;
   }
   std::sort(entries_.begin(), entries_.end(),
             [](const Found& a, const Found& b) { return a.name < b.name; });
@@ -109,13 +107,7 @@ bool Listing::Read(int dir_fd) {
 
 void Listing::LookAt(int dir_fd, const std::vector<std::string>& names) {
   entries_.clear();
-  for (const std::string& name : names) {
-    if (const std::optional<Found> found = Look(dir_fd, name.c_str())) {
-      entries_.push_back(*found);
-    } else if (errno != 0 && !HasVanished(errno)) {
-      entries_.push_back({.name = name});
-    }
-  }
+  for (const std::string& name : names) Add(dir_fd, name.c_str());
 }
 
 bool HasVanished(int error) {

@@ -51,14 +51,11 @@ class Listing {
 
  private:
   bool ReadNames(int dir_fd);
+  void Add(int dir_fd, const char* name);
 
-  struct Name {
-    std::size_t offset;
-    std::size_t length;
-  };
   std::unique_ptr<char[]> buffer_;
-  std::string bytes_;
-  std::vector<Name> names_;
+  /// Each ends with a NUL.
+  std::string names_;
   std::vector<Found> entries_;
 };
 

@@ -12,11 +12,8 @@
 #include "system/log.h"
 
 namespace maru::indexer {
-namespace {
 
 namespace fs = std::filesystem;
-
-}  // namespace
 
 std::string IndexHome() {
   return Config::Get().state_dir + "/index";

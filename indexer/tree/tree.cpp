@@ -37,15 +37,11 @@ void Folder::Merge() {
   added.clear();
 }
 
-const Entry* Folder::Find(std::string_view name) const {
+Entry* Folder::Find(std::string_view name) {
   const auto place = std::lower_bound(
       entries.begin(), entries.end(), name,
       [](const Entry& entry, std::string_view sought) { return entry.name < sought; });
   return place != entries.end() && place->name == name ? &*place : nullptr;
-}
-
-Entry* Folder::Find(std::string_view name) {
-  return const_cast<Entry*>(std::as_const(*this).Find(name));
 }
 
 Tree::Tree(const std::string& index_folder, Counts& counts, FolderListener* listener)
@@ -107,20 +103,20 @@ void Tree::CloseUnused() {
   });
 }
 
-void Tree::AddRoot(const Document& document, const Stamp& stamp) {
-  const DirectoryId id = writer_.AddDirectory(0, {}, document.rights);
-  writer_.SetRoot({document.name, writer_.Add(Prepared(document)), id, stamp});
-  ++counts_.added;
-}
-
-void Tree::UpdateRoot(const Document& document, const Stamp& stamp) {
+void Tree::SetRoot(const Document& document, const Stamp& stamp) {
   Entry root = writer_.Root();
-  writer_.SetDirectory(root.directory, 0, {}, document.rights);
-  writer_.Update(root.document, document);
+  if (root.document == 0) {
+    root.directory = writer_.AddDirectory(0, {}, document.rights);
+    root.document = writer_.Add(Prepared(document));
+    ++counts_.added;
+  } else {
+    writer_.SetDirectory(root.directory, 0, {}, document.rights);
+    writer_.Update(root.document, document);
+    ++counts_.changed;
+  }
   root.name = document.name;
   root.stamp = stamp;
   writer_.SetRoot(root);
-  ++counts_.changed;
 }
 
 void Tree::AddFile(Folder& folder, Prepared prepared, const std::string& name, const Stamp& stamp) {
@@ -153,15 +149,11 @@ void Tree::Update(Folder& folder, Entry& entry, const Document& document, const 
   ++counts_.changed;
 }
 
-void Tree::RemoveFile(Folder& folder, const Entry& entry) {
+void Tree::RemoveFile(Folder& folder, Entry& entry) {
   writer_.Remove(entry.document);
+  entry.document = 0;
   folder.changed = true;
   ++counts_.removed;
-}
-
-void Tree::RemoveLast(Folder& folder) {
-  RemoveFile(folder, folder.entries.back());
-  folder.entries.pop_back();
 }
 
 void Tree::Forget(DirectoryId id) {
@@ -174,24 +166,24 @@ void Tree::Forget(DirectoryId id) {
 void Tree::RemoveFolder(Folder& folder, const std::string& name) {
   const Entry* top = folder.Find(name);
   if (!top || top->directory == 0) return;
-  // From the leaves up and without recursion: a commit on the way leaves nothing without a folder.
+  // From the leaves up and without recursion: a commit meanwhile leaves nothing without a folder.
   std::vector<FolderHandle> way{Open(top->directory)};
   while (!way.empty()) {
     CommitIfDue();
-    Folder& inner = *way.back();
-    if (inner.entries.empty()) {
-      Forget(inner.id);
-      way.pop_back();
-      if (!way.empty()) RemoveLast(*way.back());
-    } else if (const DirectoryId below = inner.entries.back().directory; below != 0) {
-      way.push_back(Open(below));
-    } else {
-      RemoveLast(inner);
+    std::vector<Entry>& entries = way.back()->entries;
+    if (!entries.empty() && entries.back().directory != 0) {
+      way.push_back(Open(entries.back().directory));
+      continue;
     }
+    if (entries.empty()) {
+      Forget(way.back()->id);
+      way.pop_back();
+    }
+    if (way.empty()) break;
+    RemoveFile(*way.back(), way.back()->entries.back());
+    way.back()->entries.pop_back();
   }
-  Entry* entry = folder.Find(name);
-  RemoveFile(folder, *entry);
-  entry->document = 0;
+  RemoveFile(folder, *folder.Find(name));
   folder.Merge();
 }
 

@@ -26,7 +26,6 @@ struct Folder {
   void Add(index::Entry entry);
   void Merge();
   /// Among the merged ones. Null when there is none; holds until the next Merge.
-  const index::Entry* Find(std::string_view name) const;
   index::Entry* Find(std::string_view name);
 };
 /// Merges, commits and removals change what it points to. Of the tree's thread, though others may
@@ -83,8 +82,7 @@ class Tree {
 
   index::Entry Root() const { return writer_.Root(); }
   bool HasRoot() const { return writer_.HasRoot(); }
-  void AddRoot(const index::Document& document, const index::Stamp& stamp);
-  void UpdateRoot(const index::Document& document, const index::Stamp& stamp);
+  void SetRoot(const index::Document& document, const index::Stamp& stamp);
 
   void AddFile(Folder& folder, index::Prepared prepared, const std::string& name,
                const index::Stamp& stamp);
@@ -96,8 +94,8 @@ class Tree {
   /// keeps the order when the name changes.
   void Update(Folder& folder, index::Entry& entry, const index::Document& document,
               const index::Stamp& stamp);
-  /// The document only; the caller takes the entry away.
-  void RemoveFile(Folder& folder, const index::Entry& entry);
+  /// The entry is gone with the next Merge.
+  void RemoveFile(Folder& folder, index::Entry& entry);
   /// A folder's entry with all that lies in it. May commit.
   void RemoveFolder(Folder& folder, const std::string& name);
   /// Takes a folder's entry to another place; its own row and document are then to be brought up to
@@ -114,7 +112,6 @@ class Tree {
   void SetParent(index::DirectoryId id, index::DirectoryId parent);
   void Write(Folder& folder);
   void CloseUnused();
-  void RemoveLast(Folder& folder);
   void Forget(index::DirectoryId id);
 
   index::Writer writer_;

@@ -28,7 +28,7 @@ class Walk {
   /// Looks into one open folder and adds those of its folders to go into.
   virtual void Visit(int dir_fd, index::DirectoryId id, std::vector<Child>& children) = 0;
   /// A folder could not be opened (errno); one that has vanished is not worth a word.
-  virtual void Unreadable(const Child& child) = 0;
+  virtual void Unreadable(const Child&) {}
   virtual bool Stopped() = 0;
 
   /// The folder being visited, below the top: "" or "a/b".

@@ -9,61 +9,45 @@ bool SameType(const Entry& entry, const Found& found) {
   return (entry.directory != 0) == found.IsFolder();
 }
 
-/// A name that nothing is known of is left as it was.
-bool Differ(const Entry* entry, const Found* found) {
-  if (found && found->type == FileType::kUnknown) return false;
-  if (!entry || !found) return entry || found;
-  return entry->stamp != found->stamp || !SameType(*entry, *found);
-}
-
-bool IsReplaced(const Entry& entry, const Found& found) {
+bool IsAnother(const Entry& entry, const Found& found) {
   return !SameType(entry, found) || (found.IsFolder() && entry.stamp.inode != found.stamp.inode);
 }
 
-class Differences {
- public:
-  explicit Differences(const Folder& folder) : entries_(folder.entries) {}
-
-  void Note(const Entry* entry, const Found* found) {
-    if (!Differ(entry, found)) return;
-    const std::size_t place =
-        entry ? static_cast<std::size_t>(entry - entries_.data()) : Difference::kNone;
-    const bool is_replaced = entry && found && IsReplaced(*entry, *found);
-    list_.push_back({place, is_replaced ? nullptr : found});
-    if (is_replaced) list_.push_back({Difference::kNone, found});
+void Note(std::vector<Difference>& differences, Entry* entry, const Found* found) {
+  // What nothing is known of is left as it was.
+  if (found && found->type == FileType::kUnknown) return;
+  if (entry && found && IsAnother(*entry, *found)) {
+    differences.push_back({entry, nullptr});
+    differences.push_back({nullptr, found});
+  } else if (entry && found ? entry->stamp != found->stamp : entry || found) {
+    differences.push_back({entry, found});
   }
-  std::vector<Difference> Take() { return std::move(list_); }
-
- private:
-  const std::vector<Entry>& entries_;
-  std::vector<Difference> list_;
-};
+}
 
 }  // namespace
 
-std::vector<Difference> Compare(const Folder& folder, std::span<const Found> found) {
-  Differences differences(folder);
+std::vector<Difference> Compare(Folder& folder, std::span<const Found> found) {
+  std::vector<Difference> differences;
   auto entry = folder.entries.begin();
+  const auto end = folder.entries.end();
   for (const Found& here : found) {
-    for (; entry != folder.entries.end() && entry->name < here.name; ++entry) {
-      differences.Note(&*entry, nullptr);
-    }
-    const bool is_known = entry != folder.entries.end() && entry->name == here.name;
-    differences.Note(is_known ? &*entry++ : nullptr, &here);
+    for (; entry != end && entry->name < here.name; ++entry) Note(differences, &*entry, nullptr);
+    const bool is_known = entry != end && entry->name == here.name;
+    Note(differences, is_known ? &*entry++ : nullptr, &here);
   }
-  for (; entry != folder.entries.end(); ++entry) differences.Note(&*entry, nullptr);
-  return differences.Take();
+  for (; entry != end; ++entry) Note(differences, &*entry, nullptr);
+  return differences;
 }
 
-std::vector<Difference> Compare(const Folder& folder, const std::vector<std::string>& names,
+std::vector<Difference> Compare(Folder& folder, const std::vector<std::string>& names,
                                 std::span<const Found> found) {
-  Differences differences(folder);
+  std::vector<Difference> differences;
   for (const std::string& name : names) {
     const bool is_here = !found.empty() && found.front().name == name;
-    differences.Note(folder.Find(name), is_here ? &found.front() : nullptr);
+    Note(differences, folder.Find(name), is_here ? &found.front() : nullptr);
     if (is_here) found = found.subspan(1);
   }
-  return differences.Take();
+  return differences;
 }
 
 bool SameContent(const Entry& entry, const Found& found) {

@@ -1,6 +1,5 @@
 #pragma once
 
-#include <cstddef>
 #include <span>
 #include <string>
 #include <vector>
@@ -13,17 +12,15 @@ namespace maru::indexer {
 
 /// An entry that is not what is on the disk. Either side may be absent.
 struct Difference {
-  static constexpr std::size_t kNone = static_cast<std::size_t>(-1);
-  /// Its place in the folder's entries.
-  std::size_t entry = kNone;
+  index::Entry* entry = nullptr;
   const Found* found = nullptr;
 };
 
 /// The differences between a merged folder's entries and all that was found, or what was found
 /// under some names; both in byte order. Another folder under the name of one, or a file, is two of
 /// them: what is gone, and something new. They hold until the folder's next Merge.
-std::vector<Difference> Compare(const Folder& folder, std::span<const Found> found);
-std::vector<Difference> Compare(const Folder& folder, const std::vector<std::string>& names,
+std::vector<Difference> Compare(Folder& folder, std::span<const Found> found);
+std::vector<Difference> Compare(Folder& folder, const std::vector<std::string>& names,
                                 std::span<const Found> found);
 
 /// Whether what was found has all that was read of an entry: at most its name, rights and place are

@@ -1,18 +1,17 @@
 #include "indexer/update/moves.h"
 
-#include <algorithm>
 #include <utility>
 
 namespace maru::indexer {
 
-using index::DirectoryId;
 using index::Entry;
 
-void Moves::AddOrphan(Folder& folder, const Entry& entry) {
+void Moves::AddOrphan(Folder& folder, Entry& entry) {
   Entry orphan = entry;
   if (!IsOrphan(entry)) orphan.name += '/' + std::to_string(entry.stamp.inode);
   orphans_[entry.stamp.inode] = {folder.id, orphan.name, entry.directory};
   folder.Add(std::move(orphan));
+  entry.document = 0;
 }
 
 bool Moves::Adopt(std::uint64_t inode, Folder& folder, const std::string& name) {
@@ -34,10 +33,10 @@ bool Moves::RemoveOrphan() {
   return true;
 }
 
-bool Moves::AddArrival(DirectoryId folder, std::string name) {
+bool Moves::AddArrival(const Folder& folder, std::string_view name) {
   if (arrivals_count_ == kMaxArrivals) return false;
   ++arrivals_count_;
-  arrivals_[folder].push_back(std::move(name));
+  arrivals_[folder.id].emplace_back(name);
   return true;
 }
 

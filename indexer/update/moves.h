@@ -14,17 +14,16 @@ class Moves {
  public:
   explicit Moves(Tree& tree) : tree_(tree) {}
 
-  /// The entry's folder is gone from its place; the caller takes the entry away, another is added
-  /// for the orphan. A run that ends before RemoveOrphans leaves it to the next, to which it is
-  /// gone as well.
-  void AddOrphan(Folder& folder, const index::Entry& entry);
+  /// The folder of an entry is gone from its place: the entry becomes an orphan's. A run that ends
+  /// before RemoveOrphan leaves it to the next, to which it is gone as well.
+  void AddOrphan(Folder& folder, index::Entry& entry);
   /// Takes the orphan of this inode, if there is one, into `folder` under `name`.
   bool Adopt(std::uint64_t inode, Folder& folder, const std::string& name);
   /// One with all that lies in it. False when there are none.
   bool RemoveOrphan();
 
   /// A new folder is to wait until all orphans are known. False: there is no room for more.
-  bool AddArrival(index::DirectoryId folder, std::string name);
+  bool AddArrival(const Folder& folder, std::string_view name);
   NamesByFolder TakeArrivals();
 
  private:

@@ -48,83 +48,76 @@ UniqueFd OpenFile(int dir_fd, const Found& found) {
 }  // namespace
 
 bool Updater::UpdateTop(int top, const std::string& share_name) {
-  const Entry root = tree_.Root();
   const std::optional<Found> found = Look(top, "");
   std::optional<Document> document;
   if (found) document = Describe(top, 0, *found);
   if (!document) return false;
-  document->name = share_name;
-  if (root.document == 0) {
-    tree_.AddRoot(*document, found->KeptStamp());
-  } else if (root.stamp != found->stamp || root.name != share_name) {
-    tree_.UpdateRoot(*document, found->KeptStamp());
-  } else {
+  const Entry root = tree_.Root();
+  if (root.stamp == found->stamp && root.name == share_name) {
     ++tree_.Counted().unchanged;
+  } else {
+    document->name = share_name;
+    tree_.SetRoot(*document, found->KeptStamp());
   }
   return true;
 }
 
-MetFolders Updater::Update(int dir_fd, const FolderHandle& folder,
-                           std::vector<Difference> differences) {
-  MetFolders met;
+std::vector<Found> Updater::Update(int dir_fd, const FolderHandle& folder,
+                                   std::vector<Difference> differences) {
+  std::vector<Found> new_folders;
   // What is in the list is dealt with first: later steps move entries about, and may commit.
-  MatchRenames(dir_fd, *folder, differences, met.renamed);
+  MatchRenames(dir_fd, *folder, differences);
   std::erase_if(differences,
                 [&](const Difference& one) { return UpdateEntry(dir_fd, *folder, one); });
   folder->Merge();
   for (const Difference& difference : differences) {
     if (stop_) break;
     if (difference.found->IsFolder()) {
-      met.unknown.push_back(*difference.found);
+      new_folders.push_back(*difference.found);
     } else {
       Submit(dir_fd, folder, *difference.found);
     }
   }
-  return met;
+  return new_folders;
 }
 
 /// Files and folders that have but another name in the same folder.
-void Updater::MatchRenames(int dir_fd, Folder& folder, std::vector<Difference>& differences,
-                           std::vector<std::string>& renamed) {
+void Updater::MatchRenames(int dir_fd, Folder& folder, std::vector<Difference>& differences) {
   std::unordered_map<std::uint64_t, Entry*> gone;
   for (const Difference& difference : differences) {
-    if (difference.found) continue;
-    Entry& entry = folder.entries[difference.entry];
-    gone.emplace(entry.stamp.inode, &entry);
+    if (!difference.found) gone.emplace(difference.entry->stamp.inode, difference.entry);
   }
   if (gone.empty()) return;
   for (Difference& difference : differences) {
-    if (difference.entry != Difference::kNone) continue;
+    if (difference.entry) continue;
     const Found& found = *difference.found;
     const auto match = gone.find(found.stamp.inode);
     if (match == gone.end() || !SameContent(*match->second, found)) continue;
-    Entry& entry = *match->second;
-    Entry moved = entry;
+    Entry moved = *match->second;
     if (!Refresh(dir_fd, folder, moved, found)) continue;
-    if (found.IsFolder()) renamed.push_back(moved.name);
     folder.Add(std::move(moved));
+    match->second->document = 0;
     gone.erase(match);
-    entry.document = 0;
     difference.found = nullptr;
   }
 }
 
 /// True when that was all there is to do.
 bool Updater::UpdateEntry(int dir_fd, Folder& folder, const Difference& difference) {
-  if (difference.entry == Difference::kNone) return !difference.found;
-  Entry& entry = folder.entries[difference.entry];
-  if (entry.document == 0) return true;
-  if (const Found* found = difference.found) {
-    if (!SameContent(entry, *found)) return false;
-    Refresh(dir_fd, folder, entry, *found);
+  Entry* const entry = difference.entry;
+  const Found* const found = difference.found;
+  if (!entry) return !found;
+  if (entry->document == 0) return true;
+  if (found) {
+    if (!SameContent(*entry, *found)) return false;
+    Refresh(dir_fd, folder, *entry, *found);
     return true;
   }
-  if (entry.directory != 0) {
-    moves_.AddOrphan(folder, entry);
+  if (entry->directory != 0) {
+    moves_.AddOrphan(folder, *entry);
   } else {
-    tree_.RemoveFile(folder, entry);
+    tree_.RemoveFile(folder, *entry);
   }
-  entry.document = 0;
   return true;
 }
 

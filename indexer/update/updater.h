@@ -6,17 +6,10 @@
 #include <vector>
 
 #include "indexer/update/compare.h"
-#include "indexer/update/lane.h"
 #include "indexer/update/moves.h"
+#include "indexer/update/workers.h"
 
 namespace maru::indexer {
-
-/// Folders that an update of the one above has met.
-struct MetFolders {
-  std::vector<Found> unknown;
-  /// Known ones that have another name now.
-  std::vector<std::string> renamed;
-};
 
 /// Brings folders of a tree up to date with what lies on the disk, one by one; which, and when, is
 /// for a walk to say. What has the same stamp as before is left alone unopened; new rights, names
@@ -34,9 +27,10 @@ class Updater {
 
   /// The row of the share's own folder. False when it cannot be examined.
   bool UpdateTop(int top, const std::string& share_name);
-  /// Makes good the differences in one open folder, but for the new folders in it: they are for the
-  /// caller to take in or to let wait.
-  MetFolders Update(int dir_fd, const FolderHandle& folder, std::vector<Difference> differences);
+  /// Makes good the differences in one open folder, but for the new folders in it: these it
+  /// returns, for the caller to take in or to let wait.
+  std::vector<Found> Update(int dir_fd, const FolderHandle& folder,
+                            std::vector<Difference> differences);
 
   /// Takes a new folder from where it is known to be gone. False when it is gone nowhere.
   bool Adopt(int dir_fd, Folder& folder, const Found& found);
@@ -52,8 +46,7 @@ class Updater {
   void NoteUnreadable(const std::string& path);
 
  private:
-  void MatchRenames(int dir_fd, Folder& folder, std::vector<Difference>& differences,
-                    std::vector<std::string>& renamed);
+  void MatchRenames(int dir_fd, Folder& folder, std::vector<Difference>& differences);
   bool UpdateEntry(int dir_fd, Folder& folder, const Difference& difference);
   bool Refresh(int dir_fd, Folder& folder, index::Entry& entry, const Found& found);
   void Submit(int dir_fd, const FolderHandle& folder, const Found& found);

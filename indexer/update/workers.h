@@ -4,6 +4,7 @@
 #include <cstddef>
 #include <deque>
 #include <mutex>
+#include <optional>
 #include <string>
 #include <thread>
 #include <vector>
@@ -30,25 +31,20 @@ struct Job {
 };
 
 struct Result {
-  FolderHandle folder;
+  /// Without file and document.
+  Job job;
   std::string name;
-  index::Stamp stamp;
   index::Prepared prepared;
   /// It has text, but that could not be got.
   bool failed = false;
   std::uint64_t bytes_read = 0;
-  std::size_t cost = 0;
 };
 
-/// The threads; one extractor process each. Shared by all lanes.
+/// The threads; one extractor process each. Shared by all lanes, which are gone before it.
 class Workers {
  public:
   /// `max_text`: bytes of text that are indexed of a file.
   Workers(extract::Processes& processes, std::size_t max_text);
-  /// Lanes are gone by then.
-  ~Workers();
-  Workers(const Workers&) = delete;
-  Workers& operator=(const Workers&) = delete;
 
   std::size_t MaxText() const { return max_text_; }
   /// The lane gets the result.
@@ -60,17 +56,50 @@ class Workers {
     Job job;
   };
 
-  void Run(unsigned slot);
+  void Run(const std::stop_token& closing, unsigned slot);
   Result Work(unsigned slot, Job job);
   bool TakeText(unsigned slot, Job& job, std::uint64_t& bytes_read);
 
   extract::Processes& processes_;
   const std::size_t max_text_;
   std::mutex mutex_;
-  std::condition_variable work_;
+  std::condition_variable_any work_;
   std::deque<Item> queue_;
-  bool closing_ = false;
-  std::vector<std::thread> threads_;
+  std::vector<std::jthread> threads_;
+};
+
+/// One tree's way to the workers and back. What is under way is bounded, so that no queue grows.
+/// One thread, but for Deliver; throws as the tree does.
+class Lane {
+ public:
+  Lane(Workers& workers, Tree& tree) : workers_(workers), tree_(tree) {}
+  /// Waits for what is under way and drops it.
+  ~Lane();
+  Lane(const Lane&) = delete;
+  Lane& operator=(const Lane&) = delete;
+
+  /// Waits until there is room. A file must not be submitted again while it is under way.
+  void Submit(Job job);
+  /// Puts what is finished into the tree.
+  void Collect();
+  /// The same with all that is under way.
+  void Finish();
+
+  /// Hands over a result; any thread.
+  void Deliver(Result result);
+
+ private:
+  bool HasRoom() const;
+  std::optional<Result> Take(bool wait);
+  void Put(Result result);
+
+  Workers& workers_;
+  Tree& tree_;
+  std::size_t under_way_ = 0;
+  std::size_t cost_ = 0;
+  std::mutex mutex_;
+  std::condition_variable finished_;
+  std::deque<Result> results_;
 };
 
 }  // namespace maru::indexer
