@@ -122,9 +122,9 @@ UNSEEN = re.compile(r"<(script|style)\b.*?</\1>|<[^>]*>", re.S)
 WORD = re.compile(r"\b[a-z]{3,14}\b")
 
 
-def queries(folder, steps=10):
-    """The 30 queries of a corpus, out of its own words as people see them: 5 rare, 5 medium and 5 common
-    words, 5 pairs, 4 threes, 6 prefixes."""
+def words_of(folder, steps=10):
+    """Words of a sample of a corpus, as people see them, with the number of its documents that have each;
+    and the size of the sample."""
     documents = {}
     paths = sorted(path for path in folder.rglob("*") if path.is_file() and not path.is_symlink())
     sample = paths[::max(1, min(steps, len(paths) // 200))]
@@ -134,10 +134,24 @@ def queries(folder, steps=10):
             text = UNSEEN.sub(" ", text)
         for word in set(WORD.findall(text)):
             documents[word] = documents.get(word, 0) + 1
+    return documents, len(sample)
+
+
+def distinct(folder, count=600):
+    """So many words of a corpus, no two alike, of all frequencies."""
+    documents, _ = words_of(folder)
+    some = sorted(documents, key=lambda word: (documents[word], word))
+    return some[::max(1, len(some) // count)][:count]
+
+
+def queries(folder):
+    """The 30 queries of a corpus, out of its own words: 5 rare, 5 medium and 5 common words, 5 pairs,
+    4 threes, 6 prefixes."""
+    documents, sample = words_of(folder)
 
     def pick(low, high, count):
         some = sorted(word for word, number in documents.items()
-                      if low * len(sample) <= number <= high * len(sample) and number > 1)
+                      if low * sample <= number <= high * sample and number > 1)
         some = some or sorted(documents)
         return [some[i * (len(some) - 1) // max(count - 1, 1)] for i in range(count)]
 

@@ -9,6 +9,7 @@ import concurrent.futures
 import json
 import os
 import pathlib
+import shutil
 import sqlite3
 import statistics
 import subprocess
@@ -215,6 +216,44 @@ class Roads:
             figures["uncached"] = statistics.median(
                 first_answer() for _ in range(self.options["runs"]))
         return figures
+
+    def distinct(self):
+        """Words asked once each."""
+        return self.system.load([road.search_request(words) for words in self.options["distinct"]])
+
+    def changes(self):
+        """The same searches while nothing changes, and while four files a second do."""
+        # The sandbox gives the corpus to read only; what is written there goes with the road.
+        subprocess.run(["mount", "-o", "remount,bind,rw", self.system.folder], check=True)
+        self.system.services.start("maruindexd", lambda: True)
+        folder = self.system.folder / "changing"
+        folder.mkdir(exist_ok=True)
+        words = " ".join(self.queries)
+        over = threading.Event()
+
+        def change():
+            number = 0
+            while not over.wait(0.25):
+                number += 1
+                (folder / f"{number % 40}.txt").write_text(f"{number} {words}", encoding="utf-8")
+
+        quiet, busy = [], []
+        try:
+            time.sleep(2)
+            for _ in range(self.options["runs"]):
+                quiet.append(self.system.load(self.bodies(), rounds=self.options["rounds"]))
+                over.clear()
+                writer = threading.Thread(target=change)
+                writer.start()
+                busy.append(self.system.load(self.bodies(), rounds=self.options["rounds"]))
+                over.set()
+                writer.join()
+                time.sleep(2)
+        finally:
+            over.set()
+            self.system.services.stop("maruindexd")
+            shutil.rmtree(folder)
+        return {"quiet": median_of(quiet), "busy": median_of(busy)}
 
     def memory(self):
         """Of every group of processes, the indexer that follows changes among them, in MB."""

@@ -105,6 +105,14 @@ def other_rows(results):
         if "cold" in figures:
             for how, seconds in figures["cold"].items():
                 rows.append([f"{name}: start to first answer, {how}, s", number(seconds)])
+        distinct = figures.get("distinct")
+        if distinct:
+            rows.append([f"{name}: words asked once each, p50 / p95, us",
+                         f"{number(distinct['p50'])} / {number(distinct['p95'])}"])
+        changes = figures.get("changes")
+        if changes:
+            rows.append([f"{name}: p50 while four files a second change against quiet",
+                         ratio(changes["busy"]["p50"], changes["quiet"]["p50"])])
         memory = figures.get("memory")
         if memory:
             for when, used in (("at rest", memory["rest"]), ("under load", memory["load"])):
