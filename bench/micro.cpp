@@ -64,14 +64,15 @@ void PrepareDocument(benchmark::State& state) {
 BENCHMARK(PrepareDocument);
 
 void MatchWords(benchmark::State& state) {
-  const WordFinder finder({{"", {"berth", "berths"}, false}, {"", {"tide", "is", "out"}, true}});
+  const WordFinder finder(
+      {{"", {"berth", "berths"}}, {"", {"tide", "is", "out"}, MarkGroup::Kind::kPhrase}});
   for (auto _ : state) benchmark::DoNotOptimize(finder.MatchesIn(Text()));
   Bytes(state);
 }
 BENCHMARK(MatchWords);
 
 void BestFragments(benchmark::State& state) {
-  const WordFinder finder({{"", {"berth"}, false}, {"", {"tide"}, false}});
+  const WordFinder finder({{"", {"berth"}}, {"", {"tide"}}});
   const std::vector<Match> matches = finder.MatchesIn(Text());
   for (auto _ : state) {
     for (const Window& window : BestWindows(Text(), matches, {"", 100, 3})) {

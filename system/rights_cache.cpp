@@ -5,8 +5,7 @@
 
 namespace maru {
 
-bool RightsCache::Read(int directory, const char* path, FileRights& rights) {
-  struct stat status;
+bool RightsCache::Read(int directory, const char* path, FileRights& rights, struct stat& status) {
   if (fstatat(directory, path, &status, AT_SYMLINK_NOFOLLOW | AT_EMPTY_PATH) != 0) return false;
   if (Find(status, rights.acl)) {
     rights.TakeMode(status);

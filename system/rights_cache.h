@@ -19,8 +19,8 @@ class RightsCache {
   explicit RightsCache(time_t settled_seconds = 3) : settled_seconds_(settled_seconds) {}
 
   /// As ReadFileRights, and as true: owner and mode are read each time, the ACL when the file has
-  /// changed.
-  bool Read(int directory, const char* path, FileRights& rights);
+  /// changed. `status` is the file's.
+  bool Read(int directory, const char* path, FileRights& rights, struct stat& status);
 
  private:
   /// About 2 MB.

@@ -106,7 +106,8 @@ SearchRequest ReadSearch(const Request& request) {
 void AddBoosts(const Request& request, const Scope& scope, index::View& view,
                index::SearchOptions& options) {
   const std::vector<std::string> ids = scope.Ids();
-  for (const OpenedFile& file : request.core.usage.Strongest(request.caller.uid, ids)) {
+  for (const OpenedFile& file : request.core.usage.OpenedBy(request.caller.uid, ids)) {
+    if (options.boosts.size() == UsageStore::kMaxBoosted) break;
     const auto share =
         static_cast<std::size_t>(std::ranges::find(ids, file.index_id) - ids.begin());
     const auto hit = view.Find(share, file.document);

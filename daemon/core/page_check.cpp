@@ -24,15 +24,16 @@ class Walk {
  public:
   Walk(const Identity& who, const ShareSettings& share) : who_(who) {
     UniqueFd root(open(share.path.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
-    const bool open_to_them = root && Allows(root.Get(), "", kACLExecute);
+    const bool open_to_them = root && Passable(root.Get());
     way_.push_back({{}, std::move(root), open_to_them});
   }
 
-  bool Readable(std::string_view path) {
+  bool Readable(const index::Hit& hit) {
+    const std::string_view path = hit.path;
     const std::size_t slash = path.rfind('/');
-    if (slash == std::string_view::npos) return Allows(way_[0].folder.Get(), "", kACLRead);
+    if (slash == std::string_view::npos) return Readable(way_[0].folder.Get(), "", hit.record);
     if (!Enter(path.substr(0, slash))) return false;
-    return Allows(way_.back().folder.Get(), std::string(path.substr(slash + 1)), kACLRead);
+    return Readable(way_.back().folder.Get(), std::string(path.substr(slash + 1)), hit.record);
   }
 
  private:
@@ -43,13 +44,24 @@ class Walk {
     bool passable;
   };
 
-  bool Allows(int folder, const std::string& name, int wanted) const {
+  /// What they may do with a file, and what it is; nothing when it cannot be examined.
+  int Bits(int folder, const std::string& name, struct stat& status) const {
     if (who_.unrestricted) {
-      struct stat status;
-      return fstatat(folder, name.c_str(), &status, AT_SYMLINK_NOFOLLOW | AT_EMPTY_PATH) == 0;
+      const int flags = AT_SYMLINK_NOFOLLOW | AT_EMPTY_PATH;
+      return fstatat(folder, name.c_str(), &status, flags) == 0 ? kACLRead | kACLExecute : 0;
     }
     FileRights rights;
-    return known_rights.Read(folder, name.c_str(), rights) && (RightsOf(who_, rights) & wanted);
+    return known_rights.Read(folder, name.c_str(), rights, status) ? RightsOf(who_, rights) : 0;
+  }
+  bool Passable(int folder) const {
+    struct stat status;
+    return Bits(folder, "", status) & kACLExecute;
+  }
+  /// Another file in its place has a text of its own.
+  bool Readable(int folder, const std::string& name, const index::Record& record) const {
+    struct stat status;
+    return (Bits(folder, name, status) & kACLRead) && status.st_ino == record.inode &&
+           (record.is_dir ? S_ISDIR(status.st_mode) : S_ISREG(status.st_mode));
   }
 
   /// Makes the folder ("/a/b") the present one: steps that the way has in common with it stay, the
@@ -74,7 +86,7 @@ class Walk {
     if (!from.passable) return false;
     UniqueFd folder(
         openat(from.folder.Get(), name.c_str(), O_PATH | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
-    const bool passable = folder && Allows(folder.Get(), "", kACLExecute);
+    const bool passable = folder && Passable(folder.Get());
     way_.push_back({name, std::move(folder), passable});
     return passable;
   }
@@ -97,7 +109,7 @@ std::vector<bool> ReadableNow(const Scope& scope, const std::vector<index::Hit>&
     const std::size_t share = hits[order[i]].share;
     Walk walk(scope.eyes.identity, *scope.indices[share].share);
     for (; i < order.size() && hits[order[i]].share == share; ++i) {
-      readable[order[i]] = walk.Readable(hits[order[i]].path);
+      readable[order[i]] = walk.Readable(hits[order[i]]);
     }
   }
   return readable;

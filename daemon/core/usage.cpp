@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cmath>
 #include <ctime>
+#include <functional>
 #include <set>
 
 #include "common/error.h"
@@ -12,11 +13,8 @@
 namespace maru::daemon {
 namespace {
 
-/// The row of all users together; (uid_t)-1 is nobody's id.
-constexpr std::int64_t kEverybody = 4294967295;
-
-/// What others' openings must come to for half of their boost.
-constexpr double kOthersHalf = 4;
+/// Of this id, which is nobody's, earlier versions kept rows: all users' together.
+constexpr long long kEverybody = 4294967295;
 
 constexpr const char* kSchema =
     "CREATE TABLE IF NOT EXISTS opened ("
@@ -26,12 +24,6 @@ constexpr const char* kSchema =
 
 std::string_view FolderOf(std::string_view path) {
   return path.substr(0, path.rfind('/'));
-}
-
-double Boost(double own, double others) {
-  others = std::max(others, 0.0);
-  return UsageStore::kOwnBoost * own / (1 + own) +
-         UsageStore::kOthersBoost * others / (kOthersHalf + others);
 }
 
 maruseeker::Error StoreFailed(const char* why) {
@@ -53,6 +45,7 @@ UsageStore::UsageStore(const std::string& path, Clock clock)
   try {
     session_ = std::make_unique<marudbquery::Session>("sqlite3://" + path, kSchema);
     session_->Open() << "PRAGMA synchronous = NORMAL";
+    session_->Open() << "DELETE FROM opened WHERE uid = :u", soci::use(kEverybody);
     Load();
   } catch (const std::exception& error) {
     MARU_LOG("Opened files are not remembered: %s: %s", path.c_str(), error.what());
@@ -74,7 +67,8 @@ void UsageStore::Load() {
        soci::into(count), soci::into(weight), soci::into(time));
   rows.execute();
   while (rows.fetch()) {
-    files_[uid][{index_id, static_cast<index::DocumentId>(document)}] = {path, count, weight, time};
+    files_[static_cast<uid_t>(uid)][{index_id, static_cast<index::DocumentId>(document)}] = {
+        path, count, weight, time};
   }
 }
 
@@ -83,34 +77,33 @@ double UsageStore::Faded(const Row& row, std::int64_t now) const {
   return row.weight * std::exp2(-age / static_cast<double>(kHalfLife));
 }
 
-void UsageStore::StoreRow(std::int64_t owner, const Key& key, const Row& row) {
-  const long long uid = owner, document = key.second, count = row.count, time = row.time;
+void UsageStore::StoreRow(uid_t user, const Key& key, const Row& row) {
+  const long long uid = user, document = key.second, count = row.count, time = row.time;
   session_->Open() << "INSERT OR REPLACE INTO opened (uid, index_id, document, path, count, "
                       "weight, time) VALUES (:u, :i, :d, :p, :c, :w, :t)",
       soci::use(uid), soci::use(key.first), soci::use(document), soci::use(row.path),
       soci::use(count), soci::use(row.weight), soci::use(time);
 }
 
-void UsageStore::DeleteRow(std::int64_t owner, const Key& key) {
-  const long long uid = owner, document = key.second;
+void UsageStore::DeleteRow(uid_t user, const Key& key) {
+  const long long uid = user, document = key.second;
   session_->Open() << "DELETE FROM opened WHERE uid = :u AND index_id = :i AND document = :d",
       soci::use(uid), soci::use(key.first), soci::use(document);
 }
 
-void UsageStore::Add(std::int64_t owner, std::size_t most, const Key& key,
-                     const std::string& path) {
+void UsageStore::Add(uid_t uid, const Key& key, const std::string& path) {
   const std::int64_t now = clock_();
-  Files& files = files_[owner];
-  if (!files.contains(key) && files.size() >= most) {
+  Files& files = files_[uid];
+  if (!files.contains(key) && files.size() >= kMaxFiles) {
     const auto weakest = std::min_element(files.begin(), files.end(), [&](auto& a, auto& b) {
       return Faded(a.second, now) < Faded(b.second, now);
     });
-    DeleteRow(owner, weakest->first);
+    DeleteRow(uid, weakest->first);
     files.erase(weakest);
   }
   Row row = files[key];
   row = {path, row.count + 1, Faded(row, now) + 1, now};
-  StoreRow(owner, key, row);
+  StoreRow(uid, key, row);
   files[key] = row;
 }
 
@@ -121,11 +114,9 @@ void UsageStore::ForgetOldestUser() {
     for (const auto& [key, row] : files) time = std::max(time, row.time);
     return time;
   };
-  const auto oldest =
-      std::min_element(files_.begin(), files_.end(), [&](const auto& a, const auto& b) {
-        if (a.first == kEverybody || b.first == kEverybody) return b.first == kEverybody;
-        return newest(a.second) < newest(b.second);
-      });
+  const auto oldest = std::min_element(
+      files_.begin(), files_.end(),
+      [&](const auto& a, const auto& b) { return newest(a.second) < newest(b.second); });
   const long long uid = oldest->first;
   session_->Open() << "DELETE FROM opened WHERE uid = :u", soci::use(uid);
   files_.erase(oldest);
@@ -138,60 +129,35 @@ void UsageStore::Record(uid_t uid, const std::string& index_id, index::DocumentI
   std::string why;
   const bool stored = session_->Transaction(
       [&] {
-        if (!files_.contains(uid) && files_.size() > kMaxUsers) ForgetOldestUser();
-        Add(uid, kMaxFiles, {index_id, document}, path);
-        Add(kEverybody, kMaxShared, {index_id, document}, path);
+        if (!files_.contains(uid) && files_.size() >= kMaxUsers) ForgetOldestUser();
+        Add(uid, {index_id, document}, path);
         return true;
       },
       why);
   if (!stored) throw StoreFailed(why.c_str());
 }
 
-const UsageStore::Files& UsageStore::FilesOf(std::int64_t owner) const {
-  static const Files none;
-  const auto found = files_.find(owner);
-  return found == files_.end() ? none : found->second;
-}
-
-std::vector<OpenedFile> UsageStore::Strongest(uid_t uid,
-                                              const std::vector<std::string>& index_ids) const {
-  const std::set<std::string_view> wanted(index_ids.begin(), index_ids.end());
-  struct Candidate {
-    double boost;
-    const Files::value_type* file;
-  };
-  std::vector<Candidate> candidates;
+std::vector<OpenedFile> UsageStore::OpenedBy(uid_t uid,
+                                             const std::vector<std::string>& index_ids) const {
+  std::vector<OpenedFile> opened;
   const std::lock_guard lock(mutex_);
+  const auto files = files_.find(uid);
+  if (files == files_.end()) return opened;
+  const std::set<std::string_view> wanted(index_ids.begin(), index_ids.end());
   const std::int64_t now = clock_();
-  const Files& own = FilesOf(uid);
-  const Files& all = FilesOf(kEverybody);
-  for (const auto& file : own) {
-    if (!wanted.contains(file.first.first)) continue;
-    const double weight = Faded(file.second, now);
-    const auto together = all.find(file.first);
-    const double others = together == all.end() ? 0 : Faded(together->second, now) - weight;
-    candidates.push_back({Boost(weight, others), &file});
+  for (const auto& [key, row] : files->second) {
+    if (!wanted.contains(key.first)) continue;
+    const double weight = Faded(row, now);
+    opened.push_back({key.first, key.second, row.path, weight / (1 + weight)});
   }
-  for (const auto& file : all) {
-    if (!wanted.contains(file.first.first) || own.contains(file.first)) continue;
-    candidates.push_back({Boost(0, Faded(file.second, now)), &file});
-  }
-  const std::size_t count = std::min(candidates.size(), kMaxStrongest);
-  std::partial_sort(candidates.begin(), candidates.begin() + static_cast<std::ptrdiff_t>(count),
-                    candidates.end(),
-                    [](const auto& a, const auto& b) { return a.boost > b.boost; });
-  std::vector<OpenedFile> strongest;
-  for (std::size_t i = 0; i < count; ++i) {
-    const auto& [key, row] = *candidates[i].file;
-    strongest.push_back({key.first, key.second, row.path, candidates[i].boost});
-  }
-  return strongest;
+  std::ranges::stable_sort(opened, std::greater(), &OpenedFile::boost);
+  return opened;
 }
 
 std::size_t UsageStore::Size() const {
   const std::lock_guard lock(mutex_);
   std::size_t rows = 0;
-  for (const auto& [owner, files] : files_) rows += files.size();
+  for (const auto& [uid, files] : files_) rows += files.size();
   return rows;
 }
 

@@ -33,22 +33,19 @@ struct OpenedFile {
 /// folder is as it was. (An index made anew gives its ids out again.)
 bool IsSameFile(std::string_view opened_path, std::string_view present_path);
 
-/// Who opened what, how often and when, fading with a half-life of kHalfLife. In memory for
+/// What each user opened, how often and when, fading with a half-life of kHalfLife; nobody's
+/// openings are told to others, whose files they may not be. In memory for
 /// searches and in a database of its own for restarts; each opening is stored before Record
 /// returns (written ahead, without waiting for the disk: lost at most by a failing machine).
 /// Thread-safe.
 class UsageStore {
  public:
   static constexpr std::int64_t kHalfLife = 30 * 24 * 3600;
-  /// Files remembered per user, of all users together, and users.
+  /// Files remembered per user, and users.
   static constexpr std::size_t kMaxFiles = 200;
-  static constexpr std::size_t kMaxShared = 1'000;
   static constexpr std::size_t kMaxUsers = 5'000;
-  /// Files that one search asks for.
-  static constexpr std::size_t kMaxStrongest = 32;
-  /// The boost of a file opened by many, and of one opened much by the user himself.
-  static constexpr double kOthersBoost = 0.15;
-  static constexpr double kOwnBoost = 1.0;
+  /// Files that one search boosts.
+  static constexpr std::size_t kMaxBoosted = 32;
 
   using Clock = std::function<std::int64_t()>;
 
@@ -61,9 +58,9 @@ class UsageStore {
   void Record(uid_t uid, const std::string& index_id, index::DocumentId document,
               const std::string& path);
 
-  /// The files of these indices with the highest boosts for this user, best first; at most
-  /// kMaxStrongest.
-  std::vector<OpenedFile> Strongest(uid_t uid, const std::vector<std::string>& index_ids) const;
+  /// The files of these indices that the user opened, the highest boost first: 0.5 for what was
+  /// opened once just now, never 1.
+  std::vector<OpenedFile> OpenedBy(uid_t uid, const std::vector<std::string>& index_ids) const;
 
   /// Rows kept, of everybody.
   std::size_t Size() const;
@@ -80,19 +77,18 @@ class UsageStore {
   using Files = std::map<Key, Row>;
 
   void Load();
-  void Add(std::int64_t owner, std::size_t most, const Key& key, const std::string& path);
+  void Add(uid_t uid, const Key& key, const std::string& path);
   void ForgetOldestUser();
-  void StoreRow(std::int64_t owner, const Key& key, const Row& row);
-  void DeleteRow(std::int64_t owner, const Key& key);
-  const Files& FilesOf(std::int64_t owner) const;
+  void StoreRow(uid_t uid, const Key& key, const Row& row);
+  void DeleteRow(uid_t uid, const Key& key);
   double Faded(const Row& row, std::int64_t now) const;
 
   Clock clock_;
   mutable std::mutex mutex_;
   /// Null when the database cannot be used.
   std::unique_ptr<marudbquery::Session> session_;
-  /// By user id; kEverybody for all together.
-  std::map<std::int64_t, Files> files_;
+  /// By user id.
+  std::map<uid_t, Files> files_;
 };
 
 }  // namespace maru::daemon

@@ -2,8 +2,6 @@
 
 #include <algorithm>
 
-#include "index/store/codec.h"
-
 namespace maru::index {
 namespace {
 
@@ -95,7 +93,7 @@ std::shared_ptr<const Eyes> Eyes::Of(const Reader& reader, const Identity& who) 
 std::shared_ptr<const BlockSet> Eyes::Seen(Reader& reader, DocumentId first,
                                            std::uint64_t wanted) const {
   const Snapshot& state = reader.State();
-  const std::string name = BigEndian32(number_) + BigEndian32(first);
+  const std::string name = Name() + BigEndian32(first);
   const auto advance = [&](const std::shared_ptr<const BlockSet>& old,
                            const CommitChanges& changes) {
     std::shared_ptr<BlockSet> seen;

@@ -2,10 +2,12 @@
 
 #include <atomic>
 #include <memory>
+#include <string>
 #include <vector>
 
 #include "index/search/bits.h"
 #include "index/search/reader.h"
+#include "index/store/codec.h"
 #include "index/store/directory_table.h"
 #include "system/rights.h"
 
@@ -25,6 +27,8 @@ class Eyes {
   /// Takes those that these eyes do not see out of the documents of the block from `first` on.
   void Screen(Reader& reader, DocumentId first, BlockSet& documents) const;
 
+  /// By which what is derived with them is kept: the same for all that see the same.
+  std::string Name() const { return BigEndian32(number_); }
   std::size_t Bytes() const { return (reachable_.size() + readable_.size()) / 8; }
 
  private:

@@ -80,20 +80,35 @@ class UnderNode : public FilterNode {
   const FolderSet& folder_;
 };
 
-/// Terms one behind the other by the positions that the engine has of them.
-class PositionsNode : public FilterNode {
- public:
-  PositionsNode(Reader& reader, const Plan& plan) : FilterNode(reader, true), terms_(plan.words) {}
+/// Looks into each of the documents that are seen: others could not be read, or tell by an error.
+class LookNode : public FilterNode {
+ protected:
+  explicit LookNode(Sight& share) : FilterNode(share.Source(), true), share_(share) {}
+
+  virtual bool Takes(DocumentId id) = 0;
 
  private:
   void Filter(const Target& target, DocumentId first, const BlockSet& asked,
               BlockSet& set) override {
-    ForEachBit(asked, [&](DocumentId offset) {
+    BlockSet seen = asked;
+    share_.Screen(first, seen);
+    ForEachBit(seen, [&](DocumentId offset) {
       if (++looks_ % kTextsBetweenPolls == 0) target.poll();
-      if (HasPhrase(first + offset)) SetBit(set, offset);
+      if (Takes(first + offset)) SetBit(set, offset);
     });
   }
-  bool HasPhrase(DocumentId id) const {
+
+  Sight& share_;
+  unsigned looks_ = 0;
+};
+
+/// Terms one behind the other by the positions that the engine has of them.
+class PositionsNode : public LookNode {
+ public:
+  PositionsNode(Sight& share, const Plan& plan) : LookNode(share), terms_(plan.words) {}
+
+ private:
+  bool Takes(DocumentId id) override {
     std::vector<Xapian::termpos> begins = PositionsOf(id, terms_[0]);
     for (std::size_t i = 1; i < terms_.size() && !begins.empty(); ++i) {
       const std::vector<Xapian::termpos> here = PositionsOf(id, terms_[i]);
@@ -110,27 +125,20 @@ class PositionsNode : public FilterNode {
   }
 
   const std::vector<std::string>& terms_;
-  unsigned looks_ = 0;
 };
 
 /// A phrase, looked for in the documents' stored texts.
-class TextNode : public FilterNode {
+class TextNode : public LookNode {
  public:
-  TextNode(Reader& reader, const Plan& plan) : FilterNode(reader, true), finder_(plan.words) {}
+  TextNode(Sight& share, const Plan& plan) : LookNode(share), finder_(plan.words) {}
 
  private:
-  void Filter(const Target& target, DocumentId first, const BlockSet& asked,
-              BlockSet& set) override {
-    ForEachBit(asked, [&](DocumentId offset) {
-      if (++looks_ % kTextsBetweenPolls == 0) target.poll();
-      const TextPlace place = reader_.ValueOf(kTexts, first + offset);
-      if (text_.Open(reader_.Texts(), place) && finder_.IsIn(text_)) SetBit(set, offset);
-    });
+  bool Takes(DocumentId id) override {
+    return text_.Open(reader_.Texts(), reader_.ValueOf(kTexts, id)) && finder_.IsIn(text_);
   }
 
   PhraseFinder finder_;
   StoredText text_;
-  unsigned looks_ = 0;
 };
 
 }  // namespace
@@ -145,12 +153,12 @@ NodePtr MakeUnder(Reader& reader, const FolderSet& folder) {
   return std::make_unique<UnderNode>(reader, folder);
 }
 
-NodePtr MakePositions(Reader& reader, const Plan& plan) {
-  return std::make_unique<PositionsNode>(reader, plan);
+NodePtr MakePositions(Sight& share, const Plan& plan) {
+  return std::make_unique<PositionsNode>(share, plan);
 }
 
-NodePtr MakeText(Reader& reader, const Plan& plan) {
-  return std::make_unique<TextNode>(reader, plan);
+NodePtr MakeText(Sight& share, const Plan& plan) {
+  return std::make_unique<TextNode>(share, plan);
 }
 
 }  // namespace maru::index

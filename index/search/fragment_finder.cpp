@@ -21,10 +21,13 @@ struct Found {
 FragmentFinder::FragmentFinder(std::vector<MarkGroup> groups)
     : groups_(std::move(groups)), words_(groups_) {
   for (MarkGroup& group : groups_) {
-    if (!group.phrase) std::sort(group.words.begin(), group.words.end());
-    phrases_.emplace_back(group.phrase ? group.words : std::vector<std::string>());
-    std::vector<std::uint64_t>& hashes = all_.emplace_back();
-    for (const std::string& word : group.words) hashes.push_back(HashWord(word));
+    const bool phrase = group.kind == MarkGroup::Kind::kPhrase;
+    if (!phrase) std::sort(group.words.begin(), group.words.end());
+    phrases_.emplace_back(phrase ? group.words : std::vector<std::string>());
+    auto& hashes = all_.emplace_back();
+    if (group.kind == MarkGroup::Kind::kPrefix) continue;
+    hashes.emplace();
+    for (const std::string& word : group.words) hashes->push_back(HashWord(word));
   }
 }
 
@@ -34,8 +37,9 @@ unsigned FragmentFinder::Promise(const StoredText& text, std::size_t chunk,
   unsigned promise = 0;
   for (std::size_t i = 0; i < groups_.size(); ++i) {
     const auto may_hold = [&](std::uint64_t hash) { return text.MayHold(chunk, hash); };
-    promise += groups_[i].phrase ? phrases_[i].MayBegin(text, chunk)
-                                 : std::any_of(present[i].begin(), present[i].end(), may_hold);
+    promise += groups_[i].kind == MarkGroup::Kind::kPhrase
+                   ? phrases_[i].MayBegin(text, chunk)
+                   : !present[i] || std::any_of(present[i]->begin(), present[i]->end(), may_hold);
   }
   return promise;
 }
@@ -59,7 +63,7 @@ std::vector<std::size_t> FragmentFinder::Promising(const StoredText& text,
 std::vector<Fragment> FragmentFinder::In(StoredText& text, const PresentWords& present,
                                          const FragmentOptions& options) {
   const auto groups = static_cast<std::size_t>(std::count_if(
-      present.begin(), present.end(), [](const auto& words) { return !words.empty(); }));
+      present.begin(), present.end(), [](const auto& words) { return !words || !words->empty(); }));
   std::vector<Found> found;
   std::size_t matching = 0;
   for (const std::size_t chunk : Promising(text, present)) {

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstdint>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -12,8 +13,8 @@
 namespace maru::index {
 
 /// Of each group, in their order, the hashes of its words that a document may have. None: it has
-/// nothing of the group.
-using PresentWords = std::vector<std::vector<std::uint64_t>>;
+/// nothing of the group. Not told, as of all words that begin with a prefix: it may have any.
+using PresentWords = std::vector<std::optional<std::vector<std::uint64_t>>>;
 
 /// Finds fragments for one query in one field, in text after text. One thread.
 class FragmentFinder {

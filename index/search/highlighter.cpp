@@ -6,12 +6,11 @@
 #include "index/search/view.h"
 #include "index/search/view_state.h"
 #include "index/store/fields.h"
+#include "index/text/signature.h"
 
 namespace maru::index {
 namespace {
 
-/// Texts of so few chunks are looked through faster than the index.
-constexpr std::size_t kFewChunks = 4;
 /// Of more words, a document's list of terms tells sooner than theirs of documents.
 constexpr std::size_t kFewWords = 16;
 
@@ -25,38 +24,54 @@ bool HasTerm(const Reader& reader, DocumentId document, const std::string& term)
   return at != end && *at == document;
 }
 
-/// Those of `terms`, which ascend, that a document has.
-std::vector<bool> HasTerms(const Reader& reader, DocumentId document,
-                           const std::vector<std::string>& terms) {
-  std::vector<bool> has;
-  if (terms.size() <= kFewWords) {
-    for (const std::string& term : terms) has.push_back(HasTerm(reader, document, term));
+/// The words that a document has of a word and its other forms, which ascend.
+std::vector<std::string> WordsOf(const Reader& reader, DocumentId document,
+                                 const std::vector<std::string>& words) {
+  const std::string_view prefix = FindField(kText)->prefix;
+  std::vector<std::string> has;
+  if (words.size() <= kFewWords) {
+    for (const std::string& word : words) {
+      if (HasTerm(reader, document, TermOf(prefix, word))) has.push_back(word);
+    }
     return has;
   }
   auto at = reader.Database().termlist_begin(document);
   const auto end = reader.Database().termlist_end(document);
-  for (const std::string& term : terms) {
+  for (const std::string& word : words) {
+    const std::string term = TermOf(prefix, word);
     if (at != end) at.skip_to(term);
-    has.push_back(at != end && *at == term);
+    if (at != end && *at == term) has.push_back(word);
   }
   return has;
 }
 
+/// Those of a document's words that begin with another.
+std::vector<std::string> WordsBeginningWith(const Reader& reader, DocumentId document,
+                                            const std::string& word) {
+  const std::string_view prefix = FindField(kText)->prefix;
+  const std::string begin = TermOf(prefix, word);
+  std::vector<std::string> words;
+  auto at = reader.Database().termlist_begin(document);
+  const auto end = reader.Database().termlist_end(document);
+  if (at != end) at.skip_to(begin);
+  for (; at != end && (*at).starts_with(begin); ++at) {
+    words.push_back((*at).substr(prefix.size()));
+  }
+  return words;
+}
+
 /// Which words of the groups a document has; of phrases: all.
 PresentWords WordsIn(const Reader& reader, DocumentId document, const FragmentFinder& finder) {
-  const std::string prefix(FindField(kText)->prefix);
   PresentWords present = finder.AllWords();
   for (std::size_t i = 0; i < present.size(); ++i) {
     const MarkGroup& group = finder.Groups()[i];
-    if (group.phrase || group.words.size() == 1) continue;
-    std::vector<std::string> terms;
-    for (const std::string& word : group.words) terms.push_back(prefix + word);
-    const std::vector<bool> has = HasTerms(reader, document, terms);
-    std::vector<std::uint64_t> there;
-    for (std::size_t word = 0; word < has.size(); ++word) {
-      if (has[word]) there.push_back(present[i][word]);
+    const bool prefix = group.kind == MarkGroup::Kind::kPrefix;
+    if (group.kind == MarkGroup::Kind::kPhrase) continue;
+    present[i].emplace();
+    for (const std::string& word : prefix ? WordsBeginningWith(reader, document, group.words[0])
+                                          : WordsOf(reader, document, group.words)) {
+      present[i]->push_back(HashWord(word));
     }
-    present[i] = std::move(there);
   }
   return present;
 }
@@ -82,7 +97,7 @@ struct Highlighter::State {
   FragmentFinder& FinderOf(const std::string& field) {
     const auto known = finders.find(field);
     if (known != finders.end()) return known->second;
-    auto groups = Planner(view.Readers(), view.Ids()).MarksOf(query);
+    auto groups = Planner(view.Sights(), view.Ids()).MarksOf(query);
     std::erase_if(groups, [&](const MarkGroup& group) { return group.field != field; });
     return finders.emplace(field, FragmentFinder(std::move(groups))).first->second;
   }
@@ -102,10 +117,10 @@ std::vector<Fragment> Highlighter::FragmentsOf(const Hit& hit, const FragmentOpt
     FragmentFinder& finder = state_->FinderOf(options.field);
     if (finder.Groups().empty()) return {};
     if (options.field != kText) return finder.Whole(ShownText(hit.record, options.field));
-    const Reader& reader = view.At(hit.share);
+    const Reader& reader = view.At(hit.share).Source();
     StoredText& text = state_->text;
     if (!text.Open(reader.Texts(), hit.text)) return {};
-    const bool many = text.Chunks() > kFewChunks;
+    const bool many = text.Chunks() > 1;
     return finder.In(text, many ? WordsIn(reader, hit.document, finder) : finder.AllWords(),
                      options);
   });

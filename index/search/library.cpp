@@ -56,19 +56,17 @@ View::State::~State() {
 
 void View::State::Open() {
   handles_.reserve(shares_.size());
-  readers_.reserve(shares_.size());
+  sights_.reserve(shares_.size());
   for (const auto& share : shares_) {
     const Share::Handle& handle = handles_.emplace_back(share->Take());
-    readers_.emplace_back(handle.snapshot, handle.database, share->Texts());
-    reader_pointers_.push_back(&readers_.back());
-    eyes_.push_back(who_.unrestricted ? nullptr : Eyes::Of(readers_.back(), who_));
+    Reader reader(handle.snapshot, handle.database, share->Texts());
+    auto eyes = who_.unrestricted ? nullptr : Eyes::Of(reader, who_);
+    sights_.emplace_back(std::move(reader), std::move(eyes), [this] { PollCancelled(); });
   }
 }
 
 void View::State::GiveBack() {
-  eyes_.clear();
-  reader_pointers_.clear();
-  readers_.clear();
+  sights_.clear();
   for (std::size_t share = 0; share < handles_.size(); ++share) {
     shares_[share]->GiveBack(std::move(handles_[share]));
   }

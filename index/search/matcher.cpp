@@ -11,9 +11,8 @@ constexpr std::uint64_t kManyMatches = 16;
 
 class Builder {
  public:
-  Builder(Reader& reader, std::size_t share, const Scorer* scorer,
-          const std::function<void()>& poll)
-      : reader_(reader), share_(share), scorer_(scorer), poll_(poll) {}
+  Builder(Sight& share, std::size_t number, const Scorer* scorer)
+      : share_(share), reader_(share.Source()), number_(number), scorer_(scorer) {}
 
   /// `factor` is what the weights of the plan's parts are multiplied with; at 0 they have none.
   NodePtr Build(const Plan& plan, double factor) const {
@@ -24,17 +23,18 @@ class Builder {
       case Plan::Kind::kEverything:
         return MakeTerm(reader_, {}, 0);
       case Plan::Kind::kTerm:
-        poll_();
-        return MakeTerm(reader_, plan.term,
-                        scorer_ && factor != 0 ? factor * scorer_->WeightOf(plan.term) : 0);
+        share_.Poll();
+        return MakeTerm(reader_, plan.term, WeightOf(plan, factor));
+      case Plan::Kind::kPrefix:
+        return MakePrefix(share_, plan.term, WeightOf(plan, factor));
       case Plan::Kind::kPositions:
-        return MakePositions(reader_, plan);
+        return MakePositions(share_, plan);
       case Plan::Kind::kTextPhrase:
-        return MakeText(reader_, plan);
+        return MakeText(share_, plan);
       case Plan::Kind::kRange:
         return MakeRange(reader_, plan);
       case Plan::Kind::kUnder:
-        return MakeUnder(reader_, plan.under.at(share_));
+        return MakeUnder(reader_, plan.under.at(number_));
       case Plan::Kind::kOr:
         return Any(plan.parts, factor);
       case Plan::Kind::kAnd:
@@ -49,10 +49,15 @@ class Builder {
   }
 
  private:
+  double WeightOf(const Plan& plan, double factor) const {
+    if (!scorer_ || factor == 0) return 0;
+    return factor * scorer_->WeightOf(plan.term, plan.kind == Plan::Kind::kPrefix);
+  }
   NodePtr Any(std::span<const Plan> plans, double factor) const {
     std::vector<NodePtr> parts, mixed;
     for (const Plan& plan : plans) {
-      const bool simple = plan.kind == Plan::Kind::kTerm || plan.kind == Plan::Kind::kOr;
+      const bool simple = plan.kind == Plan::Kind::kTerm || plan.kind == Plan::Kind::kPrefix ||
+                          plan.kind == Plan::Kind::kOr;
       (simple || factor == 0 ? parts : mixed).push_back(Build(plan, factor));
     }
     return MakeOr(std::move(parts), std::move(mixed));
@@ -63,21 +68,19 @@ class Builder {
     return parts.empty() ? MakeOr({}, {}) : MakeAnd(std::move(parts));
   }
 
+  Sight& share_;
   Reader& reader_;
-  const std::size_t share_;
+  const std::size_t number_;
   const Scorer* scorer_;
-  const std::function<void()>& poll_;
 };
 
 }  // namespace
 
-Matcher::Matcher(Reader& reader, std::size_t share, const Plan& plan, const Scorer* scorer,
-                 const std::function<void()>& poll)
-    : reader_(reader),
+Matcher::Matcher(Sight& share, std::size_t number, const Plan& plan, const Scorer* scorer)
+    : share_(share),
       scorer_(scorer),
-      poll_(poll),
-      root_(Builder(reader, share, scorer, poll).Build(plan, 1)),
-      last_(reader.State().LastDocument()),
+      root_(Builder(share, number, scorer).Build(plan, 1)),
+      last_(share.State().LastDocument()),
       per_block_(root_->Most() * kBlockDocuments / (last_ + 1ull)) {
   if (scorer && root_->Most() > last_) against_.resize(kBlockDocuments);
 }
@@ -85,20 +88,20 @@ Matcher::Matcher(Reader& reader, std::size_t share, const Plan& plan, const Scor
 bool Matcher::Next(MatchBlock& block) {
   const DocumentId bound = std::max(root_->Bound(), next_);
   if (bound > last_) return false;
-  poll_();
+  share_.Poll();
   block.Begin(bound / kBlockDocuments * kBlockDocuments);
   next_ = block.first + kBlockDocuments;
   std::shared_ptr<const ColumnBlock<std::uint32_t>> lengths;
   if (scorer_) {
     const bool many = per_block_ >= kManyMatches || !against_.empty();
-    lengths = reader_.Block(LengthColumn(), block.first, many ? kBlockPrice : 0);
+    lengths = share_.Source().Block(LengthColumn(), block.first, many ? kBlockPrice : 0);
   }
   if (!against_.empty()) {
     std::transform(lengths->begin(), lengths->end(), against_.begin(),
                    [&](std::uint32_t length) { return scorer_->Against(length); });
   }
   root_->Add({block, scorer_, lengths ? lengths->data() : nullptr,
-              against_.empty() ? nullptr : against_.data(), poll_},
+              against_.empty() ? nullptr : against_.data(), share_.Poller()},
              nullptr, block.matches);
   return true;
 }

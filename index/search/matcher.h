@@ -12,18 +12,16 @@ namespace maru::index {
 /// at every one, so the weights are had on the way. One thread.
 class Matcher {
  public:
-  /// `share` is the reader's number in the plan. Without `scorer` all weights are 0. `poll` is
-  /// called now and then and may throw. All outlive this object.
-  Matcher(Reader& reader, std::size_t share, const Plan& plan, const Scorer* scorer,
-          const std::function<void()>& poll);
+  /// `number` is the share's in the plan. Without `scorer` all weights are 0. All
+  /// outlive this object.
+  Matcher(Sight& share, std::size_t number, const Plan& plan, const Scorer* scorer);
 
   /// Fills in the next block that may have matches; false when there are no more.
   bool Next(MatchBlock& block);
 
  private:
-  Reader& reader_;
+  Sight& share_;
   const Scorer* scorer_;
-  const std::function<void()>& poll_;
   NodePtr root_;
   DocumentId last_;
   /// Matches of a block, from above, on the average.

@@ -10,8 +10,8 @@
 
 #include "index/search/bits.h"
 #include "index/search/plan.h"
-#include "index/search/reader.h"
 #include "index/search/scorer.h"
+#include "index/search/sight.h"
 
 /// What the Matcher is built of: each node of a plan adds its matches to blocks of documents.
 namespace maru::index {
@@ -68,15 +68,18 @@ using NodePtr = std::unique_ptr<Node>;
 
 /// Documents with a term (empty: all documents); with a scorer's `weight` when that is not 0.
 NodePtr MakeTerm(Reader& reader, const std::string& term, double weight);
+/// Documents with a term that begins with `prefix`, as one term.
+NodePtr MakePrefix(Sight& share, const std::string& prefix, double weight);
 /// Any of `parts`; `mixed` are those that weigh documents which they do not match.
 NodePtr MakeOr(std::vector<NodePtr> parts, std::vector<NodePtr> mixed);
 NodePtr MakeAnd(std::vector<NodePtr> parts);
 NodePtr MakeAndNot(NodePtr wanted, NodePtr unwanted);
 /// Documents that a plan of kind kRange, kUnder (`folder` of this share), kPositions or kTextPhrase
-/// takes; without weight. The last two look at each document that they are asked for.
+/// takes; without weight. The last two look at each document that they are asked for and that is
+/// seen: what is not, they leave out.
 NodePtr MakeRange(Reader& reader, const Plan& plan);
 NodePtr MakeUnder(Reader& reader, const FolderSet& folder);
-NodePtr MakePositions(Reader& reader, const Plan& plan);
-NodePtr MakeText(Reader& reader, const Plan& plan);
+NodePtr MakePositions(Sight& share, const Plan& plan);
+NodePtr MakeText(Sight& share, const Plan& plan);
 
 }  // namespace maru::index

@@ -7,7 +7,7 @@
 namespace maru::index {
 
 PhraseFinder::PhraseFinder(const std::vector<std::string>& words)
-    : finder_({MarkGroup{{}, words, true}}) {
+    : finder_({MarkGroup{{}, words, MarkGroup::Kind::kPhrase}}) {
   for (std::size_t i = 1; i < words.size(); ++i) {
     pairs_.push_back(HashPair(HashWord(words[i - 1]), HashWord(words[i])));
   }

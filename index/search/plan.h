@@ -24,6 +24,7 @@ struct Plan {
     kNothing,
     kEverything,
     kTerm,        // documents with `term`
+    kPrefix,      // documents with a term that begins with `term`, as one
     kPositions,   // `words`, terms, one behind the other by the engine's positions
     kTextPhrase,  // `words` one behind the other in the stored text
     kRange,       // the number in value slot `slot` is in [low, high]
@@ -39,6 +40,11 @@ struct Plan {
   static Plan Term(std::string term) {
     Plan plan(Kind::kTerm, {});
     plan.term = std::move(term);
+    return plan;
+  }
+  static Plan Prefix(std::string prefix) {
+    Plan plan(Kind::kPrefix, {});
+    plan.term = std::move(prefix);
     return plan;
   }
   static Plan Words(Kind what, std::vector<std::string> words) {

@@ -32,27 +32,33 @@ bool ArePaired(const std::string& first, const std::string& second) {
 
 }  // namespace
 
-std::vector<std::string> Planner::Expand(const Query& query, std::string_view field_prefix) const {
-  const std::string& word = query.words.at(0);
-  return query.kind == Query::Kind::kPrefix ? vocabulary_.BeginningWith(word, field_prefix)
-                                            : vocabulary_.FormsOf(word, field_prefix, query.exact);
+/// Charged by its form: what a query costs must not tell which words documents have.
+void Planner::CountWords(std::size_t words) {
+  terms_ += words;
+  if (terms_ > Query::kMaxTerms) throw BadQuery("The query is too large");
 }
 
 Plan Planner::MakeWord(const Query& query) {
-  // Charged by its form: what a query costs must not tell which words documents have.
-  const std::size_t most = query.kind == Query::Kind::kPrefix ? Query::kMaxExpansion
-                           : query.exact                      ? 1
-                                                              : 1 + Query::kMaxForms;
-  terms_ += query.fields.size() * most;
-  if (terms_ > Query::kMaxTerms) throw BadQuery("The query is too large");
+  CountWords(query.fields.size() * (query.exact ? 1 : Query::kWidened));
+  const std::string& word = query.words[0];
   std::vector<Plan> any;
   for (const FieldWeight& where : query.fields) {
     const Field& field = FieldOf(where.field, {FieldType::kText});
-    for (const std::string& word : Expand(query, field.prefix)) {
-      const bool other_form = query.kind == Query::Kind::kWord && word != query.words[0];
-      any.push_back(Plan::Term(TermOf(field.prefix, word))
-                        .Scaled(where.weight * (other_form ? kFormWeight : 1)));
+    any.push_back(Plan::Term(TermOf(field.prefix, word)).Scaled(where.weight));
+    if (query.exact) continue;
+    for (const std::string& form : vocabulary_.OtherFormsOf(word, field.prefix)) {
+      any.push_back(Plan::Term(TermOf(field.prefix, form)).Scaled(where.weight * kFormWeight));
     }
+  }
+  return Plan(Plan::Kind::kOr, std::move(any));
+}
+
+Plan Planner::MakePrefix(const Query& query) {
+  CountWords(query.fields.size() * Query::kWidened);
+  std::vector<Plan> any;
+  for (const FieldWeight& where : query.fields) {
+    const Field& field = FieldOf(where.field, {FieldType::kText});
+    any.push_back(Plan::Prefix(TermOf(field.prefix, query.words[0])).Scaled(where.weight));
   }
   return Plan(Plan::Kind::kOr, std::move(any));
 }
@@ -113,15 +119,15 @@ Plan Planner::MakeRange(const Query& query) {
 /// A path is resolved once for each share it lies in.
 Plan Planner::MakeUnder(const Query& query) {
   Plan plan(Plan::Kind::kUnder, {});
-  for (std::size_t share = 0; share < readers_.size(); ++share) {
+  for (std::size_t share = 0; share < shares_.size(); ++share) {
     FolderSet& set = plan.under.emplace_back();
     if (query.field != ids_[share] && !query.field.empty()) continue;
     set.whole = query.text.empty();
-    const auto entry = set.whole ? std::nullopt : readers_[share]->Resolve(query.text);
+    const auto entry = set.whole ? std::nullopt : shares_[share].Source().Resolve(query.text);
     if (!entry) continue;
     set.self = entry->document;
     if (entry->directory) {
-      set.folders = FoldersUnder(readers_[share]->State().Table(), entry->directory);
+      set.folders = FoldersUnder(shares_[share].State().Table(), entry->directory);
     }
   }
   return plan;
@@ -157,9 +163,11 @@ Plan Planner::Make(const Query& query, unsigned depth) {
     case Query::Kind::kNothing:
       return {};
     case Query::Kind::kWord:
-    case Query::Kind::kPrefix:
       if (query.words.empty()) throw BadQuery("A word is missing");
       return MakeWord(query);
+    case Query::Kind::kPrefix:
+      if (query.words.empty()) throw BadQuery("A word is missing");
+      return MakePrefix(query);
     case Query::Kind::kPhrase:
       if (query.words.empty()) throw BadQuery("A word is missing");
       return MakePhrase(query);
@@ -180,17 +188,26 @@ Plan Planner::PlanOf(const Query& query) {
   return Make(query, 0);
 }
 
+MarkGroup Planner::MarkOf(const Query& query, const std::string& field) {
+  const Field& row = FieldOf(field, {FieldType::kText});
+  if (query.kind == Query::Kind::kPhrase) return {field, query.words, MarkGroup::Kind::kPhrase};
+  MarkGroup group{field, {query.words.at(0)}, MarkGroup::Kind::kPrefix};
+  if (query.kind == Query::Kind::kPrefix) return group;
+  group.kind = MarkGroup::Kind::kWords;
+  if (query.exact) return group;
+  for (std::string& form : vocabulary_.OtherFormsOf(query.words[0], row.prefix)) {
+    group.words.push_back(std::move(form));
+  }
+  return group;
+}
+
 void Planner::Mark(const Query& query, unsigned depth, std::vector<MarkGroup>& groups) {
   CountNode(depth);
   switch (query.kind) {
     case Query::Kind::kWord:
     case Query::Kind::kPrefix:
     case Query::Kind::kPhrase:
-      for (const FieldWeight& where : query.fields) {
-        const Field& field = FieldOf(where.field, {FieldType::kText});
-        const bool phrase = query.kind == Query::Kind::kPhrase;
-        groups.push_back({where.field, phrase ? query.words : Expand(query, field.prefix), phrase});
-      }
+      for (const FieldWeight& where : query.fields) groups.push_back(MarkOf(query, where.field));
       return;
     case Query::Kind::kAndNot:
       if (!query.parts.empty()) Mark(query.parts[0], depth + 1, groups);

@@ -5,7 +5,7 @@
 
 #include "index/search/plan.h"
 #include "index/search/query.h"
-#include "index/search/reader.h"
+#include "index/search/sight.h"
 #include "index/search/vocabulary.h"
 #include "index/text/word_finder.h"
 
@@ -15,9 +15,9 @@ namespace maru::index {
 /// for a tree that is too deep or too large or names a field of another type.
 class Planner {
  public:
-  /// `ids` are the readers' index ids; all outlive this object.
-  Planner(const std::vector<Reader*>& readers, const std::vector<std::string>& ids)
-      : readers_(readers), ids_(ids), vocabulary_(readers) {}
+  /// `ids` are the shares' index ids; all outlive this object.
+  Planner(std::vector<Sight>& shares, const std::vector<std::string>& ids)
+      : shares_(shares), ids_(ids), vocabulary_(shares) {}
 
   Plan PlanOf(const Query& query);
 
@@ -27,19 +27,21 @@ class Planner {
  private:
   Plan Make(const Query& query, unsigned depth);
   Plan MakeWord(const Query& query);
+  Plan MakePrefix(const Query& query);
   Plan MakePhrase(const Query& query);
   Plan MakeTextPhrase(const std::vector<std::string>& words);
   Plan MakeValue(const Query& query);
   Plan MakeRange(const Query& query);
   Plan MakeUnder(const Query& query);
   Plan MakeParts(const Query& query, unsigned depth);
+  MarkGroup MarkOf(const Query& query, const std::string& field);
   void Mark(const Query& query, unsigned depth, std::vector<MarkGroup>& groups);
   void CountNode(unsigned depth);
-  std::vector<std::string> Expand(const Query& query, std::string_view field_prefix) const;
+  void CountWords(std::size_t words);
 
-  const std::vector<Reader*>& readers_;
+  std::vector<Sight>& shares_;
   const std::vector<std::string>& ids_;
-  const Vocabulary vocabulary_;
+  Vocabulary vocabulary_;
   unsigned nodes_ = 0;
   std::size_t terms_ = 0;
 };

@@ -19,7 +19,7 @@ struct Query {
     kEverything,
     kNothing,
     kWord,    ///< words[0] and, unless `exact`, the words of its stem, in any of `fields`
-    kPrefix,  ///< words that begin with words[0], in any of `fields`; at most kMaxExpansion of them
+    kPrefix,  ///< words that begin with words[0], in any of `fields`
     kPhrase,  ///< words one behind the other, in any one of `fields`
     kValue,   ///< the keyword or flag field `field` equals `text`
     kRange,   ///< the number or time field `field` is in [low, high]
@@ -41,17 +41,15 @@ struct Query {
   double high = 0;
   std::vector<Query> parts;
 
-  static constexpr unsigned kMaxExpansion = 100;
-  /// Other words of its stem that a word is widened to.
-  static constexpr unsigned kMaxForms = 12;
-
   friend bool operator==(const Query&, const Query&) = default;
 
-  /// Deepest tree, most nodes and, with all words widened to as many as they could be, most terms
-  /// the index takes; a larger one is refused with an Error, whatever stands in the index.
+  /// Deepest tree, most nodes and most words, each in each of its fields, that the index takes; a
+  /// larger one is refused with an Error, whatever stands in the index. A word that is widened
+  /// counts as kWidened words.
   static constexpr unsigned kMaxDepth = 32;
   static constexpr unsigned kMaxNodes = 4096;
   static constexpr std::size_t kMaxTerms = 32'768;
+  static constexpr std::size_t kWidened = 16;
 };
 
 }  // namespace maru::index

@@ -6,13 +6,17 @@
 
 namespace maru::index {
 
-/// A match and what it is ranked by.
+/// A match and what it is ranked by. Of equals the newest comes first, then what `order` says,
+/// which is made of names: where a document came to lie in the index tells of those indexed before
+/// it.
 struct Ranked {
   std::size_t share;
   DocumentId document;
   double weight;
   /// The sort field's value; the same for all when the order is by weight.
   double key = 0;
+  double time = 0;
+  std::uint64_t order = 0;
 };
 
 /// Keeps the best matches of a search, as many as its page needs.
@@ -20,15 +24,17 @@ class Ranking {
  public:
   explicit Ranking(const SearchOptions& options);
 
-  void Take(const Ranked& match) {
-    if (best_.size() < wanted_ || (wanted_ > 0 && IsBetter(match, best_.front()))) Keep(match);
+  /// Whether a match may be among the best, as far as its key, weight and time tell.
+  bool Wants(const Ranked& match) const {
+    return best_.size() < wanted_ || (wanted_ > 0 && Order(match, best_.front()) <= 0);
   }
+  void Take(const Ranked& match);
   /// The page's matches, best first. Once.
   std::vector<Ranked> Page();
 
  private:
+  int Order(const Ranked& a, const Ranked& b) const;
   bool IsBetter(const Ranked& a, const Ranked& b) const;
-  void Keep(const Ranked& match);
 
   const std::size_t from_, wanted_;
   const bool ascending_;

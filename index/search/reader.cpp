@@ -8,21 +8,16 @@ namespace maru::index {
 namespace {
 
 constexpr char kPostings = 't';
+constexpr char kBeginning = 'b';
 /// Documents changed beyond which a list is better read anew, as a part of its length.
 constexpr std::size_t kMuchMore = 8;
 
-/// How often a document has the term: asked with ascending ids.
-std::uint32_t CountIn(Xapian::PostingIterator& at, const Xapian::PostingIterator& end,
-                      DocumentId id) {
-  if (at != end) at.skip_to(id);
-  return at != end && *at == id ? at.get_wdf() : 0;
-}
-
-/// The postings as they are after documents have changed; the same object when these do not matter.
+/// The postings as they are after documents have changed, of which `count_of(id)` tells how often
+/// each has the term now; the same object when these do not matter, null when there are too many.
+template <class CountOf>
 std::shared_ptr<const Postings> Advanced(const std::shared_ptr<const Postings>& old,
                                          const std::vector<DocumentId>& changed,
-                                         const Xapian::Database& database,
-                                         const std::string& term) {
+                                         CountOf&& count_of) {
   if (changed.size() * kMuchMore > old->ids.size() + kMuchMore * kMuchMore) return nullptr;
   auto now = std::make_shared<Postings>();
   bool same = true;
@@ -33,13 +28,11 @@ std::shared_ptr<const Postings> Advanced(const std::shared_ptr<const Postings>& 
     now->counts.insert(now->counts.end(), old->counts.begin() + from, old->counts.begin() + to);
     copied = end;
   };
-  auto at = database.postlist_begin(term);
-  const auto end = database.postlist_end(term);
   for (const DocumentId id : changed) {
     const auto place = std::lower_bound(old->ids.begin(), old->ids.end(), id) - old->ids.begin();
     const auto index = static_cast<std::size_t>(place);
     const bool was = index < old->ids.size() && old->ids[index] == id;
-    const std::uint32_t count = CountIn(at, end, id);
+    const std::uint32_t count = count_of(id);
     if (count == (was ? old->counts[index] : 0)) continue;
     same = false;
     copy_to(index);
@@ -53,11 +46,56 @@ std::shared_ptr<const Postings> Advanced(const std::shared_ptr<const Postings>& 
   return now;
 }
 
+/// How often a document has terms that begin with `prefix`.
+std::uint32_t CountBeginning(const Xapian::Database& database, DocumentId id,
+                             const std::string& prefix) {
+  std::uint32_t count = 0;
+  try {
+    auto term = database.termlist_begin(id);
+    const auto end = database.termlist_end(id);
+    if (term != end) term.skip_to(prefix);
+    for (; term != end && (*term).starts_with(prefix); ++term) count += term.get_wdf();
+  } catch (const Xapian::DocNotFoundError&) {
+    return 0;
+  }
+  return count;
+}
+
+/// The postings of all terms that begin with `prefix`, added up by document.
+Postings AddedUp(const Xapian::Database& database, DocumentId last, const std::string& prefix,
+                 const std::function<void()>& poll) {
+  std::vector<std::uint32_t> counts(last + 1ull);
+  std::size_t documents = 0;
+  const auto end = database.allterms_end(prefix);
+  for (auto term = database.allterms_begin(prefix); term != end; ++term) {
+    poll();
+    const auto postings_end = database.postlist_end(*term);
+    for (auto at = database.postlist_begin(*term); at != postings_end; ++at) {
+      documents += counts[*at] == 0;
+      counts[*at] += at.get_wdf();
+    }
+  }
+  Postings postings;
+  postings.ids.reserve(documents);
+  postings.counts.reserve(documents);
+  for (std::size_t id = 0; id < counts.size(); ++id) {
+    if (counts[id] == 0) continue;
+    postings.ids.push_back(static_cast<DocumentId>(id));
+    postings.counts.push_back(counts[id]);
+  }
+  return postings;
+}
+
 }  // namespace
 
 std::shared_ptr<const Postings> Reader::KeptPostings(const std::string& term) const {
   return snapshot_->Find<Postings>(kPostings, term, [&](const auto& old, const auto& changes) {
-    return Advanced(old, changes.terms, database_, term);
+    auto at = database_.postlist_begin(term);
+    const auto end = database_.postlist_end(term);
+    return Advanced(old, changes.terms, [&](DocumentId id) {
+      if (at != end) at.skip_to(id);
+      return at != end && *at == id ? at.get_wdf() : 0;
+    });
   });
 }
 
@@ -65,7 +103,17 @@ std::shared_ptr<const Postings> Reader::PostingsOf(const std::string& term) cons
   auto kept = KeptPostings(term);
   if (kept) return kept;
   const std::uint64_t documents = database_.get_termfreq(term);
-  if (documents == 0 || !snapshot_->Spend(kPostings, term, 0, documents)) return nullptr;
+  const bool worth = documents > 0 && snapshot_->Spend(kPostings, term, 0, documents);
+  return worth ? Decode(term) : nullptr;
+}
+
+std::shared_ptr<const Postings> Reader::AllPostingsOf(const std::string& term) const {
+  auto kept = KeptPostings(term);
+  return kept ? kept : Decode(term);
+}
+
+std::shared_ptr<const Postings> Reader::Decode(const std::string& term) const {
+  const std::uint64_t documents = database_.get_termfreq(term);
   auto postings = std::make_shared<Postings>();
   postings->ids.reserve(documents);
   postings->counts.reserve(documents);
@@ -74,9 +122,23 @@ std::shared_ptr<const Postings> Reader::PostingsOf(const std::string& term) cons
     postings->ids.push_back(*at);
     postings->counts.push_back(at.get_wdf());
   }
-  kept = postings;
-  snapshot_->Keep(kPostings, term, kept);
-  return kept;
+  const std::shared_ptr<const Postings> decoded = postings;
+  snapshot_->Keep(kPostings, term, decoded);
+  return decoded;
+}
+
+std::shared_ptr<const Postings> Reader::Beginning(const std::string& prefix,
+                                                  const std::function<void()>& poll) const {
+  auto postings =
+      snapshot_->Find<Postings>(kBeginning, prefix, [&](const auto& old, const auto& changes) {
+        return Advanced(old, changes.terms,
+                        [&](DocumentId id) { return CountBeginning(database_, id, prefix); });
+      });
+  if (postings) return postings;
+  postings =
+      std::make_shared<const Postings>(AddedUp(database_, snapshot_->LastDocument(), prefix, poll));
+  snapshot_->Keep(kBeginning, prefix, postings);
+  return postings;
 }
 
 std::uint64_t Reader::FrequencyOf(const std::string& term) const {

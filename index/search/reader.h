@@ -2,6 +2,7 @@
 
 #include <xapian.h>
 
+#include <functional>
 #include <map>
 #include <memory>
 #include <optional>
@@ -43,7 +44,13 @@ class Reader {
 
   /// A term's postings when they are kept, or worth it now; else null.
   std::shared_ptr<const Postings> PostingsOf(const std::string& term) const;
-  /// How many documents have the term.
+  /// The same, worth it or not.
+  std::shared_ptr<const Postings> AllPostingsOf(const std::string& term) const;
+  /// Those of all terms that begin with `prefix`, as if they were one term. Where they are not kept
+  /// that takes a look at each posting of each of these terms; `poll` is called meanwhile.
+  std::shared_ptr<const Postings> Beginning(const std::string& prefix,
+                                            const std::function<void()>& poll) const;
+  /// How many documents have the term, whoever may see them.
   std::uint64_t FrequencyOf(const std::string& term) const;
   /// To be told of how many of a term's postings, of `all` of them, the engine has walked over:
   /// when it has walked over as many as there are, they are worth being kept.
@@ -75,6 +82,7 @@ class Reader {
   };
 
   std::shared_ptr<const Postings> KeptPostings(const std::string& term) const;
+  std::shared_ptr<const Postings> Decode(const std::string& term) const;
 
   std::shared_ptr<const Snapshot> snapshot_;
   Xapian::Database database_;

@@ -36,7 +36,7 @@ Snapshot::Snapshot(const Xapian::Database& database, const Snapshot* before,
       owner_(before ? before->owner_ : NewOwner()),
       documents_(database.get_doccount()),
       last_document_(database.get_lastdocid()),
-      total_length_(static_cast<double>(database.get_total_length())) {
+      total_length_(database.get_total_length()) {
   const MetadataReader read = [&](const std::string& key) { return database.get_metadata(key); };
   if (before) table_ = before->table_;
   table_.Load(read);

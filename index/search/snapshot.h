@@ -30,7 +30,7 @@ class Snapshot {
   std::uint64_t Documents() const { return documents_; }
   DocumentId LastDocument() const { return last_document_; }
   /// Words in all documents.
-  double TotalLength() const { return total_length_; }
+  std::uint64_t TotalLength() const { return total_length_; }
   const DirectoryTable& Table() const { return table_; }
 
   /// The value that is kept of this kind and name, set right for this commit by `advance(value,
@@ -67,7 +67,7 @@ class Snapshot {
   DirectoryTable table_;
   std::uint64_t documents_;
   DocumentId last_document_;
-  double total_length_;
+  std::uint64_t total_length_;
   /// Of the last commits, this one's last, without a gap.
   std::vector<std::shared_ptr<const CommitChanges>> history_;
   mutable std::mutex mutex_;

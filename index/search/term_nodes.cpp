@@ -8,6 +8,13 @@ namespace {
 /// A term with so many times the documents of a set is looked up for each of the set.
 constexpr std::uint64_t kMuchMore = 8;
 
+/// To a multiple of 2^-30: sums of such weights are exact, so that a score is the same in whatever
+/// order terms are gone through, which follows from how many documents have them, seen or not.
+double Rounded(double weight) {
+  constexpr double kUnits = 3 << 21;
+  return (weight + kUnits) - kUnits;
+}
+
 /// What the two kinds of terms have in common.
 class TermNode : public Node {
  public:
@@ -38,7 +45,7 @@ class TermNode : public Node {
         target.against
             ? target.against[offset]
             : target.scorer->Against(target.lengths ? target.lengths[offset] : length_of());
-    target.block.weights[offset] += weight_ * count / (against + count);
+    target.block.weights[offset] += Rounded(weight_ * count / (against + count));
   }
 
  private:
@@ -161,6 +168,10 @@ NodePtr MakeTerm(Reader& reader, const std::string& term, double weight) {
     }
   }
   return std::make_unique<EngineTerm>(reader, term, weight);
+}
+
+NodePtr MakePrefix(Sight& share, const std::string& prefix, double weight) {
+  return std::make_unique<KeptTerm>(share.Source(), share.Beginning(prefix), weight);
 }
 
 }  // namespace maru::index

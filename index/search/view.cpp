@@ -2,8 +2,9 @@
 
 #include <algorithm>
 #include <array>
+#include <cmath>
+#include <map>
 #include <numeric>
-#include <set>
 #include <tuple>
 
 #include "index/search/planner.h"
@@ -11,6 +12,7 @@
 #include "index/search/view_state.h"
 #include "index/search/vocabulary.h"
 #include "index/store/fields.h"
+#include "index/text/signature.h"
 #include "index/text/tokenizer.h"
 
 namespace maru::index {
@@ -18,8 +20,6 @@ namespace {
 
 /// The weight that a boost of 1 adds: about that of a rare word.
 constexpr double kBoostWeight = 10;
-/// Words looked at per suggestion asked for.
-constexpr std::size_t kCandidatesPerWord = 8;
 
 using KindSet = std::array<bool, kKinds>;
 
@@ -51,8 +51,8 @@ int SlotOf(const std::string& sort_field) {
   throw maruseeker::Error(maruseeker::kErrorBadParameter, "Cannot sort by " + sort_field);
 }
 
-Plan PlanOf(const View::State& state, const Query& query) {
-  return Planner(state.Readers(), state.Ids()).PlanOf(query);
+Plan PlanOf(View::State& state, const Query& query) {
+  return Planner(state.Sights(), state.Ids()).PlanOf(query);
 }
 
 Hit HitOf(const Reader& reader, std::size_t share, DocumentId id, Stored stored) {
@@ -79,7 +79,7 @@ std::vector<Hit> HitsOf(View::State& state, const std::vector<Ranked>& matches) 
   std::vector<Hit> hits(matches.size());
   for (const std::size_t rank : order) {
     const Ranked& match = matches[rank];
-    const Reader& reader = state.At(match.share);
+    const Reader& reader = state.At(match.share).Source();
     // A match is there: looking whether it is would cost as much again.
     const auto document = reader.Database().get_document(match.document, Xapian::DOC_ASSUME_VALID);
     hits[rank] = HitOf(reader, match.share, match.document, Stored::Decode(document.get_data()));
@@ -88,31 +88,60 @@ std::vector<Hit> HitsOf(View::State& state, const std::vector<Ranked>& matches) 
   return hits;
 }
 
-/// Hands a block's matches to the ranking, with what they are boosted and sorted by.
+/// Hands a block's matches to the ranking, with what they are ranked by: of those that cannot be
+/// among the best no more is looked up than that takes.
 class Ranker {
  public:
   Ranker(View::State& state, const SearchOptions& options)
       : state_(state),
         ranking_(options),
         slot_(SlotOf(options.sort_field)),
+        none_(options.ascending ? HUGE_VAL : -HUGE_VAL),
         boost_(options.boosts.begin()),
         boosts_end_(options.boosts.end()) {}
 
   void Take(std::size_t share, const MatchBlock& block) {
-    const auto take = [&](DocumentId offset, double key) {
+    Reader& reader = state_.At(share).Source();
+    BlockSet wanted{};
+    const auto look = [&](DocumentId offset, double key) {
       const DocumentId id = block.first + offset;
-      ranking_.Take({share, id, block.weights[offset] + BoostOf(share, id), key});
+      // A document without a value comes last.
+      keys_[offset] = std::isnan(key) ? none_ : key;
+      weights_[offset] = block.weights[offset] + BoostOf(share, id);
+      if (ranking_.Wants({share, id, weights_[offset], keys_[offset], HUGE_VAL})) {
+        SetBit(wanted, offset);
+      }
     };
     if (slot_ < 0) {
-      ForEachBit(block.matches, [&](DocumentId offset) { take(offset, 0); });
+      ForEachBit(block.matches, [&](DocumentId offset) { look(offset, 0); });
     } else {
-      const auto column = NumberColumn(static_cast<Xapian::valueno>(slot_));
-      state_.At(share).ForEachValue(column, block.first, block.matches, take);
+      reader.ForEachValue(NumberColumn(static_cast<Xapian::valueno>(slot_)), block.first,
+                          block.matches, look);
     }
+    static const auto time_slot = static_cast<Xapian::valueno>(FindField(kModTime)->slot);
+    reader.ForEachValue(
+        NumberColumn(time_slot), block.first, wanted, [&](DocumentId offset, double time) {
+          Take(reader, {share, block.first + offset, weights_[offset], keys_[offset], time});
+        });
   }
   std::vector<Ranked> Page() { return ranking_.Page(); }
 
  private:
+  void Take(Reader& reader, Ranked match) {
+    if (!ranking_.Wants(match)) return;
+    const DocumentId first = match.document / kBlockDocuments * kBlockDocuments;
+    BlockSet one{};
+    SetBit(one, match.document - first);
+    reader.ForEachValue(kPlaces, first, one, [&](DocumentId, const Place& place) {
+      match.order = HashPair(FolderHash(reader, match.share, place.parent), place.name_hash);
+    });
+    ranking_.Take(match);
+  }
+  std::uint64_t FolderHash(const Reader& reader, std::size_t share, DirectoryId folder) {
+    const auto [known, added] = folders_.try_emplace({share, folder});
+    if (added) known->second = HashWord(reader.State().Table().PathOf(folder));
+    return known->second;
+  }
   /// Documents come in ascending order, as the boosts do.
   double BoostOf(std::size_t share, DocumentId id) {
     const std::pair key(share, id);
@@ -124,29 +153,23 @@ class Ranker {
   View::State& state_;
   Ranking ranking_;
   const int slot_;
+  const double none_;
   Boost boost_;
   const Boost boosts_end_;
+  std::array<double, kBlockDocuments> keys_, weights_;
+  std::map<std::pair<std::size_t, DirectoryId>, std::uint64_t> folders_;
 };
 
 KindCounts CountKinds(View::State& state, const Query& query) {
   KindCounts counts{};
   state.ForEachSeen(PlanOf(state, query), nullptr, [&](std::size_t share, const MatchBlock& block) {
-    state.At(share).ForEachValue(kPlaces, block.first, block.matches,
-                                 [&](DocumentId, const Place& place) {
-                                   if (place.kind < kKinds) ++counts[place.kind];
-                                 });
+    state.At(share).Source().ForEachValue(kPlaces, block.first, block.matches,
+                                          [&](DocumentId, const Place& place) {
+                                            if (place.kind < kKinds) ++counts[place.kind];
+                                          });
     return true;
   });
   return counts;
-}
-
-bool SomeDocumentHas(View::State& state, const std::string& term) {
-  bool some = false;
-  state.ForEachSeen(Plan::Term(term), nullptr, [&](std::size_t, const MatchBlock& block) {
-    some = CountBits(block.matches) > 0;
-    return !some;
-  });
-  return some;
 }
 
 }  // namespace
@@ -159,7 +182,7 @@ SearchResult View::Search(const Query& query, const SearchOptions& options) {
     SearchResult result;
     if (state_->Shares() == 0) return result;
     const Plan plan = PlanOf(*state_, query);
-    const Scorer scorer(state_->Readers());
+    const Scorer scorer(state_->Sights());
     Ranker ranker(*state_, options);
     state_->ForEachSeen(plan, options.size > 0 ? &scorer : nullptr,
                         [&](std::size_t share, const MatchBlock& block) {
@@ -194,17 +217,17 @@ std::vector<std::uint64_t> View::Count(const Query& query, const std::vector<Que
 std::optional<Hit> View::Find(std::size_t share, DocumentId document) {
   return state_->OnOneState("Cannot read a document", [&]() -> std::optional<Hit> {
     if (share >= state_->Shares()) return std::nullopt;
-    const Reader& reader = state_->At(share);
-    auto stored = reader.Read(document);
-    if (!stored || !state_->Sees(share, stored->place)) return std::nullopt;
-    return HitOf(reader, share, document, std::move(*stored));
+    const Sight& sight = state_->At(share);
+    auto stored = sight.Source().Read(document);
+    if (!stored || !sight.Sees(stored->place)) return std::nullopt;
+    return HitOf(sight.Source(), share, document, std::move(*stored));
   });
 }
 
 std::optional<Hit> View::Find(std::size_t share, std::string_view path) {
   const auto entry = state_->OnOneState("Cannot find a path", [&]() -> std::optional<Entry> {
     if (share >= state_->Shares()) return std::nullopt;
-    return state_->At(share).Resolve(path);
+    return state_->At(share).Source().Resolve(path);
   });
   return entry ? Find(share, entry->document) : std::nullopt;
 }
@@ -215,42 +238,28 @@ std::vector<std::string> View::Complete(const std::string& field, const std::str
     std::vector<std::string> words;
     const std::string folded = Fold(prefix);
     if (folded.empty() || state_->Shares() == 0) return words;
-    const Vocabulary vocabulary(state_->Readers());
+    Vocabulary vocabulary(state_->Sights());
     for (const Field& row : Fields()) {
       if (row.type != FieldType::kText || (!field.empty() && field != row.name)) continue;
-      std::size_t found = 0;
-      for (const auto& [word, documents] :
-           vocabulary.MostFrequent(folded, row.prefix, limit * kCandidatesPerWord)) {
-        if (found >= limit) break;
-        if (!SomeDocumentHas(*state_, TermOf(row.prefix, word))) continue;
-        ++found;
-        if (std::find(words.begin(), words.end(), word) == words.end()) words.push_back(word);
+      for (std::string& word : vocabulary.Beginning(folded, row.prefix, limit)) {
+        const bool taken = std::find(words.begin(), words.end(), word) != words.end();
+        if (!taken && words.size() < limit) words.push_back(std::move(word));
       }
     }
-    if (words.size() > limit) words.resize(limit);
     return words;
   });
 }
 
 std::vector<std::string> View::Correct(const std::string& word, std::size_t limit) {
   return state_->OnOneState("Cannot correct a word", [&] {
-    std::vector<std::string> words;
-    if (state_->Shares() == 0) return words;
-    std::set<std::string> taken;
-    std::size_t looked = 0;
-    for (const Vocabulary::Near& near : Vocabulary(state_->Readers()).NearTo(Fold(word))) {
-      if (words.size() >= limit || ++looked > limit * kCandidatesPerWord) break;
-      if (taken.contains(near.word) || !SomeDocumentHas(*state_, near.term)) continue;
-      taken.insert(near.word);
-      words.push_back(near.word);
-    }
-    return words;
+    if (state_->Shares() == 0) return std::vector<std::string>();
+    return Vocabulary(state_->Sights()).Near(Fold(word), limit);
   });
 }
 
 std::uint64_t View::Documents() {
   std::uint64_t documents = 0;
-  for (const Reader* reader : state_->Readers()) documents += reader->State().Documents();
+  for (const Sight& sight : state_->Sights()) documents += sight.State().Documents();
   return documents;
 }
 

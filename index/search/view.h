@@ -73,14 +73,14 @@ class View {
   std::optional<Hit> Find(std::size_t share, DocumentId document);
   std::optional<Hit> Find(std::size_t share, std::string_view path);
 
-  /// Words of `field` ("" for all text fields) that begin with `prefix`, by number of documents,
-  /// most first; at most `limit`.
+  /// Words of `field` ("" for all text fields, one after the other) that begin with `prefix`, those
+  /// in most documents first; at most `limit`.
   std::vector<std::string> Complete(const std::string& field, const std::string& prefix,
                                     std::size_t limit);
   /// Words of the text fields within a small edit distance of `word`, nearest and commonest first.
   std::vector<std::string> Correct(const std::string& word, std::size_t limit);
 
-  /// Documents in all shares, whoever may read them.
+  /// Documents in all shares, whoever may read them: for those who run the server.
   std::uint64_t Documents();
 
  private:

@@ -7,17 +7,16 @@
 #include <string>
 #include <vector>
 
-#include "index/search/eyes.h"
 #include "index/search/matcher.h"
 #include "index/search/plan.h"
-#include "index/search/reader.h"
 #include "index/search/share.h"
+#include "index/search/sight.h"
 #include "index/search/view.h"
 #include "index/store/engine.h"
 
 namespace maru::index {
 
-/// Inside of a View: a reader and eyes for each share, complete from the beginning.
+/// Inside of a View: the sight of each share, complete from the beginning.
 class View::State {
  public:
   State(std::vector<std::string> ids, std::vector<std::shared_ptr<Share>> shares, Identity who,
@@ -28,11 +27,8 @@ class View::State {
 
   std::size_t Shares() const { return shares_.size(); }
   const std::vector<std::string>& Ids() const { return ids_; }
-  const std::vector<Reader*>& Readers() const { return reader_pointers_; }
-  Reader& At(std::size_t share) { return readers_[share]; }
-  bool Sees(std::size_t share, const Place& place) const {
-    return !eyes_[share] || eyes_[share]->Sees(place);
-  }
+  std::vector<Sight>& Sights() { return sights_; }
+  Sight& At(std::size_t share) { return sights_[share]; }
   /// Throws Cancelled when nobody waits any more.
   void PollCancelled() const;
 
@@ -41,12 +37,11 @@ class View::State {
   template <class Use>
   void ForEachSeen(const Plan& plan, const Scorer* scorer, Use&& use) {
     const auto block = std::make_unique<MatchBlock>();
-    const std::function<void()> poll = [this] { PollCancelled(); };
-    for (std::size_t share = 0; share < shares_.size(); ++share) {
-      Matcher matcher(readers_[share], share, plan, scorer, poll);
+    for (std::size_t number = 0; number < sights_.size(); ++number) {
+      Matcher matcher(sights_[number], number, plan, scorer);
       while (matcher.Next(*block)) {
-        if (eyes_[share]) eyes_[share]->Screen(readers_[share], block->first, block->matches);
-        if (!use(share, *block)) return;
+        sights_[number].Screen(block->first, block->matches);
+        if (!use(number, *block)) return;
       }
     }
   }
@@ -78,10 +73,7 @@ class View::State {
   const Identity who_;
   const IsCancelled cancelled_;
   std::vector<Share::Handle> handles_;
-  std::vector<Reader> readers_;
-  std::vector<Reader*> reader_pointers_;
-  /// A null: sees everything.
-  std::vector<std::shared_ptr<const Eyes>> eyes_;
+  std::vector<Sight> sights_;
 };
 
 }  // namespace maru::index

@@ -1,7 +1,9 @@
 #include "index/search/vocabulary.h"
 
 #include <algorithm>
+#include <array>
 #include <map>
+#include <set>
 
 #include "index/store/engine.h"
 #include "index/store/fields.h"
@@ -9,11 +11,13 @@
 
 namespace maru::index {
 
+using Words = std::vector<std::string>;
+
 template <>
-struct BytesOf<std::vector<WordCount>> {
-  std::size_t operator()(const std::vector<WordCount>& words) const {
+struct BytesOf<Words> {
+  std::size_t operator()(const Words& words) const {
     std::size_t bytes = 0;
-    for (const WordCount& word : words) bytes += sizeof(word) + word.word.size();
+    for (const std::string& word : words) bytes += sizeof(word) + word.size();
     return bytes;
   }
 };
@@ -21,17 +25,16 @@ struct BytesOf<std::vector<WordCount>> {
 namespace {
 
 constexpr char kForms = 'f';
-constexpr char kBeginnings = 'b';
-/// Words of a vocabulary looked at for forms of one word, and for spellings of one.
-constexpr unsigned kMaxFormCandidates = 2000;
-constexpr unsigned kMaxSpellings = 400'000;
 constexpr std::size_t kShortestStemmed = 3;
+/// Letters that an ending may add to a word.
+constexpr std::size_t kLongestEnding = 5;
 constexpr std::size_t kShortestCorrected = 3;
-constexpr unsigned kMaxDistance = 2;
+constexpr std::size_t kMaxDistance = 2;
 /// Documents changed beyond which a vocabulary is better asked anew than they are.
 constexpr std::size_t kFewChanged = 64;
-
-using Words = std::vector<WordCount>;
+constexpr unsigned kTermsBetweenPolls = 4096;
+/// So many documents are read themselves, for which of their words begin with a prefix.
+constexpr std::size_t kFewDocuments = 128;
 
 /// Words of Latin letters alone have English forms; everything else stands for itself.
 bool HasForms(const std::string& word) {
@@ -44,94 +47,55 @@ const Xapian::Stem& Stemmer() {
   return stemmer;
 }
 
-/// What words stand for a word, or begin with it: found by a common beginning in the vocabulary, so
+/// The other words of a word's stem in a field: found by a common beginning in the vocabulary, so
 /// that the index needs no stems.
-class Widening {
+class Forms {
  public:
-  Widening(char kind, const std::string& word) : kind_(kind), word_(word), begin_(word) {
-    if (kind != kForms || !HasForms(word)) return;
-    stem_ = Stemmer()(word);
+  Forms(const std::string& word, std::string_view field_prefix)
+      : word_(word), field_prefix_(field_prefix), stem_(Stemmer()(word)) {
     // "citi" is the stem of "city" and "cities".
     const std::size_t common = stem_.ends_with('i') ? stem_.size() - 1 : stem_.size();
-    begin_ = stem_.substr(0, std::max<std::size_t>(common, 2));
+    begin_ = TermOf(field_prefix, stem_.substr(0, std::max<std::size_t>(common, 2)));
   }
 
-  /// What they all begin with.
-  const std::string& Begin() const { return begin_; }
-  bool Takes(const std::string& word) const {
-    if (kind_ == kBeginnings || word == word_) return true;
-    return !stem_.empty() && word.size() <= word_.size() + 5 && HasForms(word) &&
-           Stemmer()(word) == stem_;
+  Words In(const Xapian::Database& database, const std::function<void()>& poll) const {
+    Words words;
+    const auto end = database.allterms_end(begin_);
+    unsigned looked = 0;
+    for (auto term = database.allterms_begin(begin_); term != end; ++term) {
+      if (++looked % kTermsBetweenPolls == 0) poll();
+      std::string word = (*term).substr(field_prefix_.size());
+      if (IsOne(word)) words.push_back(std::move(word));
+    }
+    return words;
   }
-  Words In(const Xapian::Database& database, std::string_view field_prefix) const;
-  /// Whether a document has words that it takes and that are not among `known`.
-  bool FindsNew(const Xapian::Database& database, DocumentId id, std::string_view field_prefix,
-                const Words& known) const;
+  /// Whether a document has forms that are not among `known`, which are in their order.
+  bool FindsNew(const Xapian::Database& database, DocumentId id, const Words& known) const {
+    try {
+      auto term = database.termlist_begin(id);
+      const auto end = database.termlist_end(id);
+      if (term != end) term.skip_to(begin_);
+      for (; term != end && (*term).starts_with(begin_); ++term) {
+        const std::string word = (*term).substr(field_prefix_.size());
+        if (!std::binary_search(known.begin(), known.end(), word) && IsOne(word)) return true;
+      }
+    } catch (const Xapian::DocNotFoundError&) {
+      // Gone: it brings no words.
+    }
+    return false;
+  }
 
  private:
-  const char kind_;
-  const std::string word_;
+  bool IsOne(const std::string& word) const {
+    return word != word_ && word.size() <= word_.size() + kLongestEnding && HasForms(word) &&
+           Stemmer()(word) == stem_;
+  }
+
+  const std::string& word_;
+  const std::string_view field_prefix_;
+  const std::string stem_;
   std::string begin_;
-  std::string stem_;
 };
-
-Words MostFrequentIn(const Xapian::Database& database, const std::string& prefix,
-                     std::string_view field_prefix, std::size_t limit) {
-  const std::string begin = TermOf(field_prefix, prefix);
-  Words words;
-  const auto more = [](const WordCount& a, const WordCount& b) {
-    return a.documents > b.documents;
-  };
-  for (auto term = database.allterms_begin(begin); term != database.allterms_end(begin); ++term) {
-    const std::uint64_t documents = term.get_termfreq();
-    if (words.size() == limit && documents <= words.front().documents) continue;
-    words.push_back({(*term).substr(field_prefix.size()), documents});
-    std::push_heap(words.begin(), words.end(), more);
-    if (words.size() <= limit) continue;
-    std::pop_heap(words.begin(), words.end(), more);
-    words.pop_back();
-  }
-  std::sort_heap(words.begin(), words.end(), more);
-  return words;
-}
-
-Words Widening::In(const Xapian::Database& database, std::string_view field_prefix) const {
-  if (kind_ == kBeginnings) {
-    return MostFrequentIn(database, word_, field_prefix, Query::kMaxExpansion);
-  }
-  Words words;
-  if (const auto documents = database.get_termfreq(TermOf(field_prefix, word_))) {
-    words.push_back({word_, documents});
-  }
-  if (stem_.empty()) return words;
-  const std::string begin = TermOf(field_prefix, begin_);
-  unsigned candidates = 0;
-  for (auto term = database.allterms_begin(begin); term != database.allterms_end(begin); ++term) {
-    if (++candidates > kMaxFormCandidates || words.size() > Query::kMaxForms) break;
-    std::string word = (*term).substr(field_prefix.size());
-    if (word != word_ && Takes(word)) words.push_back({std::move(word), term.get_termfreq()});
-  }
-  return words;
-}
-
-bool Widening::FindsNew(const Xapian::Database& database, DocumentId id,
-                        std::string_view field_prefix, const Words& known) const {
-  try {
-    const std::string begin = TermOf(field_prefix, begin_);
-    auto term = database.termlist_begin(id);
-    const auto end = database.termlist_end(id);
-    if (term != end) term.skip_to(begin);
-    for (; term != end && (*term).starts_with(begin); ++term) {
-      const std::string word = (*term).substr(field_prefix.size());
-      const bool is_known = std::any_of(known.begin(), known.end(),
-                                        [&](const WordCount& row) { return row.word == word; });
-      if (!is_known && Takes(word)) return true;
-    }
-  } catch (const Xapian::DocNotFoundError&) {
-    // Gone: it brings no words.
-  }
-  return false;
-}
 
 /// Edits (insert, remove, replace, swap neighbours) from one word to the other, at most `most` + 1.
 unsigned Distance(const std::string& a, const std::string& b, unsigned most) {
@@ -158,90 +122,133 @@ unsigned Distance(const std::string& a, const std::string& b, unsigned most) {
 
 }  // namespace
 
-/// Of all shares, the word itself first, then in the order of words.
-std::vector<WordCount> Vocabulary::Widened(char kind, const std::string& word,
-                                           std::string_view field_prefix) const {
-  const Widening widening(kind, word);
-  const std::string name = std::string(field_prefix) + ' ' + word;
-  std::map<std::string, std::uint64_t> all;
-  for (const Reader* reader : readers_) {
-    const Snapshot& state = reader->State();
-    const Xapian::Database& database = reader->Database();
-    auto words = state.Find<Words>(kind, name, [&](const auto& old, const CommitChanges& changes) {
+Words Vocabulary::OtherFormsOf(const std::string& word, std::string_view field_prefix) const {
+  if (!HasForms(word)) return {};
+  const Forms forms(word, field_prefix);
+  const std::string name = TermOf(field_prefix, word);
+  Words all;
+  for (const Sight& share : shares_) {
+    const Snapshot& state = share.State();
+    const Xapian::Database& database = share.Source().Database();
+    auto words = state.Find<Words>(kForms, name, [&](const auto& old, const auto& changes) {
       const bool is_new =
           changes.terms.size() > kFewChanged ||
-          std::any_of(changes.terms.begin(), changes.terms.end(), [&](DocumentId id) {
-            return widening.FindsNew(database, id, field_prefix, *old);
-          });
+          std::any_of(changes.terms.begin(), changes.terms.end(),
+                      [&](DocumentId id) { return forms.FindsNew(database, id, *old); });
       return is_new ? nullptr : old;
     });
     if (!words) {
-      words = std::make_shared<const Words>(widening.In(database, field_prefix));
-      state.Keep(kind, name, words);
+      words = std::make_shared<const Words>(forms.In(database, share.Poller()));
+      state.Keep(kForms, name, words);
     }
-    for (const WordCount& row : *words) all[row.word] += row.documents;
+    Words joined;
+    std::set_union(all.begin(), all.end(), words->begin(), words->end(),
+                   std::back_inserter(joined));
+    all = std::move(joined);
   }
-  Words words;
-  if (const auto itself = all.extract(word)) words.push_back({itself.key(), itself.mapped()});
-  for (const auto& [other, documents] : all) words.push_back({other, documents});
-  return words;
+  return all;
 }
 
-std::vector<std::string> Vocabulary::FormsOf(const std::string& word, std::string_view field_prefix,
-                                             bool exact) const {
-  std::vector<std::string> forms;
-  for (WordCount& row : Widened(kForms, word, field_prefix)) {
-    if (exact && row.word != word) continue;
-    if (forms.size() <= Query::kMaxForms) forms.push_back(std::move(row.word));
-  }
-  return forms;
-}
-
-std::vector<std::string> Vocabulary::BeginningWith(const std::string& prefix,
-                                                   std::string_view field_prefix) const {
-  Words words = Widened(kBeginnings, prefix, field_prefix);
-  std::stable_sort(words.begin(), words.end(), [](const WordCount& a, const WordCount& b) {
-    return a.documents > b.documents;
-  });
-  if (words.size() > Query::kMaxExpansion) words.resize(Query::kMaxExpansion);
-  std::vector<std::string> result;
-  for (WordCount& row : words) result.push_back(std::move(row.word));
-  return result;
+void Vocabulary::Poll() const {
+  if (!shares_.empty()) shares_.front().Poll();
 }
 
 Xapian::Database Vocabulary::All() const {
   Xapian::Database all;
-  for (const Reader* reader : readers_) all.add_database(reader->Database());
+  for (const Sight& share : shares_) all.add_database(share.Source().Database());
   return all;
 }
 
-std::vector<WordCount> Vocabulary::MostFrequent(const std::string& prefix,
-                                                std::string_view field_prefix,
-                                                std::size_t limit) const {
-  return MostFrequentIn(All(), prefix, field_prefix, limit);
+std::uint64_t Vocabulary::FrequencyOf(const std::string& term) {
+  std::uint64_t documents = 0;
+  for (Sight& share : shares_) documents += share.FrequencyOf(term, false);
+  return documents;
 }
 
-std::vector<Vocabulary::Near> Vocabulary::NearTo(const std::string& word) const {
-  std::vector<Near> near;
-  if (word.size() < kShortestCorrected || word.size() > kMaxWord) return near;
-  const unsigned most = word.size() < 6 ? 1 : kMaxDistance;
+/// The words of the candidates that most documents seen have. No more are counted than could be
+/// among them: of no term more documents are seen than there are.
+Words Vocabulary::MostSeen(std::vector<Candidate> candidates, std::size_t limit) {
+  std::sort(candidates.begin(), candidates.end(),
+            [](const Candidate& a, const Candidate& b) { return a.most > b.most; });
+  struct Counted {
+    std::uint64_t documents;
+    std::string word;
+    bool operator<(const Counted& other) const {
+      return documents != other.documents ? documents > other.documents : word < other.word;
+    }
+  };
+  std::set<Counted> best;
+  for (const Candidate& candidate : candidates) {
+    if (best.size() == limit && (limit == 0 || candidate.most < best.rbegin()->documents)) break;
+    Poll();
+    const std::uint64_t documents = FrequencyOf(candidate.term);
+    if (documents == 0) continue;
+    best.insert({documents, candidate.term.substr(candidate.field_prefix.size())});
+    if (best.size() > limit) best.erase(std::prev(best.end()));
+  }
+  Words words;
+  for (const Counted& row : best) words.push_back(row.word);
+  return words;
+}
+
+/// The terms of the few documents seen that have one; none when they are many.
+std::optional<std::vector<Vocabulary::Candidate>> Vocabulary::CandidatesOfFew(
+    const std::string& begin, std::string_view field_prefix) {
+  std::map<std::string, std::uint64_t> terms;
+  for (Sight& share : shares_) {
+    const auto few = share.FewBeginning(begin, kFewDocuments);
+    if (!few) return std::nullopt;
+    const Xapian::Database& database = share.Source().Database();
+    for (const DocumentId id : *few) {
+      auto term = database.termlist_begin(id);
+      const auto end = database.termlist_end(id);
+      for (term.skip_to(begin); term != end && (*term).starts_with(begin); ++term) ++terms[*term];
+    }
+  }
+  std::vector<Candidate> candidates;
+  for (auto& [term, documents] : terms) candidates.push_back({term, field_prefix, documents});
+  return candidates;
+}
+
+Words Vocabulary::Beginning(const std::string& prefix, std::string_view field_prefix,
+                            std::size_t limit) {
+  const std::string begin = TermOf(field_prefix, prefix);
+  if (auto few = CandidatesOfFew(begin, field_prefix)) return MostSeen(std::move(*few), limit);
+  std::vector<Candidate> candidates;
   const Xapian::Database all = All();
+  const auto end = all.allterms_end(begin);
+  for (auto term = all.allterms_begin(begin); term != end; ++term) {
+    candidates.push_back({*term, field_prefix, term.get_termfreq()});
+    if (candidates.size() % kTermsBetweenPolls == 0) Poll();
+  }
+  return MostSeen(std::move(candidates), limit);
+}
+
+Words Vocabulary::Near(const std::string& word, std::size_t limit) {
+  if (word.size() < kShortestCorrected || word.size() > kMaxWord) return {};
+  const unsigned most = word.size() < 6 ? 1 : kMaxDistance;
+  std::array<std::vector<Candidate>, kMaxDistance + 1> by_distance;
+  const Xapian::Database all = All();
+  unsigned looked = 0;
   for (const Field& field : Fields()) {
     if (field.type != FieldType::kText) continue;
     // The first letter is rarely mistaken, and it bounds the walk.
     const std::string begin = TermOf(field.prefix, word.substr(0, 1));
-    unsigned looked = 0;
-    for (auto term = all.allterms_begin(begin); term != all.allterms_end(begin); ++term) {
-      if (++looked > kMaxSpellings) break;
-      std::string other = (*term).substr(field.prefix.size());
-      const unsigned distance = Distance(word, other, most);
+    const auto end = all.allterms_end(begin);
+    for (auto term = all.allterms_begin(begin); term != end; ++term) {
+      if (++looked % kTermsBetweenPolls == 0) Poll();
+      const unsigned distance = Distance(word, (*term).substr(field.prefix.size()), most);
       if (distance == 0 || distance > most) continue;
-      near.push_back({distance, term.get_termfreq(), std::move(other), *term});
+      by_distance[distance].push_back({*term, field.prefix, term.get_termfreq()});
     }
   }
-  std::sort(near.begin(), near.end(), [](const Near& a, const Near& b) {
-    return a.distance != b.distance ? a.distance < b.distance : a.documents > b.documents;
-  });
+  Words near;
+  for (std::vector<Candidate>& candidates : by_distance) {
+    for (std::string& other : MostSeen(std::move(candidates), limit)) {
+      const bool taken = std::find(near.begin(), near.end(), other) != near.end();
+      if (!taken && near.size() < limit) near.push_back(std::move(other));
+    }
+  }
   return near;
 }
 

@@ -1,55 +1,49 @@
 #pragma once
 
-#include <xapian.h>
-
+#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
 
-#include "index/search/query.h"
-#include "index/search/reader.h"
+#include "index/search/sight.h"
 
-/// The words of the indices: what a query's words and prefixes are widened to, completions,
-/// spellings.
+/// The words of the indices: forms of a query's words, completions, spellings.
 namespace maru::index {
 
-/// A word of one share's or all shares' vocabulary, without its field's prefix.
-struct WordCount {
-  std::string word;
-  std::uint64_t documents = 0;
-};
-
+/// Of all shares together. What it tells of words depends on documents that are seen alone.
 class Vocabulary {
  public:
-  /// The readers outlive this object.
-  explicit Vocabulary(const std::vector<Reader*>& readers) : readers_(readers) {}
+  /// The shares outlive this object.
+  explicit Vocabulary(std::vector<Sight>& shares) : shares_(shares) {}
 
-  /// The words that stand for `word` in a field: itself and, unless `exact`, the words of its stem.
-  std::vector<std::string> FormsOf(const std::string& word, std::string_view field_prefix,
-                                   bool exact) const;
-  /// Words that begin with `prefix`: Query::kMaxExpansion of them, those of the most documents.
-  std::vector<std::string> BeginningWith(const std::string& prefix,
-                                         std::string_view field_prefix) const;
-
-  /// Words of a field that begin with `prefix`, by number of documents, most first; not kept.
-  std::vector<WordCount> MostFrequent(const std::string& prefix, std::string_view field_prefix,
-                                      std::size_t limit) const;
-  struct Near {
-    unsigned distance;
-    std::uint64_t documents;
-    std::string word;
-    std::string term;
-  };
-  /// The words of the text fields within a small number of edits of `word`, nearest and commonest
-  /// first.
-  std::vector<Near> NearTo(const std::string& word) const;
+  /// The other words of `word`'s stem in a field, in their order: all that there are, also in
+  /// documents that are not seen. Looked for in the ones that are, only theirs are found.
+  std::vector<std::string> OtherFormsOf(const std::string& word,
+                                        std::string_view field_prefix) const;
+  /// Words of a field that begin with `prefix`, those in the most documents seen first, then in
+  /// their order.
+  std::vector<std::string> Beginning(const std::string& prefix, std::string_view field_prefix,
+                                     std::size_t limit);
+  /// The words of the text fields within a small number of edits of `word`: nearest first, then
+  /// those in the most documents seen, then in their order.
+  std::vector<std::string> Near(const std::string& word, std::size_t limit);
 
  private:
-  std::vector<WordCount> Widened(char kind, const std::string& word,
-                                 std::string_view field_prefix) const;
-  Xapian::Database All() const;
+  struct Candidate {
+    std::string term;
+    std::string_view field_prefix;
+    /// Documents, seen or not.
+    std::uint64_t most;
+  };
 
-  const std::vector<Reader*>& readers_;
+  std::optional<std::vector<Candidate>> CandidatesOfFew(const std::string& begin,
+                                                        std::string_view field_prefix);
+  void Poll() const;
+  Xapian::Database All() const;
+  std::uint64_t FrequencyOf(const std::string& term);
+  std::vector<std::string> MostSeen(std::vector<Candidate> candidates, std::size_t limit);
+
+  std::vector<Sight>& shares_;
 };
 
 }  // namespace maru::index

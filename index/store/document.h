@@ -23,6 +23,7 @@ struct Document {
   std::uint64_t size = 0;
   /// Seconds since the epoch.
   std::int64_t mtime = 0;
+  std::uint64_t inode = 0;
   std::string title;
   std::vector<std::string> authors;
   /// UTF-8; bytes that are not are skipped as separators.
@@ -35,6 +36,8 @@ struct Record {
   bool is_dir = false;
   std::uint64_t size = 0;
   std::int64_t mtime = 0;
+  /// Tells whether what lies at the document's path is still that file.
+  std::uint64_t inode = 0;
   std::string title;
   std::vector<std::string> authors;
 };

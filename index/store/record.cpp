@@ -15,12 +15,14 @@ std::uint32_t Fixed32(std::string_view bytes, std::size_t at) {
 }  // namespace
 
 std::string Place::Encode() const {
-  return BigEndian32(parent) + BigEndian32(rights) + static_cast<char>(kind);
+  return BigEndian32(parent) + BigEndian32(rights) + static_cast<char>(kind) +
+         BigEndian32(name_hash);
 }
 
 Place Place::Decode(std::string_view bytes) {
   if (bytes.size() != kSize) return {};
-  return {Fixed32(bytes, 0), Fixed32(bytes, 4), static_cast<std::uint8_t>(bytes[8])};
+  return {Fixed32(bytes, 0), Fixed32(bytes, 4), static_cast<std::uint8_t>(bytes[8]),
+          Fixed32(bytes, 9)};
 }
 
 std::string TextPlace::Encode() const {
@@ -44,7 +46,8 @@ std::string Stored::Encode() const {
       .String(record.name)
       .Number(record.is_dir)
       .Number(record.size)
-      .Signed(record.mtime);
+      .Signed(record.mtime)
+      .Number(record.inode);
   out.String(record.title).Number(record.authors.size());
   for (const std::string& author : record.authors) out.String(author);
   return place.Encode() + out.Take();
@@ -61,6 +64,7 @@ Stored Stored::Decode(std::string_view bytes) {
   record.is_dir = in.Number() != 0;
   record.size = in.Number();
   record.mtime = in.Signed();
+  record.inode = in.Number();
   record.title = in.String();
   for (std::uint64_t left = in.Number(); left > 0; --left) record.authors.emplace_back(in.String());
   return stored;

@@ -18,8 +18,10 @@ struct Place {
   RightsId rights = 0;
   /// Row of the kinds' table in fields.h.
   std::uint8_t kind = 0;
+  /// Of its name: with its folder's, orders what nothing else does.
+  std::uint32_t name_hash = 0;
 
-  static constexpr std::size_t kSize = 9;
+  static constexpr std::size_t kSize = 13;
   /// kSize bytes.
   std::string Encode() const;
   static Place Decode(std::string_view bytes);

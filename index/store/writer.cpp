@@ -89,10 +89,11 @@ struct Writer::State {
   /// Completes a document with what only the writer knows.
   void Place(Xapian::Document& engine, const Document& document, const TextPlace& text) {
     index::Place place{document.parent, table.RightsIdOf(document.rights),
-                       KindNumber(KindOf(document))};
+                       KindNumber(KindOf(document)),
+                       static_cast<std::uint32_t>(HashWord(document.name))};
     engine.add_value(kPlaceSlot, place.Encode());
-    const Record record{document.name,  document.is_dir, document.size,
-                        document.mtime, document.title,  document.authors};
+    const Record record{document.name,  document.is_dir, document.size,   document.mtime,
+                        document.inode, document.title,  document.authors};
     engine.set_data(Stored{place, text, record}.Encode());
     engine.add_value(kTextSlot, text.Encode());
     engine.add_value(static_cast<Xapian::valueno>(FindField(kSize)->slot),

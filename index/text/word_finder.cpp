@@ -54,17 +54,15 @@ std::size_t EndOfPhrase(std::string_view text, std::size_t at,
 }  // namespace
 
 WordFinder::WordFinder(const std::vector<MarkGroup>& groups) {
-  for (std::size_t group = 0; group < groups.size(); ++group) {
-    const std::vector<std::string>& words = groups[group].words;
-    for (std::size_t i = 0; i < words.size(); ++i) {
-      Wanted wanted{group, {}};
-      if (groups[group].phrase) wanted.behind.assign(words.begin() + 1, words.end());
-      words_[words[i]].push_back(std::move(wanted));
-      if (!words[i].empty()) {
-        lengths_[static_cast<unsigned char>(words[i][0])] |= LengthBit(words[i].size());
-      }
-      if (groups[group].phrase) break;
+  for (std::size_t number = 0; number < groups.size(); ++number) {
+    const MarkGroup& group = groups[number];
+    if (group.words.empty()) continue;
+    if (group.kind == MarkGroup::Kind::kPhrase) {
+      AddWord(group.words[0], {number, false, {group.words.begin() + 1, group.words.end()}});
+      continue;
     }
+    const bool goes_on = group.kind == MarkGroup::Kind::kPrefix;
+    for (const std::string& word : group.words) AddWord(word, {number, goes_on});
   }
   // A longer run than the longest word is cut there: its last byte is not the word's.
   if (std::all_of(words_.begin(), words_.end(), [](const auto& row) {
@@ -72,6 +70,16 @@ WordFinder::WordFinder(const std::vector<MarkGroup>& groups) {
       })) {
     FindProbes(kBeginning);
   }
+}
+
+void WordFinder::AddWord(const std::string& word, Wanted wanted) {
+  if (!word.empty()) {
+    std::uint64_t& lengths = lengths_[static_cast<unsigned char>(word[0])];
+    lengths |= LengthBit(word.size());
+    if (wanted.goes_on) lengths |= ~(LengthBit(word.size()) - 1);
+  }
+  if (wanted.goes_on) beginnings_.insert(word.size());
+  words_[word].push_back(std::move(wanted));
 }
 
 void WordFinder::FindProbes(std::size_t beginning) {
@@ -116,9 +124,21 @@ bool WordFinder::MayBe(std::string_view word) const {
 template <class Use>
 bool WordFinder::Take(std::string_view text, const Token& token, Use& use) const {
   if (!MayBe(token.word)) return true;
-  const auto found = words_.find(token.word);
+  for (const std::size_t length : beginnings_) {
+    if (length >= token.word.size()) break;
+    if (!TakeWord(text, token, length, use)) return false;
+  }
+  return TakeWord(text, token, token.word.size(), use);
+}
+
+/// Takes the token when its first `length` bytes are wanted.
+template <class Use>
+bool WordFinder::TakeWord(std::string_view text, const Token& token, std::size_t length,
+                          Use& use) const {
+  const auto found = words_.find(token.word.substr(0, length));
   if (found == words_.end()) return true;
   for (const Wanted& wanted : found->second) {
+    if (length < token.word.size() && !wanted.goes_on) continue;
     const std::size_t end =
         wanted.behind.empty() ? token.end : EndOfPhrase(text, token.end, wanted.behind);
     if (end && !use(Match{token.begin, end, wanted.group})) return false;

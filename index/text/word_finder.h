@@ -2,6 +2,7 @@
 
 #include <array>
 #include <map>
+#include <set>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -11,12 +12,18 @@
 /// Finds a query's words in texts.
 namespace maru::index {
 
-/// Words that count as one in a field: forms of a word, completions of a prefix, or a phrase.
+/// What counts as one in a field.
 struct MarkGroup {
+  enum class Kind {
+    kWords,   ///< any of the words: a word and its other forms
+    kPrefix,  ///< words that begin with the one word
+    kPhrase,  ///< the words one behind the other
+  };
+
   std::string field;
-  /// Folded words without prefix; of a phrase: in its order.
+  /// Folded, without the field's prefix.
   std::vector<std::string> words;
-  bool phrase = false;
+  Kind kind = Kind::kWords;
 };
 
 /// Bytes [begin, end) of a text that a group matches.
@@ -38,19 +45,24 @@ class WordFinder {
  private:
   struct Wanted {
     std::size_t group;
+    /// Whether words that go on are wanted too.
+    bool goes_on = false;
     /// What must follow, of a phrase.
-    std::vector<std::string> behind;
+    std::vector<std::string> behind = {};
   };
 
   template <class Use>
   void ForEach(std::string_view text, Use&& use) const;
   template <class Use>
   void ForEachPlain(std::string_view text, Use&& use) const;
+  void AddWord(const std::string& word, Wanted wanted);
   void FindProbes(std::size_t beginning);
   void MarkBegins(std::string_view text, std::size_t block, unsigned char* marks) const;
   bool MayBe(std::string_view word) const;
   template <class Use>
   bool Take(std::string_view text, const Token& token, Use& use) const;
+  template <class Use>
+  bool TakeWord(std::string_view text, const Token& token, std::size_t length, Use& use) const;
 
   /// Two bytes that words with one beginning have in common: their first, and one further on.
   struct Probe {
@@ -60,6 +72,8 @@ class WordFinder {
   };
 
   std::map<std::string, std::vector<Wanted>, std::less<>> words_;
+  /// Of the words that may go on.
+  std::set<std::size_t> beginnings_;
   /// When there are some, all words are ASCII, and in ASCII texts blocks where no probe fits are
   /// passed over.
   std::vector<Probe> probes_;

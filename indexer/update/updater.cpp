@@ -26,6 +26,7 @@ std::optional<Document> Describe(int dir_fd, DirectoryId parent, const Found& fo
   document.is_dir = found.IsFolder();
   document.size = document.is_dir ? 0 : found.stamp.size;
   document.mtime = found.ModTime();
+  document.inode = found.stamp.inode;
   if (ReadFileRights(dir_fd, document.name.c_str(), document.rights)) return document;
   if (!HasVanished(errno)) MARU_LOG("Cannot read the rights of [%s]", document.name.c_str());
   return std::nullopt;

@@ -180,7 +180,9 @@ class DaemonTest : public testing::Test {
     stat(path.c_str(), &status);
     document.size = static_cast<std::uint64_t>(status.st_size);
     document.mtime = status.st_mtime;
-    if (S_ISDIR(status.st_mode)) return document;
+    document.inode = status.st_ino;
+    document.is_dir = S_ISDIR(status.st_mode);
+    if (document.is_dir) return document;
     std::ifstream file(path);
     document.text.assign(std::istreambuf_iterator<char>(file), {});
     return document;

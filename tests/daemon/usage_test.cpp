@@ -20,7 +20,7 @@ class UsageTest : public testing::Test {
   }
 
   static double BoostOf(const UsageStore& usage, uid_t uid, index::DocumentId document) {
-    for (const OpenedFile& file : usage.Strongest(uid, {"i"})) {
+    for (const OpenedFile& file : usage.OpenedBy(uid, {"i"})) {
       if (file.document == document) return file.boost;
     }
     return 0;
@@ -30,23 +30,21 @@ class UsageTest : public testing::Test {
   std::int64_t now_ = 1'800'000'000;
 };
 
-TEST_F(UsageTest, FadesAndCountsOthersALittle) {
+TEST_F(UsageTest, FadesAndIsEachUsersOwn) {
   const auto usage = Open();
   usage->Record(1, "i", 7, "/a");
   const double once = BoostOf(*usage, 1, 7);
   usage->Record(1, "i", 7, "/a");
   const double twice = BoostOf(*usage, 1, 7);
-  EXPECT_DOUBLE_EQ(once, UsageStore::kOwnBoost / 2) << "own openings are not counted as others'";
+  EXPECT_DOUBLE_EQ(once, 0.5);
   EXPECT_GT(twice, once);
-  EXPECT_LT(twice, UsageStore::kOwnBoost);
-  EXPECT_GT(BoostOf(*usage, 2, 7), 0);
-  EXPECT_LT(BoostOf(*usage, 2, 7), UsageStore::kOthersBoost);
+  EXPECT_LT(twice, 1);
+  EXPECT_TRUE(usage->OpenedBy(2, {"i"}).empty());
   now_ += UsageStore::kHalfLife;
   EXPECT_DOUBLE_EQ(BoostOf(*usage, 1, 7), once);
   usage->Record(1, "i", 7, "/a");
   EXPECT_DOUBLE_EQ(BoostOf(*usage, 1, 7), twice) << "half of two, and one";
-  EXPECT_TRUE(usage->Strongest(1, {"other"}).empty());
-  EXPECT_TRUE(usage->Strongest(2, {"other"}).empty());
+  EXPECT_TRUE(usage->OpenedBy(1, {"other"}).empty());
 }
 
 TEST_F(UsageTest, SurvivesRestartsAndStaysBounded) {
@@ -57,13 +55,12 @@ TEST_F(UsageTest, SurvivesRestartsAndStaysBounded) {
   }
   usage->Record(1, "i", 220, "/220");
   const double boost = BoostOf(*usage, 1, 220);
-  EXPECT_EQ(usage->Size(), 2 * UsageStore::kMaxFiles + 20);
+  EXPECT_EQ(usage->Size(), UsageStore::kMaxFiles);
   EXPECT_EQ(BoostOf(*usage, 1, 1), 0) << "the weakest made room";
   usage.reset();
   usage = Open();
-  EXPECT_EQ(usage->Size(), 2 * UsageStore::kMaxFiles + 20);
+  EXPECT_EQ(usage->Size(), UsageStore::kMaxFiles);
   EXPECT_DOUBLE_EQ(BoostOf(*usage, 1, 220), boost);
-  EXPECT_LE(usage->Strongest(1, {"i"}).size(), UsageStore::kMaxStrongest);
 }
 
 TEST_F(UsageTest, ForgetsTheUserWhoWasAwayLongest) {
@@ -72,9 +69,9 @@ TEST_F(UsageTest, ForgetsTheUserWhoWasAwayLongest) {
     usage->Record(uid, "i", 1, "/a");
     ++now_;
   }
-  EXPECT_EQ(usage->Size(), UsageStore::kMaxUsers + 1);
-  EXPECT_LT(BoostOf(*usage, 0, 1), UsageStore::kOthersBoost);
-  EXPECT_GT(BoostOf(*usage, 1, 1), UsageStore::kOthersBoost);
+  EXPECT_EQ(usage->Size(), UsageStore::kMaxUsers);
+  EXPECT_EQ(BoostOf(*usage, 0, 1), 0);
+  EXPECT_GT(BoostOf(*usage, 1, 1), 0.4);
 }
 
 TEST_F(UsageTest, SurvivesAKill) {
@@ -87,14 +84,14 @@ TEST_F(UsageTest, SurvivesAKill) {
   }
   waitpid(child, nullptr, 0);
   const auto usage = Open();
-  EXPECT_EQ(usage->Size(), 2u);
+  EXPECT_EQ(usage->Size(), 1u);
   EXPECT_GT(BoostOf(*usage, 1, 7), 0.6) << "two openings";
 }
 
 TEST_F(UsageTest, ADamagedDatabaseIsLeftAloneAndSearchesGoOn) {
   std::ofstream(folder_ + "/usage.db") << std::string(5000, 'x');
   const auto usage = Open();
-  EXPECT_TRUE(usage->Strongest(1, {"i"}).empty());
+  EXPECT_TRUE(usage->OpenedBy(1, {"i"}).empty());
   EXPECT_THROW(usage->Record(1, "i", 1, "/a"), maruseeker::Error);
 }
 

@@ -3,57 +3,52 @@
 #include <xapian.h>
 
 #include <algorithm>
-#include <deque>
 #include <memory>
 #include <string>
 #include <tuple>
 #include <vector>
 
-#include "index/search/eyes.h"
 #include "index/search/planner.h"
 #include "index/search/ranking.h"
 #include "index/search/share.h"
+#include "index/search/sight.h"
 
 namespace maru::index::test {
 
-/// What the engine's own matcher answers, over the newest commits of some indices: all matches are
-/// asked for, and put in order here.
+/// What the engine's own matcher answers over databases that hold just what an identity sees of
+/// some indices' newest commits: all matches are asked for, and put in order here.
 class Oracle {
  public:
   Oracle(const std::string& root, std::vector<std::string> ids, const Identity& who)
       : ids_(std::move(ids)) {
+    sights_.reserve(ids_.size());
     for (const std::string& id : ids_) {
       shares_.push_back(std::make_unique<Share>(root + "/" + id, std::make_shared<Cache>(1 << 20)));
       const Share::Handle handle = shares_.back()->Take();
-      readers_.emplace_back(handle.snapshot, handle.database, shares_.back()->Texts());
-      all_.add_database(handle.database);
-      eyes_.push_back(who.unrestricted ? nullptr : Eyes::Of(readers_.back(), who));
+      Reader reader(handle.snapshot, handle.database, shares_.back()->Texts());
+      auto eyes = who.unrestricted ? nullptr : Eyes::Of(reader, who);
+      sights_.emplace_back(std::move(reader), std::move(eyes), [] {});
+      all_.add_database(SeenOf(handle.database, sights_.back()));
     }
-    for (Reader& reader : readers_) pointers_.push_back(&reader);
   }
 
   /// The page's matches, and the total.
   std::pair<std::vector<Ranked>, std::uint64_t> Search(const Query& query,
                                                        const SearchOptions& options) {
     Xapian::Enquire enquire(all_);
-    enquire.set_query(QueryOf(Planner(pointers_, ids_).PlanOf(query)));
+    enquire.set_query(QueryOf(Planner(sights_, ids_).PlanOf(query)));
     const Xapian::MSet set = enquire.get_mset(0, all_.get_doccount());
     std::vector<Ranked> found;
     for (auto match = set.begin(); match != set.end(); ++match) {
       const std::size_t share = (*match - 1) % ids_.size();
       const auto id = static_cast<DocumentId>((*match - 1) / ids_.size() + 1);
-      const Xapian::Document document = match.get_document();
-      if (eyes_[share] && !eyes_[share]->Sees(Place::Decode(document.get_value(kPlaceSlot)))) {
-        continue;
-      }
       double weight = match.get_weight();
       const auto boost = options.boosts.find({share, id});
       if (boost != options.boosts.end()) weight += 10 * boost->second;
-      found.push_back({share, id, weight, KeyOf(document, options)});
+      found.push_back({share, id, weight, KeyOf(match.get_document(), options)});
     }
     std::stable_sort(found.begin(), found.end(), [](const Ranked& a, const Ranked& b) {
-      return std::tie(b.key, b.weight, a.document, a.share) <
-             std::tie(a.key, a.weight, b.document, b.share);
+      return std::tie(b.key, b.weight) < std::tie(a.key, a.weight);
     });
     const std::size_t total = found.size();
     found.erase(found.begin(),
@@ -63,6 +58,17 @@ class Oracle {
   }
 
  private:
+  static Xapian::Database SeenOf(const Xapian::Database& from, const Sight& sight) {
+    Xapian::WritableDatabase to(std::string(), Xapian::DB_BACKEND_INMEMORY);
+    for (auto id = from.postlist_begin({}); id != from.postlist_end({}); ++id) {
+      const Xapian::Document document = from.get_document(*id);
+      if (sight.Sees(Place::Decode(document.get_value(kPlaceSlot)))) {
+        to.replace_document(*id, document);
+      }
+    }
+    return to;
+  }
+
   static double KeyOf(const Xapian::Document& document, const SearchOptions& options) {
     if (options.sort_field.empty()) return 0;
     const double key = Xapian::sortable_unserialise(
@@ -86,6 +92,9 @@ class Oracle {
         break;
       case Plan::Kind::kTerm:
         query = Op(plan.term);
+        break;
+      case Plan::Kind::kPrefix:
+        query = Op(Op::OP_WILDCARD, plan.term);
         break;
       case Plan::Kind::kPositions:
         query = Op(Op::OP_PHRASE, plan.words.begin(), plan.words.end(),
@@ -115,9 +124,7 @@ class Oracle {
 
   const std::vector<std::string> ids_;
   std::vector<std::unique_ptr<Share>> shares_;
-  std::deque<Reader> readers_;
-  std::vector<Reader*> pointers_;
-  std::vector<std::shared_ptr<const Eyes>> eyes_;
+  std::vector<Sight> sights_;
   Xapian::Database all_;
 };
 

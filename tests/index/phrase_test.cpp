@@ -87,7 +87,10 @@ TEST(WordFinderTest, FindsWhatTheTokenizerFinds) {
     std::vector<std::string> words_wanted = babble.Words(1 + babble.Below(12));
     std::sort(words_wanted.begin(), words_wanted.end());
     words_wanted.erase(std::unique(words_wanted.begin(), words_wanted.end()), words_wanted.end());
-    const std::vector<MarkGroup> groups = {{"", words_wanted, false}, {"", babble.Words(2), true}};
+    using Kind = MarkGroup::Kind;
+    const std::vector<MarkGroup> groups = {{"", words_wanted},
+                                           {"", babble.Words(2), Kind::kPhrase},
+                                           {"", {babble.Words(1)[0].substr(0, 1)}, Kind::kPrefix}};
     std::vector<std::pair<std::size_t, std::size_t>> expected;
     std::vector<Token> tokens;
     std::vector<std::string> words;
@@ -98,11 +101,13 @@ TEST(WordFinderTest, FindsWhatTheTokenizerFinds) {
     });
     for (std::size_t i = 0; i < tokens.size(); ++i) {
       for (const MarkGroup& group : groups) {
-        const bool here = group.phrase
-                              ? i + 1 < words.size() && words[i] == group.words[0] &&
-                                    words[i + 1] == group.words[1]
-                              : std::count(words_wanted.begin(), words_wanted.end(), words[i]) > 0;
-        if (here) expected.emplace_back(tokens[i].begin, tokens[i + group.phrase].end);
+        const bool phrase = group.kind == Kind::kPhrase;
+        const bool here = phrase ? i + 1 < words.size() && words[i] == group.words[0] &&
+                                       words[i + 1] == group.words[1]
+                          : group.kind == Kind::kPrefix
+                              ? words[i].starts_with(group.words[0])
+                              : std::ranges::count(group.words, words[i]) > 0;
+        if (here) expected.emplace_back(tokens[i].begin, tokens[i + phrase].end);
       }
     }
     std::vector<std::pair<std::size_t, std::size_t>> found;

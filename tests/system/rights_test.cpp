@@ -184,8 +184,9 @@ TEST(Rights, RememberedOnesAreThoseOfNow) {
   constexpr time_t kAtOnce = -1000;
   maru::RightsCache cache(kAtOnce);
   FileRights known, now;
+  struct stat seen {};
   const auto agree = [&](const char* path) {
-    EXPECT_TRUE(cache.Read(directory, path, known));
+    EXPECT_TRUE(cache.Read(directory, path, known, seen));
     EXPECT_TRUE(maru::ReadFileRights(directory, path, now));
     return known == now;
   };
@@ -217,7 +218,7 @@ TEST(Rights, RememberedOnesAreThoseOfNow) {
   EXPECT_TRUE(agree("file"));
   EXPECT_EQ(known.mode, 0604);
   unlink(file.c_str());
-  EXPECT_FALSE(cache.Read(directory, "file", known));
+  EXPECT_FALSE(cache.Read(directory, "file", known, seen));
   EXPECT_EQ(errno, ENOENT);
   close(directory);
 }
