@@ -23,8 +23,7 @@ TEST_F(DaemonTest, TheServiceCanExamineAllFilesAndOpenNone) {
   File("photo/shut/secret.txt", "word", 0600, games_.uid);
   ASSERT_EQ(chmod((root_ + "/photo/shut").c_str(), 0700), 0);
   ASSERT_EQ(chown((root_ + "/photo/shut").c_str(), games_.uid, 0), 0);
-  index::Hit hit;
-  hit.path = "/shut/secret.txt";
+  const index::Hit hit = HitAt("photo", "/shut/secret.txt");
   const Scope scope{{games_, "games"}, {{"fileindex_photo", table_->Find("photo")}}, table_};
   const std::string secret = root_ + "/photo/shut/secret.txt";
   const int result = InChild([&] {

@@ -148,6 +148,16 @@ class DaemonTest : public testing::Test {
   UsageStore usage_;
   Core core_{.indices = indices_, .usage = usage_};
 
+  /// A hit as the index has it for what lies at a path of a share.
+  index::Hit HitAt(const std::string& share, const std::string& path) const {
+    const index::Document document = DocumentOf(root_ + "/" + share + path, 0);
+    index::Hit hit;
+    hit.path = path;
+    hit.record.inode = document.inode;
+    hit.record.is_dir = document.is_dir;
+    return hit;
+  }
+
  private:
   void IndexFolder(index::Writer& writer, const std::string& path, index::DirectoryId parent,
                    index::Entry& entry) {

@@ -159,10 +159,29 @@ TEST_F(SearchTest, NoPathIsFollowedWithoutEnd) {
   for (std::size_t depth = 1; depth < kMaxPathDepth; ++depth) path += "/d";
   File(path + "/d/f", "word");
   const Scope scope{{bin_, "bin"}, {{"fileindex_photo", table_->Find("photo")}}, table_};
-  index::Hit last, deeper;
-  last.path = path.substr(std::string("/photo").size()) + "/d";
-  deeper.path = last.path + "/f";
+  const index::Hit last = HitAt("photo", path.substr(std::string("/photo").size()) + "/d");
+  const index::Hit deeper = HitAt("photo", last.path + "/f");
   EXPECT_EQ(ReadableNow(scope, {last, deeper}), (std::vector<bool>{true, false}));
+}
+
+/// What took the place of a file that was indexed is not that file.
+TEST_F(SearchTest, AnotherFileInItsPlaceIsNoHit) {
+  const std::string path = root_ + "/photo/a.txt", other = root_ + "/photo/b.txt";
+  File("photo/a.txt", "word");
+  File("photo/b.txt", "else");
+  Index();
+  ASSERT_EQ(Names(bin_, "word"), (Strings{"a.txt"}));
+  const std::function<void()> takes[] = {
+      [&] { std::filesystem::create_symlink("b.txt", path); }, [&] { mkfifo(path.c_str(), 0644); },
+      [&] { mkdir(path.c_str(), 0755); }, [&] { std::filesystem::rename(other, path); }};
+  for (const auto& take : takes) {
+    std::filesystem::rename(path, root_ + "/aside");
+    take();
+    EXPECT_EQ(Names(bin_, "word"), (Strings{}));
+    std::filesystem::remove(path);
+    std::filesystem::rename(root_ + "/aside", path);
+    EXPECT_EQ(Names(bin_, "word"), (Strings{"a.txt"}));
+  }
 }
 
 TEST_F(SearchTest, NobodySeesMoreThanTheirOwn) {
