@@ -9,6 +9,7 @@
 #include <utility>
 
 #include "server/host/child.h"
+#include "server/host/left_behind.h"
 #include "system/log.h"
 
 namespace maru::server {
@@ -147,6 +148,14 @@ void Children::EndOverdue(Seconds now) {
   }
 }
 
+void Children::EndStopped(pid_t pid) {
+  errno = 0;
+  MARU_LOG("Process %d was stopped and is ended", pid);
+  const auto found = busy_.find(pid);
+  if (found != busy_.end()) found->second.overdue = true;
+  kill(pid, SIGKILL);
+}
+
 std::optional<Children::Finished> Children::Reaped(pid_t pid, int wait_status, Seconds now) {
   errno = 0;  // for what is logged of the end of another process
   if (std::erase_if(fresh_, [&](const Child& child) { return child.pid == pid; })) {
@@ -155,6 +164,7 @@ std::optional<Children::Finished> Children::Reaped(pid_t pid, int wait_status, S
     return std::nullopt;
   }
   std::erase_if(rested_, [&](const RestedChild& rested) { return rested.child.pid == pid; });
+  RemoveFilesOf(pid);
   const auto found = busy_.find(pid);
   if (found == busy_.end()) return std::nullopt;
   BusyChild& child = found->second;

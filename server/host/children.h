@@ -46,8 +46,11 @@ class Children {
   std::optional<Finished> Hear(pid_t pid, Seconds now);
   /// Ends the children that have worked too long, and lets those go that have rested long enough.
   void EndOverdue(Seconds now);
-  /// To be told of every process that was waited for. Tells the front when the child went without
-  /// an answer. Nothing for a process that was not at work here.
+  /// To be told of every process that was stopped: users can stop those that act as they do, which
+  /// then hold places for nothing. Ends it.
+  void EndStopped(pid_t pid);
+  /// To be told of every process that was waited for. Removes what it left behind. Tells the front
+  /// when the child went without an answer. Nothing for a process that was not at work here.
   std::optional<Finished> Reaped(pid_t pid, int wait_status, Seconds now);
 
   std::size_t Idle() const { return fresh_.size() + rested_.size(); }

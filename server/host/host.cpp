@@ -146,7 +146,11 @@ void Host::TakeSignals() {
 void Host::ReapAll() {
   int status = 0;
   pid_t pid;
-  while ((pid = waitpid(-1, &status, WNOHANG)) > 0) {
+  while ((pid = waitpid(-1, &status, WNOHANG | WUNTRACED)) > 0) {
+    if (WIFSTOPPED(status)) {
+      children_.EndStopped(pid);
+      continue;
+    }
     if (auto outcome = sign_ins_.Reaped(pid)) FinishSignIn(std::move(*outcome));
     End(children_.Reaped(pid, status, Now()));
   }

@@ -1,8 +1,11 @@
 #!/usr/bin/python3
 """Bursts of queries, of which the newest wins, and the history, which no answer waits for."""
 
+import contextlib
+import os
 import pathlib
 import pwd
+import signal
 import sqlite3
 import threading
 import unittest
@@ -50,6 +53,14 @@ class QueriesTest(road.RoadTest):
         return self.services.begin(self.services.connect(), "POST", road.SEARCH_PATH, request,
                                    self.token)
 
+    def left_behind(self):
+        """What stands in the private /tmp of the processes that serve requests."""
+        for name in pathlib.Path("/proc").glob("[0-9]*/comm"):
+            with contextlib.suppress(OSError):
+                if name.read_text() == "maruweb-host\n":
+                    return os.listdir(name.parent / "root/tmp")
+        raise AssertionError("there is no host")
+
     def assert_served_as_ever(self):
         hit = {"MARUMDPath": "/volume1/docs/welcome.txt", "MARUMDOwnerUserID": "0"}
         with fake_daemon.FakeDaemon(fake_daemon.replies({"total": 1}, hit, {"success": True})):
@@ -57,6 +68,7 @@ class QueriesTest(road.RoadTest):
                                query_serial=1)
             self.assertEqual(1, data["total"])
         road.wait_until(lambda: not processes_of(ALICE) and not zombies(), "no process left behind")
+        self.assertEqual([], self.left_behind())
 
     def test_each_newer_query_ends_the_older_one(self):
         answer = threading.Event()
@@ -105,6 +117,23 @@ class QueriesTest(road.RoadTest):
             # The browser goes away: the process that serves it ends.
             newer.close()
             road.wait_until(lambda: not processes_of(ALICE), "the query to end with its client")
+        self.assert_served_as_ever()
+
+
+    def test_a_stopped_process_is_ended(self):
+        with fake_daemon.FakeDaemon(fake_daemon.silence) as daemon:
+            query = self.send(1, "stopped")
+            road.wait_until(lambda: daemon.requests, "the query")
+
+            def stop_all():
+                for pid in processes_of(ALICE):
+                    with contextlib.suppress(OSError):
+                        if pid != os.getpid():
+                            os.kill(pid, signal.SIGSTOP)
+
+            road.as_user("alice", stop_all)
+            status, answer = self.services.finish(query)
+            self.assertEqual((500, 117), (status, answer["error"]["code"]))
         self.assert_served_as_ever()
 
 
