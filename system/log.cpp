@@ -6,12 +6,29 @@
 #include <syslog.h>
 #include <unistd.h>
 
+#include <atomic>
+#include <limits>
 #include <new>
 #include <string>
 #include <system_error>
 
 namespace maru {
 namespace {
+
+// Bytes of messages that may be written yet; below 0 once the end has been told.
+std::atomic<long> room = std::numeric_limits<long>::max();
+
+/// Cuts a message to what may be written of it; false when it is left out.
+bool Limit(std::string& message) {
+  const long size = static_cast<long>(message.size());
+  const long left = room.fetch_sub(size);
+  if (size <= left) return true;
+  room = -1;
+  if (left < 0) return false;
+  message.resize(static_cast<std::size_t>(left));
+  message += " (cut; further messages are left out)";
+  return true;
+}
 
 // What OpenLog was told, for after a fork.
 const char* log_program = nullptr;
@@ -51,11 +68,13 @@ void LogLine(const char* file, int line, const char* function, const char* forma
   va_list arguments;
   va_start(arguments, format);
   try {
-    const std::string message = Printable(Format(format, arguments));
+    std::string message = Printable(Format(format, arguments));
     const std::string cause =
         error ? " [err: " + std::generic_category().message(error) + "]" : std::string();
-    syslog(LOG_ERR, "%s:%d (%d, %u) (%s) %s%s", file, line, getpid(), geteuid(), function,
-           message.c_str(), cause.c_str());
+    if (Limit(message)) {
+      syslog(LOG_ERR, "%s:%d (%d, %u) (%s) %s%s", file, line, getpid(), geteuid(), function,
+             message.c_str(), cause.c_str());
+    }
   } catch (const std::bad_alloc&) {
     syslog(LOG_ERR, "%s:%d (%d, %u) (%s) %s", file, line, getpid(), geteuid(), function, format);
   }
@@ -67,6 +86,10 @@ void OpenLog(const char* program, bool foreground) {
   log_program = program;
   log_options = LOG_PID | (foreground ? LOG_PERROR : 0);
   ReopenLog();
+}
+
+void LimitLog(long bytes) {
+  room = bytes;
 }
 
 void ReopenLog() {

@@ -19,6 +19,11 @@ void LogLine(const char* file, int line, const char* function, const char* forma
 /// standard error.
 void OpenLog(const char* program, bool foreground);
 
+/// From now on, until it is called again, this process writes at most `bytes` of messages: what one
+/// request has to say must not fill the log. A message that is too long is cut, and the first that
+/// is left out is told of.
+void LimitLog(long bytes);
+
 /// Lets go of the log's descriptor; the next line opens the log anew, as OpenLog said.
 void ReopenLog();
 

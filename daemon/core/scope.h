@@ -10,7 +10,8 @@
 /// What a request may see: whose eyes, and which indices.
 namespace maru::daemon {
 
-constexpr std::size_t kMaxIndices = 1024;
+/// Names of indices in one request: each counts once.
+constexpr std::size_t kMaxIndices = 65'536;
 /// Bytes of an index id.
 constexpr std::size_t kMaxIndexId = 300;
 

@@ -155,11 +155,16 @@ void WarmUp() {
   Success(params);
 }
 
+/// What one request may write into the log, in bytes: its parameters, thousands of them, may each
+/// be worth a line.
+constexpr long kMaxLogged = 64 << 10;
+
 /// Serves the request in `packet`. Not 0 when the child is not to go on: the status to end with.
 int ServeOne(const UniqueFd& tasks, Packet& packet, const Plugin& plugin) {
   const auto task = UnpackTask(packet.View());
   const UniqueFd socket = std::move(packet.passed);
   ForgetAccounts();
+  LimitLog(kMaxLogged);
   if (!task || !socket) return 1;
   Reply reply(socket, tasks);
   try {
