@@ -31,9 +31,10 @@ bool Receive(int socket, std::string& into, std::size_t size, Deadline deadline)
   return true;
 }
 
-/// What came from the other side is bytes to be checked, like any file.
+/// What came from the other side is bytes to be checked, like any file, and no converter is for
+/// this process.
 std::string Clean(std::string text, std::size_t limit) {
-  if (!IsUTF8(text)) text = ToUTF8(text, "UTF-8");
+  if (!IsUTF8(text)) text = RepairUTF8(text);
   CutUTF8(text, limit);
   return text;
 }
