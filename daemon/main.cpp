@@ -15,7 +15,9 @@
 #include "system/accounts.h"
 #include "system/config.h"
 #include "system/daemon_connection.h"
+#include "system/indexed_shares.h"
 #include "system/log.h"
+#include "system/service_identity.h"
 
 namespace {
 
@@ -45,12 +47,12 @@ int Serve(const Config& config) {
   RaiseDescriptorLimit();
   const Identity identity = FutureIdentity();
   const Listener listener(kDaemonSocket, identity);
-  DropPrivileges(kServiceAccount);
+  BecomeDaemon(kServiceAccount);
   if (!HoldsReadSearch()) {
     MARU_LOG("Running without CAP_DAC_READ_SEARCH: only files that user %u can reach are shown",
              geteuid());
   }
-  LibraryIndices indices(config.state_dir + "/index");
+  LibraryIndices indices(IndexHome());
   UsageStore usage(config.state_dir + "/usage.db");
   Core core{.indices = indices, .usage = usage};
   core.history = history::NewestSearches;

@@ -53,8 +53,8 @@ const std::string* OneColumn(const Condition::Node& node, std::vector<const Valu
 }
 
 bool IsOperator(std::string_view op) {
-  constexpr std::array<std::string_view, 6> operators{"=", "!=", "<", "<=", ">", ">="};
-  return std::find(operators.begin(), operators.end(), op) != operators.end();
+  constexpr std::array<std::string_view, 6> kOperators{"=", "!=", "<", "<=", ">", ">="};
+  return std::find(kOperators.begin(), kOperators.end(), op) != kOperators.end();
 }
 
 }  // namespace

@@ -29,7 +29,7 @@ class Keeper {
   /// Commits what is done and ends, promptly.
   ~Keeper();
 
-  const Target& Share() const { return target_; }
+  const Target& Keeps() const { return target_; }
   /// A crawl as soon as it may be.
   void CrawlSoon();
   /// What it has done so far.

@@ -16,7 +16,9 @@
 #include "indexer/service.h"
 #include "program/program.h"
 #include "system/config.h"
+#include "system/indexed_shares.h"
 #include "system/log.h"
+#include "system/service_identity.h"
 #include "system/throw_errno.h"
 
 namespace maru::indexer {
@@ -121,7 +123,7 @@ int RunOnce(const Options& options, Workers& workers, const sigset_t& signals) {
 
 int Run(const Options& options) {
   if (options.once) OpenLog(kProgram, true);
-  const Sight sight = DropPrivileges();
+  const Sight sight = BecomeIndexer();
   sigset_t signals;
   BlockSignals(signals);
   RaiseDescriptorLimit();

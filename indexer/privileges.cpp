@@ -10,6 +10,7 @@
 
 #include "system/accounts.h"
 #include "system/config.h"
+#include "system/indexed_shares.h"
 #include "system/service_identity.h"
 #include "system/throw_errno.h"
 
@@ -35,7 +36,7 @@ void MakeFolder(const std::string& path, const Account* owner) {
 
 void MakeFolders(const Account* owner) {
   MakeFolder(Config::Get().state_dir, owner);
-  MakeFolder(Config::Get().state_dir + "/index", owner);
+  MakeFolder(IndexHome(), owner);
 }
 
 bool ReadsEverything() {
@@ -45,15 +46,14 @@ bool ReadsEverything() {
 
 }  // namespace
 
-Sight DropPrivileges() {
+Sight BecomeIndexer() {
   if (geteuid() == 0) {
     const Account account = ServiceAccount();
     MakeFolders(&account);
-    BecomeForGood(kServiceAccount, Kept::kReadSearch);
   } else {
     MakeFolders(nullptr);
-    GiveUpNewPrivileges();
   }
+  DropPrivileges(kServiceAccount, Keep::kReadSearch);
   return ReadsEverything() ? Sight::kAll : Sight::kOwn;
 }
 

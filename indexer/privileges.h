@@ -9,10 +9,8 @@ enum class Sight {
   kOwn,
 };
 
-/// Makes sure that the folders for the indices exist, then, for a process started as root, becomes
-/// the service account with no right of root's but to read every file (CAP_DAC_READ_SEARCH), and
-/// never a new one. A process without such rights stays who it is. Throws std::runtime_error.
-/// Before threads.
-Sight DropPrivileges();
+/// Makes sure that the folders for the indices exist, then drops the privileges of root but the one
+/// to read every file. Throws std::runtime_error. Before threads.
+Sight BecomeIndexer();
 
 }  // namespace maru::indexer

@@ -57,11 +57,11 @@ void Service::Reconcile() {
   const std::shared_ptr<const ShareTable> table = ShareTable::Current();
   const Targets targets = FindTargets(*table);
   std::erase_if(keepers_, [&](const std::unique_ptr<Keeper>& keeper) {
-    return std::find(targets.present.begin(), targets.present.end(), keeper->Share()) ==
+    return std::find(targets.present.begin(), targets.present.end(), keeper->Keeps()) ==
            targets.present.end();
   });
   std::vector<std::string> used;
-  for (const auto& keeper : keepers_) used.push_back(keeper->Share().index_folder);
+  for (const auto& keeper : keepers_) used.push_back(keeper->Keeps().index_folder);
   RemoveForeignIndices(*table, used);
   for (const Target& target : targets.present) {
     if (Contains(used, target.index_folder)) continue;

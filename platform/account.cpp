@@ -96,18 +96,18 @@ int MLIBGroupIsAdminGroupMem(const char* user_name, int) {
 }
 
 MLIBCSzList* MLIBGroupInfoListGet(const char* user_name, bool with_primary) {
-  constexpr MLIBCSzList* none = nullptr;
-  if (!user_name) return Fail(kErrBadParameter, none);
-  return Guarded("MLIBGroupInfoListGet", none, [&] {
+  constexpr MLIBCSzList* kNone = nullptr;
+  if (!user_name) return Fail(kErrBadParameter, kNone);
+  return Guarded("MLIBGroupInfoListGet", kNone, [&] {
     const std::optional<Account> account = maru::AccountByName(user_name);
-    if (!account) return Fail(LookupError(), none);
+    if (!account) return Fail(LookupError(), kNone);
     const auto groups = maru::GroupsOf(*account);
     MLIBCSzList* list = groups ? MLIBCSzListAlloc(static_cast<int>(groups->size())) : nullptr;
-    if (!list) return Fail(kErrSystem, none);
+    if (!list) return Fail(kErrSystem, kNone);
     for (std::size_t i = with_primary ? 0 : 1; i < groups->size(); ++i) {
       if (MLIBCSzListPush(&list, std::to_string((*groups)[i]).c_str()) < 0) {
         MLIBCSzListFree(list);
-        return Fail(kErrSystem, none);
+        return Fail(kErrSystem, kNone);
       }
     }
     return list;

@@ -2,7 +2,6 @@
 
 #include <errno.h>
 #include <stdio.h>
-#include <sys/resource.h>
 
 #include <CLI/CLI.hpp>
 #include <exception>
@@ -79,13 +78,6 @@ int RunProgram(const Program& program, int argc, char** argv) {
     Tell(program, log_name, error.what());
     return program.failed;
   }
-}
-
-void RaiseDescriptorLimit() {
-  rlimit limit{};
-  if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return;
-  limit.rlim_cur = limit.rlim_max;
-  setrlimit(RLIMIT_NOFILE, &limit);
 }
 
 }  // namespace maru

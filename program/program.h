@@ -51,7 +51,4 @@ inline constexpr int kUsageStatus = 2;
 /// --config beside the program's own arguments. An exception's text goes to standard error.
 int RunProgram(const Program& program, int argc, char** argv);
 
-/// As many open files as the system lets this process have.
-void RaiseDescriptorLimit();
-
 }  // namespace maru

@@ -53,8 +53,8 @@ void NotifyReady() {
   if (path[0] == '@') address.sun_path[0] = '\0';
   const UniqueFd socket(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
   const auto size = static_cast<socklen_t>(offsetof(sockaddr_un, sun_path) + strlen(path));
-  constexpr std::string_view text = "READY=1";
-  if (sendto(socket.Get(), text.data(), text.size(), MSG_NOSIGNAL,
+  constexpr std::string_view kText = "READY=1";
+  if (sendto(socket.Get(), kText.data(), kText.size(), MSG_NOSIGNAL,
              reinterpret_cast<const sockaddr*>(&address), size) < 0)
     MARU_LOG("Cannot tell the service manager that the web server is ready");
 }
@@ -202,12 +202,12 @@ bool Supervisor::Reap(Part& part) {
 }
 
 void Supervisor::End(Part& part) {
-  constexpr int step = 10;
+  constexpr int kStep = 10;
   if (part.pid <= 0) return;
   kill(part.pid, SIGTERM);
-  for (int waited = 0; waited < kEndWithin; waited += step) {
+  for (int waited = 0; waited < kEndWithin; waited += kStep) {
     if (Reap(part)) return;
-    poll(nullptr, 0, step);
+    poll(nullptr, 0, kStep);
   }
   errno = 0;
   MARU_LOG("The %s does not end and is killed", part.name);

@@ -99,19 +99,19 @@ class StrictnessCheck {
   }
 
   const char* Number() {
-    constexpr const char* malformed = "a malformed number";
+    constexpr const char* kMalformed = "a malformed number";
     if (Peek() == '-') ++at_;
     const bool zero = Peek() == '0';
     const std::size_t digits = Digits();
-    if (digits == 0 || (zero && digits > 1)) return malformed;
+    if (digits == 0 || (zero && digits > 1)) return kMalformed;
     if (Peek() == '.') {
       ++at_;
-      if (Digits() == 0) return malformed;
+      if (Digits() == 0) return kMalformed;
     }
     if (Peek() == 'e' || Peek() == 'E') {
       ++at_;
       if (Peek() == '+' || Peek() == '-') ++at_;
-      if (Digits() == 0) return malformed;
+      if (Digits() == 0) return kMalformed;
     }
     return nullptr;
   }

@@ -3,6 +3,7 @@
 #include <cap-ng.h>
 #include <errno.h>
 #include <sys/prctl.h>
+#include <sys/resource.h>
 #include <unistd.h>
 
 #include <stdexcept>
@@ -12,7 +13,7 @@
 
 namespace maru {
 
-void BecomeForGood(const std::string& account, Kept kept) {
+void BecomeForGood(const std::string& account, Keep keep) {
   const std::optional<Account> found = AccountByName(account);
   if (!found) throw std::runtime_error("There is no account " + account);
   const uid_t uid = found->uid;
@@ -22,7 +23,7 @@ void BecomeForGood(const std::string& account, Kept kept) {
   capng_get_caps_process();
   const bool holds = capng_have_capability(CAPNG_PERMITTED, CAP_DAC_READ_SEARCH) == 1;
   capng_clear(CAPNG_SELECT_BOTH);
-  if (kept == Kept::kReadSearch && holds) {
+  if (keep == Keep::kReadSearch && holds) {
     capng_update(CAPNG_ADD, static_cast<capng_type_t>(CAPNG_EFFECTIVE | CAPNG_PERMITTED),
                  CAP_DAC_READ_SEARCH);
   }
@@ -42,6 +43,18 @@ void BecomeForGood(const std::string& account, Kept kept) {
 
 void GiveUpNewPrivileges() {
   CheckErrno(prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) == 0, "Cannot give up new privileges");
+}
+
+void DropPrivileges(const std::string& account, Keep keep) {
+  if (geteuid() != 0) return GiveUpNewPrivileges();
+  BecomeForGood(account, keep);
+}
+
+void RaiseDescriptorLimit() {
+  rlimit limit{};
+  if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return;
+  limit.rlim_cur = limit.rlim_max;
+  setrlimit(RLIMIT_NOFILE, &limit);
 }
 
 }  // namespace maru

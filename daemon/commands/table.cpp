@@ -6,7 +6,7 @@
 namespace maru::daemon {
 
 std::span<const Command> Commands() {
-  static constexpr std::array table = {
+  static constexpr std::array kTable = {
       Command{"explain", ExplainCommand},
       Command{"highlight", HighlightCommand},
       Command{"indicate", IndicateCommand},
@@ -16,7 +16,7 @@ std::span<const Command> Commands() {
       Command{"status", StatusCommand},
       Command{"term_suggest", TermSuggestCommand},
   };
-  return table;
+  return kTable;
 }
 
 }  // namespace maru::daemon

@@ -20,9 +20,8 @@ void SetEffective(bool on) {
 
 }  // namespace
 
-void DropPrivileges(const std::string& account) {
-  if (geteuid() != 0) return GiveUpNewPrivileges();
-  BecomeForGood(account, Kept::kReadSearch);
+void BecomeDaemon(const std::string& account) {
+  DropPrivileges(account, Keep::kReadSearch);
   capng_get_caps_process();
   holds_capability = capng_have_capability(CAPNG_PERMITTED, CAP_DAC_READ_SEARCH) == 1;
   if (holds_capability) SetEffective(false);

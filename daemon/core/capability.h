@@ -4,11 +4,9 @@
 
 namespace maru::daemon {
 
-/// Started as root: becomes `account` for good, with no right of root left but CAP_DAC_READ_SEARCH,
-/// which lies unused until RaisedReadSearch. Started as anybody else: keeps what identity it has.
-/// Either way no execve can win rights again. Once, before threads start; throws
-/// std::runtime_error, and the process is then to end.
-void DropPrivileges(const std::string& account);
+/// Drops the privileges of root but CAP_DAC_READ_SEARCH, which lies unused until RaisedReadSearch.
+/// Once, before threads start; throws std::runtime_error, and the process is then to end.
+void BecomeDaemon(const std::string& account);
 
 /// Whether the process can look at every file's rights: it is root or holds CAP_DAC_READ_SEARCH.
 bool HoldsReadSearch();

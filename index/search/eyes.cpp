@@ -9,8 +9,6 @@ constexpr char kEyes = 'e';
 constexpr char kSeenBlock = 'v';
 /// Judging so many documents one by one costs as much as judging a block.
 constexpr std::uint64_t kSeenPrice = 1024;
-/// A folder's way up is no longer than this; a longer one, or a ring, counts as not connected.
-constexpr unsigned kMaxDepth = 100'000;
 
 std::uint32_t NewNumber() {
   static std::atomic<std::uint32_t> last = 0;

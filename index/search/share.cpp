@@ -11,30 +11,27 @@ namespace {
 
 constexpr std::size_t kIdleHandles = 16;
 
-/// Renamed and filled folders keep their inode: only that tells them apart.
-FileIdentity FolderIdentity(const std::string& path) {
-  FileIdentity folder = FileIdentity::Of(path);
-  folder.changed_ns = 0;
-  return folder;
+Share::Version VersionOf(const std::string& path) {
+  struct stat status {};
+  if (stat(path.c_str(), &status) != 0) return {};
+  return {IdOf(status),
+          status.st_ctim.tv_sec * std::int64_t{1'000'000'000} + status.st_ctim.tv_nsec};
+}
+
+FileId FolderOf(const std::string& path) {
+  return VersionOf(path).file;
 }
 
 }  // namespace
 
-FileIdentity FileIdentity::Of(const std::string& path) {
-  struct stat status {};
-  if (stat(path.c_str(), &status) != 0) return {};
-  return {status.st_dev, status.st_ino,
-          status.st_ctim.tv_sec * std::int64_t{1'000'000'000} + status.st_ctim.tv_nsec};
-}
-
 Share::Share(const std::string& folder, std::shared_ptr<Cache> cache)
     : path_(folder + kDatabaseFolder),
-      folder_(FolderIdentity(path_)),
+      folder_(FolderOf(path_)),
       cache_(std::move(cache)),
       texts_(folder) {}
 
 bool Share::IsCurrent() const {
-  return FolderIdentity(path_) == folder_;
+  return FolderOf(path_) == folder_;
 }
 
 /// Of the commit that `database` is at: the newest one, or one made from it.
@@ -63,7 +60,7 @@ Share::Handle Share::Take() {
   }
   // Every commit puts a new version file in place of the old one. Looked at before the database: a
   // commit in between is met the next time.
-  const FileIdentity version = FileIdentity::Of(path_ + kVersionFile);
+  const Version version = VersionOf(path_ + kVersionFile);
   if (handle && handle->version == version) return std::move(*handle);
   if (handle) {
     handle->database.reopen();

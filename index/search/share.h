@@ -11,18 +11,9 @@
 #include "index/search/reader.h"
 #include "index/search/snapshot.h"
 #include "index/store/texts.h"
+#include "system/file_id.h"
 
 namespace maru::index {
-
-/// Tells a file from the one that took its place.
-struct FileIdentity {
-  std::uint64_t device = 0;
-  std::uint64_t inode = 0;
-  std::int64_t changed_ns = 0;
-
-  static FileIdentity Of(const std::string& path);
-  friend bool operator==(const FileIdentity&, const FileIdentity&) = default;
-};
 
 /// One index folder: its newest snapshot, handles that wait to be used again, its stored texts.
 /// Thread-safe. Throws the engine's errors.
@@ -30,11 +21,18 @@ class Share {
  public:
   Share(const std::string& folder, std::shared_ptr<Cache> cache);
 
+  /// Tells a version file from the one that took its place, which may have got its inode.
+  struct Version {
+    FileId file;
+    std::int64_t changed_ns = 0;
+
+    friend bool operator==(const Version&, const Version&) = default;
+  };
   /// A handle on the newest commit, with the snapshot of it.
   struct Handle {
     Xapian::Database database;
     /// Of the version file, when the handle was last moved to the newest commit.
-    FileIdentity version;
+    Version version;
     std::shared_ptr<const Snapshot> snapshot;
   };
   Handle Take();
@@ -48,7 +46,7 @@ class Share {
   std::shared_ptr<const Snapshot> SnapshotOf(const Xapian::Database& database);
 
   const std::string path_;
-  const FileIdentity folder_;
+  const FileId folder_;
   const std::shared_ptr<Cache> cache_;
   TextReader texts_;
   std::mutex mutex_;

@@ -7,9 +7,6 @@
 namespace maru::index {
 namespace {
 
-/// A row's way up is no longer than this; a longer one, or a ring, counts as not connected.
-constexpr unsigned kMaxDepth = 100'000;
-
 void Encode(Encoder& out, const DirectoryRow& row) {
   out.Number(row.parent).Number(row.rights).String(row.name);
 }

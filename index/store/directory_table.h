@@ -12,8 +12,8 @@
 #include "system/rights.h"
 
 /// The directory table of one index: folder -> (parent, name, rights), and the distinct rights that
-/// documents and folders have. A chmod, rename or move of a folder changes one row here and no
-/// document.
+/// documents and folders have. A chmod, rename or move of a folder changes one row here and the
+/// folder's own document, and none that lies in it.
 ///
 /// It is kept in the database's metadata, in blocks of kBlockRows rows, so that it changes together
 /// with the documents; "stamps" tells in which commit each block last changed, so that a reader
@@ -21,6 +21,8 @@
 namespace maru::index {
 
 inline constexpr std::uint32_t kBlockRows = 128;
+/// A folder's way up is no longer than this; a longer one, or a ring, counts as not connected.
+inline constexpr unsigned kMaxDepth = 100'000;
 
 struct DirectoryRow {
   /// 0 for a free row and for the root.

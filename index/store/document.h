@@ -9,8 +9,9 @@
 
 namespace maru::index {
 
-/// Ids count from 1; 0 is none. A document's id is its own within its index and stays while the
-/// file is changed, renamed or moved.
+/// Ids count from 1; 0 is none. A document's id is its own within its index. It stays while the
+/// file is changed, gets another name in its folder, or a folder moves; put into another folder, a
+/// file becomes a new document.
 using DocumentId = std::uint32_t;
 using DirectoryId = std::uint32_t;
 

@@ -6,7 +6,7 @@
 
 #include "common/error.h"
 
-/// The wall where the engine's exceptions become ours. Only sources of this folder include this.
+/// The wall where the engine's exceptions become ours. Only the index's rooms include this.
 namespace maru::index {
 
 /// Runs `work`; an exception of the engine leaves as Error (121) with `doing` before its text.

@@ -124,23 +124,6 @@ std::string Convert(iconv_t converter, std::string_view bytes) {
   return text;
 }
 
-/// Valid UTF-8 with each run of other bytes replaced.
-std::string Repair(std::string_view bytes) {
-  std::string text;
-  bool replaced = false;
-  while (!bytes.empty()) {
-    const std::size_t good = UTF8Beginning(bytes);
-    text += bytes.substr(0, good);
-    bytes.remove_prefix(good);
-    if (good > 0) replaced = false;
-    if (bytes.empty()) break;
-    if (!replaced) text += kReplacement;
-    replaced = true;
-    bytes.remove_prefix(1);
-  }
-  return text;
-}
-
 }  // namespace
 
 bool IsBinary(std::string_view head) {
@@ -160,9 +143,27 @@ std::string_view TextPart(std::string_view bytes) {
 }
 
 std::optional<std::string_view> UTF8Text(std::string_view bytes) {
+  const Mark* mark = FindMark(bytes);
+  if (mark && !mark->charset) bytes.remove_prefix(mark->bytes.size());
   const std::size_t length = UTF8Beginning(bytes);
   if (length < bytes.size() && !IsCutUTF8(bytes.substr(length))) return std::nullopt;
   return bytes.substr(0, length);
+}
+
+std::string RepairUTF8(std::string_view bytes) {
+  std::string text;
+  bool replaced = false;
+  while (!bytes.empty()) {
+    const std::size_t good = UTF8Beginning(bytes);
+    text += bytes.substr(0, good);
+    bytes.remove_prefix(good);
+    if (good > 0) replaced = false;
+    if (bytes.empty()) break;
+    if (!replaced) text += kReplacement;
+    replaced = true;
+    bytes.remove_prefix(1);
+  }
+  return text;
 }
 
 void LoadCharsets() {
@@ -174,12 +175,10 @@ void LoadCharsets() {
 }
 
 std::string ToUTF8(std::string_view bytes, std::string_view declared) {
+  if (const auto text = UTF8Text(bytes)) return std::string(*text);
   const Mark* mark = FindMark(bytes);
   if (mark) bytes.remove_prefix(mark->bytes.size());
   const bool wide = mark && mark->charset;
-  if (!wide) {
-    if (const auto text = UTF8Text(bytes)) return std::string(*text);
-  }
   const char* name = wide ? mark->charset : mark ? nullptr : ConverterOf(declared);
   if (!name && !mark && !SameWord(declared, "UTF-8")) {
     const std::string guess = Guess(bytes);
@@ -187,7 +186,7 @@ std::string ToUTF8(std::string_view bytes, std::string_view declared) {
     if (!name && !SameWord(guess, "UTF-8")) name = "WINDOWS-1252";
   }
   iconv_t* converter = name ? Converter(name) : nullptr;
-  return converter ? Convert(*converter, bytes) : Repair(bytes);
+  return converter ? Convert(*converter, bytes) : RepairUTF8(bytes);
 }
 
 }  // namespace maru::extract

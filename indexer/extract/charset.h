@@ -15,8 +15,12 @@ bool IsBinary(std::string_view head);
 /// one); all of them when they are marked as UTF-16 or UTF-32.
 std::string_view TextPart(std::string_view bytes);
 
-/// All but a last character that the end cuts off; none when that is not UTF-8.
+/// Without a byte order mark, and without a last character that the end cuts off; none when that is
+/// not UTF-8. Nothing but comparisons of bytes: it and TextPart are also for processes with rights.
 std::optional<std::string_view> UTF8Text(std::string_view bytes);
+
+/// Valid UTF-8, with U+FFFD for each run of other bytes. Knows no other charset.
+std::string RepairUTF8(std::string_view bytes);
 
 /// Opens every converter, so that ToUTF8 needs no files afterwards. Before the sandbox closes.
 void LoadCharsets();

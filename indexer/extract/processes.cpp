@@ -8,8 +8,8 @@
 #include <cstring>
 
 #include "indexer/extract/charset.h"
+#include "indexer/extract/forker.h"
 #include "indexer/extract/wire.h"
-#include "indexer/extract/worker.h"
 #include "system/log.h"
 #include "system/throw_errno.h"
 #include "system/utf8.h"
@@ -31,9 +31,10 @@ bool Receive(int socket, std::string& into, std::size_t size, Deadline deadline)
   return true;
 }
 
-/// What came from the other side is bytes to be checked, like any file.
+/// What came from the other side is bytes to be checked, like any file, and no converter is for
+/// this process.
 std::string Clean(std::string text, std::size_t limit) {
-  if (!IsUTF8(text)) text = ToUTF8(text, "UTF-8");
+  if (!IsUTF8(text)) text = RepairUTF8(text);
   CutUTF8(text, limit);
   return text;
 }
@@ -62,7 +63,7 @@ Processes::Processes(unsigned slots, std::span<const Extractor> table,
   forker_pid_ = fork();
   if (forker_pid_ < 0) ThrowErrno("cannot fork");
   if (forker_pid_ == 0) RunForker(ends[1], slots, table);
-  for (unsigned slot = 0; slot < slots; ++slot) workers_.push_back(NewWorker(slot));
+  for (unsigned slot = 0; slot < slots; ++slot) processes_.push_back(NewProcess(slot));
 }
 
 Processes::~Processes() {
@@ -70,34 +71,34 @@ Processes::~Processes() {
   while (waitpid(forker_pid_, nullptr, 0) < 0 && errno == EINTR) continue;
 }
 
-UniqueFd Processes::NewWorker(unsigned slot) {
+UniqueFd Processes::NewProcess(unsigned slot) {
   const std::lock_guard lock(forker_mutex_);
   std::uint32_t number = slot;
-  UniqueFd worker;
+  UniqueFd process;
   if (!SendAll(forker_.Get(), &number, sizeof number, -1, kForever) ||
-      !ReceiveAll(forker_.Get(), &number, sizeof number, &worker, kForever) || !worker) {
+      !ReceiveAll(forker_.Get(), &number, sizeof number, &process, kForever) || !process) {
     MARU_LOG("No process to extract text with");
     return UniqueFd();
   }
-  return worker;
+  return process;
 }
 
 std::optional<Extracted> Processes::Extract(unsigned slot, std::size_t row, int file,
                                             std::size_t max_text) {
-  UniqueFd& worker = workers_[slot];
-  if (!worker) worker = NewWorker(slot);
-  if (!worker) return std::nullopt;
-  return Ask(worker, row, file, max_text);
+  UniqueFd& process = processes_[slot];
+  if (!process) process = NewProcess(slot);
+  if (!process) return std::nullopt;
+  return Ask(process, row, file, max_text);
 }
 
-std::optional<Extracted> Processes::Ask(UniqueFd& worker, std::size_t row, int file,
+std::optional<Extracted> Processes::Ask(UniqueFd& process, std::size_t row, int file,
                                         std::size_t max_text) {
   const Deadline deadline = std::chrono::steady_clock::now() + timeout_;
   const Request request{static_cast<std::uint32_t>(row), max_text};
   Reply reply{};
   Extracted extracted;
   std::string authors;
-  const int socket = worker.Get();
+  const int socket = process.Get();
   const bool answered = SendAll(socket, &request, sizeof request, file, deadline) &&
                         ReceiveAll(socket, &reply, sizeof reply, nullptr, deadline);
   if (answered && reply.good == 0) return std::nullopt;
@@ -111,7 +112,7 @@ std::optional<Extracted> Processes::Ask(UniqueFd& worker, std::size_t row, int f
     return extracted;
   }
   MARU_LOG("A process that extracts text failed and is replaced");
-  worker = UniqueFd();
+  process = UniqueFd();
   return std::nullopt;
 }
 

@@ -29,18 +29,18 @@ class Processes {
   Processes(const Processes&) = delete;
   Processes& operator=(const Processes&) = delete;
 
-  unsigned Slots() const { return static_cast<unsigned>(workers_.size()); }
+  unsigned Slots() const { return static_cast<unsigned>(processes_.size()); }
 
   /// Has the process of `slot` run the extractor `row` on an open file. None when it failed. Each
   /// slot by one thread at a time.
   std::optional<Extracted> Extract(unsigned slot, std::size_t row, int file, std::size_t max_text);
 
  private:
-  std::optional<Extracted> Ask(UniqueFd& worker, std::size_t row, int file, std::size_t max_text);
-  UniqueFd NewWorker(unsigned slot);
+  std::optional<Extracted> Ask(UniqueFd& process, std::size_t row, int file, std::size_t max_text);
+  UniqueFd NewProcess(unsigned slot);
 
   const std::chrono::milliseconds timeout_;
-  std::vector<UniqueFd> workers_;
+  std::vector<UniqueFd> processes_;
   std::mutex forker_mutex_;
   UniqueFd forker_;
   int forker_pid_ = -1;

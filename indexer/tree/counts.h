@@ -5,7 +5,8 @@
 
 namespace maru::indexer {
 
-/// What a crawl has done so far. Written by the crawl's threads, read by whoever shows progress.
+/// What crawling, or crawling and following, has done so far. Written by the threads that do it,
+/// read by whoever shows progress.
 struct Counts {
   /// Files and folders by what became of them.
   std::atomic<std::uint64_t> added{0};

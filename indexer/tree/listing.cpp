@@ -129,8 +129,7 @@ UniqueFd OpenTop(const std::string& path) {
 
 FileId IdOf(int descriptor) {
   struct stat status {};
-  if (fstat(descriptor, &status) != 0) return {};
-  return {status.st_dev, status.st_ino};
+  return fstat(descriptor, &status) == 0 ? maru::IdOf(status) : FileId{};
 }
 
 }  // namespace maru::indexer

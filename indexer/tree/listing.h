@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "index/store/document.h"
+#include "system/file_id.h"
 #include "system/unique_fd.h"
 
 /// What lies in a folder, seen through its descriptor: paths are never put together, so names may
@@ -75,11 +76,6 @@ UniqueFd OpenFolder(int parent_fd, const char* name);
 UniqueFd OpenTop(const std::string& path);
 
 /// The identity of what a descriptor stands for.
-struct FileId {
-  std::uint64_t device = 0;
-  std::uint64_t inode = 0;
-  friend bool operator==(const FileId&, const FileId&) = default;
-};
 FileId IdOf(int descriptor);
 
 }  // namespace maru::indexer

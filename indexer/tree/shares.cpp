@@ -7,17 +7,13 @@
 #include <filesystem>
 #include <system_error>
 
-#include "system/config.h"
 #include "system/index_id.h"
+#include "system/indexed_shares.h"
 #include "system/log.h"
 
 namespace maru::indexer {
 
 namespace fs = std::filesystem;
-
-std::string IndexHome() {
-  return Config::Get().state_dir + "/index";
-}
 
 Targets FindTargets(const ShareTable& table) {
   Targets targets;

@@ -19,9 +19,6 @@ struct Target {
   friend bool operator==(const Target&, const Target&) = default;
 };
 
-/// The folder that holds the index folders.
-std::string IndexHome();
-
 struct Targets {
   /// In the settings' order.
   std::vector<Target> present;
@@ -35,7 +32,8 @@ Targets FindTargets(const ShareTable& table);
 /// while the newest settings have an error. `used` names indices that are still open.
 void RemoveForeignIndices(const ShareTable& table, const std::vector<std::string>& used);
 
-/// Empties one index. The caller holds the indexer's lock, and the index is not open.
+/// Removes an index, its folder too; says in the log when it cannot. The caller holds the indexer's
+/// lock, and the index is not open.
 void RemoveIndex(const std::string& index_folder);
 
 }  // namespace maru::indexer

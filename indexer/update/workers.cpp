@@ -94,7 +94,7 @@ bool Workers::TakeText(unsigned slot, Job& job, std::uint64_t& bytes_read) {
     if (bytes.size() == extract::kHeadBytes) bytes = extract::ReadStart(file, max_text_);
     bytes_read = bytes.size();
     if (const auto text = extract::UTF8Text(extract::TextPart(bytes))) {
-      bytes.resize(text->size());
+      bytes.erase(0, static_cast<std::size_t>(text->data() - bytes.data())).resize(text->size());
       job.document.text = std::move(bytes);
       return true;
     }

@@ -3,7 +3,6 @@
 #include <signal.h>
 #include <sodium.h>
 #include <sys/prctl.h>
-#include <sys/resource.h>
 
 // The library's own header forgets it.
 #include <utility>
@@ -105,19 +104,12 @@ void PrepareTls(const Config& config, Front& front) {
   front.tls->use_private_key_file(config.tls_key, asio::ssl::context::pem);
 }
 
-void RaiseDescriptorLimit() {
-  rlimit limit{};
-  getrlimit(RLIMIT_NOFILE, &limit);
-  limit.rlim_cur = limit.rlim_max;
-  setrlimit(RLIMIT_NOFILE, &limit);
-}
-
 int Serve(const Config& config, UniqueFd listener, UniqueFd control, UniqueFd lifeline) {
   prctl(PR_SET_NAME, "maruweb-front");
   Front front(config, std::move(control));
   PrepareTls(config, front);
   RaiseDescriptorLimit();
-  BecomeForGood(config.web_account, Kept::kNothing);
+  BecomeForGood(config.web_account, Keep::kNothing);
   if (sodium_init() < 0) throw std::runtime_error("libsodium cannot start");
   front.service.LoadPages();
 

@@ -36,8 +36,8 @@ constexpr int kReapMilliseconds = 100;
 
 void LimitMemory() {
 #ifndef __SANITIZE_ADDRESS__
-  constexpr rlim_t most = rlim_t{2} << 30;
-  const rlimit limit{most, most};
+  constexpr rlim_t kMost = rlim_t{2} << 30;
+  const rlimit limit{kMost, kMost};
   setrlimit(RLIMIT_AS, &limit);
 #endif
 }

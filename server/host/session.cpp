@@ -69,9 +69,9 @@ std::optional<Claims> TokenSeal::Open(std::string_view token) const {
                         &end, kTokenVariant) != 0 ||
       end != token.data() + token.size())
     return std::nullopt;
-  constexpr std::size_t overhead = crypto_secretbox_NONCEBYTES + crypto_secretbox_MACBYTES;
-  if (size < overhead) return std::nullopt;
-  std::string plain(size - overhead, '\0');
+  constexpr std::size_t kOverhead = crypto_secretbox_NONCEBYTES + crypto_secretbox_MACBYTES;
+  if (size < kOverhead) return std::nullopt;
+  std::string plain(size - kOverhead, '\0');
   if (crypto_secretbox_open_easy(Bytes(plain), Bytes(sealed) + crypto_secretbox_NONCEBYTES,
                                  size - crypto_secretbox_NONCEBYTES, Bytes(sealed),
                                  key_.get()) != 0)

@@ -29,11 +29,11 @@ void EnterMountNamespace() {
 }
 
 void MakePrivateMounts() {
-  constexpr unsigned long flags = MS_NOSUID | MS_NODEV | MS_NOEXEC;
+  constexpr unsigned long kFlags = MS_NOSUID | MS_NODEV | MS_NOEXEC;
   EnterMountNamespace();
-  if (mount("proc", "/proc", "proc", flags, nullptr) < 0)
+  if (mount("proc", "/proc", "proc", kFlags, nullptr) < 0)
     MARU_LOG("No /proc of its own: the one of the machine stays in sight");
-  CheckErrno(mount("tmpfs", "/tmp", "tmpfs", flags, "mode=1777,size=64m,nr_inodes=65536") == 0,
+  CheckErrno(mount("tmpfs", "/tmp", "tmpfs", kFlags, "mode=1777,size=64m,nr_inodes=65536") == 0,
              "mount /tmp");
 }
 
@@ -62,13 +62,13 @@ void KeepHostCapabilities() {
 }
 
 UniqueFd KeepOnly(UniqueFd kept) {
-  constexpr int first = STDERR_FILENO + 1;
+  constexpr int kFirst = STDERR_FILENO + 1;
   UnblockSignals();
   ReopenLog();
   const int fd = kept.Release();
-  if (fd != first) dup3(fd, first, O_CLOEXEC);
-  close_range(first + 1, ~0u, 0);
-  return UniqueFd(first);
+  if (fd != kFirst) dup3(fd, kFirst, O_CLOEXEC);
+  close_range(kFirst + 1, ~0u, 0);
+  return UniqueFd(kFirst);
 }
 
 }  // namespace maru::server

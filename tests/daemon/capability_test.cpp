@@ -27,7 +27,7 @@ TEST_F(DaemonTest, TheServiceCanExamineAllFilesAndOpenNone) {
   const Scope scope{{games_, "games"}, {{"fileindex_photo", table_->Find("photo")}}, table_};
   const std::string secret = root_ + "/photo/shut/secret.txt";
   const int result = InChild([&] {
-    DropPrivileges("bin");
+    BecomeDaemon("bin");
     if (!HoldsReadSearch() || geteuid() != bin_.uid || open(secret.c_str(), O_RDONLY) >= 0)
       return 1;
     // As in the daemon: in a thread, again and again.

@@ -1,6 +1,10 @@
 #include <gtest/gtest.h>
 
+#include <random>
+#include <vector>
+
 #include "indexer/extract/charset.h"
+#include "indexer/extract/extractor.h"
 #include "system/utf8.h"
 
 namespace maru::extract {
@@ -54,6 +58,34 @@ TEST(CharsetTest, ConvertsWhatItIsToldSeesOrGuesses) {
       "\x93\xFA\x96\x7B\x8C\xEA\x82\xCC\x83\x65\x83\x4C\x83\x58\x83\x67\x82\xC5\x82\xB7\x81\x42",
       "");
   EXPECT_EQ(0u, japanese.find("\xE6\x97\xA5\xE6\x9C\xAC\xE8\xAA\x9E")) << japanese;
+}
+
+/// Bytes that decide something: marks, beginnings, whole characters and parts of them.
+const std::string kPieces[] = {
+    "\xEF\xBB\xBF", "\xFF\xFE",         "\xFE\xFF",     "\0\0\xFE\xFF"s, "\0"s,  "\x01",
+    "%PDF-",        "PK\003\004",       "<html",        " \t\n",         "text", "\xC3\xA9",
+    "\xE2\x82\xAC", "\xF0\x9F\x98\x80", "\xED\xA0\x80", "\xF0\x9F",      "\xE0", "\x80",
+    "\xFF"};
+
+/// What the indexer does itself with hostile bytes, each time in memory that ends with them.
+TEST(CharsetTest, TheIndexersOwnLookTakesAnyBytesAndFindsTheExtractorsText) {
+  std::mt19937 random(7);
+  unsigned taken = 0;
+  for (int i = 0; i < 20'000; ++i) {
+    std::string made;
+    while (random() % 5 != 0) made += kPieces[random() % std::size(kPieces)];
+    const std::vector<char> exact(made.begin(), made.end());
+    const std::string_view bytes(exact.data(), exact.size());
+    ChooseExtractor("name", bytes);
+    const auto text = UTF8Text(TextPart(bytes));
+    if (!text) continue;
+    ++taken;
+    ASSERT_TRUE(IsUTF8(*text));
+    ASSERT_EQ(ToUTF8(TextPart(bytes), ""), *text);
+    ASSERT_FALSE(bytes.starts_with("\xEF\xBB\xBF") && text->data() == bytes.data());
+    ASSERT_TRUE(text->empty() || (text->begin() >= bytes.begin() && text->end() <= bytes.end()));
+  }
+  EXPECT_GT(taken, 2'000u);
 }
 
 TEST(CharsetTest, NonsenseBecomesValidUTF8) {

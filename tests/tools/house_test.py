@@ -60,6 +60,10 @@ class HouseTest(unittest.TestCase):
         self.assert_breach("daemon/main.cpp:1: daemon/ may not include index/store/store.h", **{
             "daemon/main.cpp": "#include \"index/store/store.h\"\n"})
 
+    def test_no_ring_of_folders(self):
+        self.assert_breach("a ring of folders: ", **{
+            "index/README.md": "May include: `index/store/`, `daemon/`, `common/error.h`.\n"})
+
     def test_a_library_belongs_to_whose_readme_names_it(self):
         self.assert_breach("index/reader.cpp:1: index/ may not include xapian", **{
             "index/reader.cpp": "#include <xapian/document.h>\n"})

@@ -8,9 +8,9 @@
 /// ends the process.
 namespace maru::extract {
 
-/// Keeps one worker a slot: on each slot number (32 bits) that comes over `socket` it ends that
-/// slot's worker, forks another, and answers with the worker's socket. Ends, with all workers, when
-/// the other end closes.
+/// Keeps one process a slot: on each slot number (32 bits) that comes over `socket` it ends that
+/// slot's process, forks another, and answers with the process's socket. Ends, with all processes,
+/// when the other end closes.
 [[noreturn]] void RunForker(int socket, unsigned slots, std::span<const Extractor> table);
 
 }  // namespace maru::extract

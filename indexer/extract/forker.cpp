@@ -1,4 +1,4 @@
-#include "indexer/extract/worker.h"
+#include "indexer/extract/forker.h"
 
 #include <signal.h>
 #include <sys/prctl.h>
@@ -44,7 +44,7 @@ bool Serve(int socket, const Request& request, int file, std::span<const Extract
   }
 }
 
-[[noreturn]] void RunWorker(int socket, std::span<const Extractor> table) {
+[[noreturn]] void RunProcess(int socket, std::span<const Extractor> table) {
   prctl(PR_SET_NAME, "maruextract");
   prctl(PR_SET_PDEATHSIG, SIGKILL);
   if (!EnterSandbox(kMaxMemory)) _exit(1);
@@ -60,44 +60,44 @@ bool Serve(int socket, const Request& request, int file, std::span<const Extract
 class Forker {
  public:
   Forker(int socket, unsigned slots, std::span<const Extractor> table)
-      : socket_(socket), table_(table), workers_(slots, -1) {}
+      : socket_(socket), table_(table), processes_(slots, -1) {}
 
   void Run() {
     std::uint32_t slot = 0;
     while (ReceiveAll(socket_, &slot, sizeof slot, nullptr, kForever)) {
-      if (slot >= workers_.size() || !Replace(slot)) break;
+      if (slot >= processes_.size() || !Replace(slot)) break;
     }
-    for (const pid_t worker : workers_) End(worker);
+    for (const pid_t process : processes_) End(process);
   }
 
  private:
-  static void End(pid_t worker) {
-    if (worker <= 0) return;
-    kill(worker, SIGKILL);
-    while (waitpid(worker, nullptr, 0) < 0 && errno == EINTR) continue;
+  static void End(pid_t process) {
+    if (process <= 0) return;
+    kill(process, SIGKILL);
+    while (waitpid(process, nullptr, 0) < 0 && errno == EINTR) continue;
   }
 
   bool Replace(std::uint32_t slot) {
-    End(workers_[slot]);
-    workers_[slot] = -1;
+    End(processes_[slot]);
+    processes_[slot] = -1;
     int ends[2];
     if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends) != 0) return false;
     UniqueFd ours(ends[0]);
     UniqueFd theirs(ends[1]);
-    const pid_t worker = fork();
-    if (worker < 0) return false;
-    if (worker == 0) {
+    const pid_t process = fork();
+    if (process < 0) return false;
+    if (process == 0) {
       close(socket_);
       close(ends[0]);
-      RunWorker(ends[1], table_);
+      RunProcess(ends[1], table_);
     }
-    workers_[slot] = worker;
+    processes_[slot] = process;
     return SendAll(socket_, &slot, sizeof slot, ours.Get(), kForever);
   }
 
   int socket_;
   std::span<const Extractor> table_;
-  std::vector<pid_t> workers_;
+  std::vector<pid_t> processes_;
 };
 
 }  // namespace
