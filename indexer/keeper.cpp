@@ -33,6 +33,7 @@ Keeper::Keeper(Target target, Workers& workers, std::mutex& turn, const Settings
       turn_(turn),
       settings_(settings),
       wake_(eventfd(0, EFD_NONBLOCK | EFD_CLOEXEC)),
+      mounts_(target_.path),
       next_crawl_(Clock::now()),
       last_crawl_(Clock::now() - settings.lost_events_gap),
       follower_(target_.share),
@@ -86,9 +87,12 @@ void Keeper::Step() {
 void Keeper::Wait(Clock::time_point until) {
   const auto left = std::chrono::ceil<milliseconds>(until - Clock::now());
   if (stop_ || left.count() <= 0) return;
-  pollfd sources[] = {{wake_.Get(), POLLIN, 0}, {follower_.Descriptor(), POLLIN, 0}};
+  pollfd sources[] = {{wake_.Get(), POLLIN, 0},
+                      {follower_.Descriptor(), POLLIN, 0},
+                      {mounts_.Descriptor(), POLLPRI, 0}};
   constexpr milliseconds kLongest = minutes(10);
-  poll(sources, 2, static_cast<int>(std::min(left, kLongest).count()));
+  poll(sources, std::size(sources), static_cast<int>(std::min(left, kLongest).count()));
+  if (sources[2].revents && mounts_.HaveChanged()) CrawlBy(Clock::now());
   eventfd_t count = 0;
   eventfd_read(wake_.Get(), &count);
 }

@@ -10,12 +10,14 @@
 #include "indexer/tree/shares.h"
 #include "indexer/tree/tree.h"
 #include "indexer/update/workers.h"
+#include "system/mounts.h"
 #include "system/unique_fd.h"
 
 namespace maru::indexer {
 
 /// Keeps one share's index up to date, in a thread of its own: a crawl at the start, then what the
-/// system reports of changes, then a comparing crawl now and then.
+/// system reports of changes, then a comparing crawl now and then, and when something was mounted
+/// or unmounted in the share.
 class Keeper {
  public:
   struct Settings {
@@ -53,6 +55,7 @@ class Keeper {
   std::atomic<bool> stop_{false};
   std::atomic<bool> crawl_asked_{false};
   UniqueFd wake_;
+  MountWatch mounts_;
 
   Clock::time_point next_crawl_;
   Clock::time_point last_crawl_;

@@ -14,7 +14,10 @@
 #include <vector>
 
 #include "platform/guard.h"
+#include "system/mounts.h"
+#include "system/share_table.h"
 #include "system/unique_fd.h"
+#include "system/volume_path.h"
 #include "system/whole_file.h"
 
 namespace {
@@ -113,6 +116,15 @@ bool Move(const char* source, const char* destination, bool overwrite) {
 }  // namespace
 
 int MARUFSDirIsMntPoint(const char* path) {
+  maru::VolumePath place;
+  if (path && maru::SplitVolumePath(path, place) && place.rest.empty()) {
+    // That the share is seen here at all is a mount of the web server's.
+    return maru::Guarded("MARUFSDirIsMntPoint", -1, [&] {
+      const auto table = maru::ShareTable::Current();
+      const maru::ShareSettings* share = table->Find(std::string(place.share));
+      return share ? int{maru::IsMountPoint(share->path)} : maru::Fail(kErrNotFound, -1);
+    });
+  }
   struct statx status;
   if (!path || statx(AT_FDCWD, path, AT_SYMLINK_NOFOLLOW, STATX_TYPE, &status) != 0) return -1;
   if (!(status.stx_attributes_mask & STATX_ATTR_MOUNT_ROOT)) {

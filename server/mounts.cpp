@@ -8,11 +8,19 @@
 #include <set>
 
 #include "server/kernel/confinement.h"
+#include "system/file_id.h"
 #include "system/log.h"
 #include "system/throw_errno.h"
 
 namespace maru::server {
 namespace {
+
+/// Whether the folder at the share's path is the one that is mounted at `target`.
+bool IsTheSame(const std::string& path, const std::string& target) {
+  struct stat there, here;
+  return stat(path.c_str(), &there) == 0 && stat(target.c_str(), &here) == 0 &&
+         IdOf(there) == IdOf(here);
+}
 
 bool IsMountable(const ShareSettings& share) {
   return share.available && !share.path.empty() && share.path[0] == '/' && !share.name.empty() &&
@@ -46,7 +54,7 @@ void ShareMounts::Mount(const ShareSettings& share) {
   const auto found = mounted_.find(share.name);
   const bool failed_before = found != mounted_.end() && found->second.empty();
   if (found != mounted_.end() && !failed_before) {
-    if (found->second == share.path) return;
+    if (found->second == share.path && IsTheSame(share.path, share.VolumePath())) return;
     Unmount(share.name);
   }
   const std::string target = share.VolumePath();

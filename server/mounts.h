@@ -15,8 +15,9 @@ class ShareMounts {
   /// empty kVolume in it. Throws std::system_error. Once.
   ShareMounts();
 
-  /// Mounts what is new or lies elsewhere now, unmounts what is gone. A share that cannot be
-  /// mounted is logged once and tried again with every call; the others stand.
+  /// Mounts what is new, lies elsewhere now, or is another folder (the operator has mounted or
+  /// unmounted a file system there, which must not be held here), unmounts what is gone. A share
+  /// that cannot be mounted is logged once and tried again with every call; the others stand.
   void Apply(const ShareTable& table);
 
  private:

@@ -25,6 +25,7 @@
 #include "server/mounts.h"
 #include "server/wire/letters.h"
 #include "system/log.h"
+#include "system/mounts.h"
 #include "system/share_table.h"
 #include "system/throw_errno.h"
 
@@ -86,6 +87,7 @@ class Supervisor {
   UniqueFd listener_;
   UniqueFd signals_;
   ShareMounts mounts_;
+  MountWatch machine_{"/"};
   std::array<Part, 2> parts_{Part{"front", -1, {}}, Part{"host", -1, {}}};
   bool over_ = false;
   int status_ = 0;
@@ -153,9 +155,9 @@ int Supervisor::BecomeHost(UniqueFd control, UniqueFd lifeline) {
 }
 
 void Supervisor::Watch() {
-  std::array<pollfd, 3> sources{pollfd{signals_.Get(), POLLIN, 0},
-                                pollfd{parts_[0].lifeline.Get(), POLLIN, 0},
-                                pollfd{parts_[1].lifeline.Get(), POLLIN, 0}};
+  std::array<pollfd, 4> sources{
+      pollfd{signals_.Get(), POLLIN, 0}, pollfd{parts_[0].lifeline.Get(), POLLIN, 0},
+      pollfd{parts_[1].lifeline.Get(), POLLIN, 0}, pollfd{machine_.Descriptor(), POLLPRI, 0}};
   poll(sources.data(), sources.size(), kLookEvery);
   if (sources[0].revents) TakeSignals();
   for (std::size_t i = 0; i < parts_.size(); ++i)
@@ -166,7 +168,8 @@ void Supervisor::Watch() {
     status_ = 1;
     over_ = true;
   }
-  // Also when nothing changed: a share that could not be mounted may be there by now.
+  // Also when no settings changed: a share that could not be mounted may be there by now, and what
+  // the operator mounts or unmounts ends the wait.
   mounts_.Apply(*ShareTable::Current());
 }
 

@@ -16,8 +16,10 @@ namespace {
 using index::DirectoryId;
 using index::Writer;
 
-/// Stands for the folder above the share's own: its only name, "", is that folder itself.
+/// Stands for the folder above the share's own, in which only that folder itself has a name.
 constexpr DirectoryId kAboveRoot = 0;
+/// The name for a folder itself.
+constexpr const char* kItself = "";
 
 /// Names dealt with between two commits.
 constexpr std::size_t kMaxDue = 2'000;
@@ -46,12 +48,14 @@ class Round : public PartialWalk {
 
  private:
   void Reach(int dir_fd, const FolderHandle& folder, std::vector<std::string> names) override {
+    std::erase(names, kItself);
     for (const index::Entry& entry : folder->entries) {
       if (changed_.contains(entry.directory) && !IsOrphan(entry)) names.push_back(entry.name);
     }
     std::sort(names.begin(), names.end());
     names.erase(std::unique(names.begin(), names.end()), names.end());
     listing_.LookAt(dir_fd, names);
+    updater_.Indexed().Met(dir_fd, *folder, listing_.Entries());
     // What is a folder only now is walked when this is settled: what happened in it before its
     // place was known went unseen. There is room for as many as are ever due.
     for (const Found& found : listing_.Entries()) {
@@ -84,9 +88,21 @@ void Follower::Hear() {
     } else if (!event.name.empty()) {
       Await(event.folder, event.name, IsComplete(event.mask));
     } else if (event.folder == Writer::kRoot) {
-      Await(kAboveRoot, {}, true);
+      Await(kAboveRoot, kItself, true);
+    } else if (event.mask & IN_ATTRIB) {
+      // Where something is mounted, the folder above does not hear of it.
+      Await(event.folder, kItself, true);
     }
   }
+}
+
+/// What the names there were before say of it is no longer true: a crawl finds them.
+void Follower::MetElsewhere(int dir_fd, DirectoryId folder, const Found& file) {
+  const std::string name(file.name);
+  if (!watcher_.WatchFile(dir_fd, folder, name)) return;
+  const std::optional<Found> now = Look(dir_fd, name.c_str());
+  if (!now || file.is_racy || now->stamp != file.stamp) Await(folder, name, true);
+  lost_ = lost_ || catching_up_;
 }
 
 NamesByFolder Follower::TakeDue() {
@@ -94,6 +110,7 @@ NamesByFolder Follower::TakeDue() {
 }
 
 void Follower::CatchUp(Updater& updater, int top, NamesByFolder due) {
+  catching_up_ = true;
   if (due.erase(kAboveRoot) > 0 || due.contains(Writer::kRoot)) updater.UpdateTop(top, share_);
   Round round(updater);
   round.Run(top, due);
@@ -103,11 +120,13 @@ void Follower::CatchUp(Updater& updater, int top, NamesByFolder due) {
   for (const auto& [folder, names] : due) {
     for (const std::string& name : names) Await(folder, name, false);
   }
+  catching_up_ = false;
 }
 
 void Follower::Renew() {
   watcher_.Renew();
   lost_ = false;
+  catching_up_ = false;
 }
 
 void Follower::Await(DirectoryId folder, const std::string& name, bool complete) {

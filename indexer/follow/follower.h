@@ -18,6 +18,7 @@ class Follower : public FolderListener {
 
   void Entering(int dir_fd, index::DirectoryId id) override;
   void Removed(index::DirectoryId id) override { watcher_.Forget(id); }
+  void MetElsewhere(int dir_fd, index::DirectoryId folder, const Found& file) override;
 
   /// Becomes readable when there is something to hear; -1: never.
   int Descriptor() const { return watcher_.Descriptor(); }
@@ -46,6 +47,7 @@ class Follower : public FolderListener {
   Watcher watcher_;
   Pending pending_;
   bool lost_ = false;
+  bool catching_up_ = false;
 };
 
 }  // namespace maru::indexer

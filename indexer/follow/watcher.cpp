@@ -4,7 +4,6 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <cstdio>
 #include <utility>
 
 #include "system/log.h"
@@ -18,6 +17,8 @@ constexpr std::uint32_t kWatched = IN_CREATE | IN_CLOSE_WRITE | IN_MODIFY | IN_A
                                    IN_MOVED_FROM | IN_MOVED_TO | IN_DELETE_SELF | IN_MOVE_SELF |
                                    IN_ONLYDIR | IN_EXCL_UNLINK;
 
+constexpr std::uint32_t kWatchedOfFiles = IN_ATTRIB | IN_MODIFY | IN_CLOSE_WRITE | IN_DONT_FOLLOW;
+
 /// Buffers taken in one go.
 constexpr unsigned kMaxParts = 16;
 
@@ -29,20 +30,10 @@ Watcher::Watcher() : inotify_(inotify_init1(IN_NONBLOCK | IN_CLOEXEC)) {
   MARU_LOG("Cannot follow changes, only crawls find them");
 }
 
-void Watcher::Watch(int dir_fd, DirectoryId id) {
-  if (id >= watches_.size()) watches_.resize(id + 1, -1);
-  if (!inotify_) return;
-  char path[32];
-  std::snprintf(path, sizeof path, "/proc/self/fd/%d", dir_fd);
-  // Asked for each time: the watch may be on a folder that is gone and whose inode lives anew.
-  const int watch = inotify_add_watch(inotify_.Get(), path, kWatched);
-  if (watch >= 0) {
-    if (watch == watches_[id]) return;
-    Forget(id);
-    watches_[id] = watch;
-    folders_.emplace(watch, id);
-    return;
-  }
+/// The watch on what lies at a path below a descriptor's; -1, noted, when there is none to be had.
+int Watcher::Add(const std::string& path, std::uint32_t mask) {
+  const int watch = inotify_add_watch(inotify_.Get(), ("/proc/self/fd/" + path).c_str(), mask);
+  if (watch >= 0 || errno == ENOENT) return watch;
   if (!std::exchange(noted_limit_, true)) {
     MARU_LOG(
         "Only %zu folders of this share are watched (sysctl fs.inotify.max_user_watches): "
@@ -50,6 +41,29 @@ void Watcher::Watch(int dir_fd, DirectoryId id) {
         folders_.size());
   }
   complete_ = false;
+  return watch;
+}
+
+void Watcher::Watch(int dir_fd, DirectoryId id) {
+  if (id >= watches_.size()) watches_.resize(id + 1, -1);
+  if (!inotify_) return;
+  // Asked for each time: the watch may be on a folder that is gone and whose inode lives anew.
+  const int watch = Add(std::to_string(dir_fd), kWatched);
+  if (watch < 0 || watch == watches_[id]) return;
+  Forget(id);
+  watches_[id] = watch;
+  folders_.emplace(watch, id);
+}
+
+bool Watcher::WatchFile(int dir_fd, DirectoryId folder, const std::string& name) {
+  if (!inotify_) return false;
+  const int watch = Add(std::to_string(dir_fd) + "/" + name, kWatchedOfFiles);
+  if (watch < 0) return false;
+  FileName file{folder, name};
+  const auto [first, last] = files_.equal_range(watch);
+  if (std::any_of(first, last, [&](const auto& item) { return item.second == file; })) return false;
+  files_.emplace(watch, std::move(file));
+  return true;
 }
 
 void Watcher::Forget(DirectoryId id) {
@@ -80,7 +94,13 @@ void Watcher::Read(std::vector<Event>& events) {
           events.push_back({place->second, event->mask, event->len > 0 ? event->name : ""});
         }
       }
+      const auto [first_file, last_file] = files_.equal_range(event->wd);
+      for (auto file = first_file; file != last_file; ++file) {
+        if (event->mask & IN_IGNORED) continue;
+        events.push_back({file->second.folder, event->mask, file->second.name});
+      }
       if (event->mask & IN_IGNORED) folders_.erase(event->wd);
+      if (event->mask & IN_IGNORED) files_.erase(event->wd);
     }
   }
 }

@@ -11,7 +11,8 @@
 
 namespace maru::indexer {
 
-/// A watch (inotify) on each folder of a share, as far as the system's limits allow. One thread.
+/// A watch (inotify) on each folder of a share, and on files that change elsewhere too, as far as
+/// the system's limits allow. One thread.
 class Watcher {
  public:
   struct Event {
@@ -27,6 +28,9 @@ class Watcher {
   /// Watches an open folder, if that is not done already.
   void Watch(int dir_fd, index::DirectoryId id);
   void Forget(index::DirectoryId id);
+  /// Watches a file itself, for what happens to it under other names; until it is gone. Whether
+  /// that is new.
+  bool WatchFile(int dir_fd, index::DirectoryId folder, const std::string& name);
 
   /// Becomes readable when there are events; -1 when the system gives no watches at all.
   int Descriptor() const { return inotify_.Get(); }
@@ -38,6 +42,8 @@ class Watcher {
   void Renew() { complete_ = static_cast<bool>(inotify_); }
 
  private:
+  int Add(const std::string& path, std::uint32_t mask);
+
   UniqueFd inotify_;
   bool complete_ = true;
   bool noted_limit_ = false;
@@ -45,6 +51,12 @@ class Watcher {
   /// the same is mounted at several places.
   std::vector<int> watches_;
   std::unordered_multimap<int, index::DirectoryId> folders_;
+  struct FileName {
+    index::DirectoryId folder;
+    std::string name;
+    friend bool operator==(const FileName&, const FileName&) = default;
+  };
+  std::unordered_multimap<int, FileName> files_;
 };
 
 }  // namespace maru::indexer

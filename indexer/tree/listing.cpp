@@ -55,7 +55,8 @@ std::int64_t Found::ModTime() const {
 
 std::optional<Found> Look(int dir_fd, const char* name) {
   struct statx status {};
-  constexpr unsigned kWanted = STATX_TYPE | STATX_INO | STATX_SIZE | STATX_MTIME | STATX_CTIME;
+  constexpr unsigned kWanted =
+      STATX_TYPE | STATX_NLINK | STATX_INO | STATX_SIZE | STATX_MTIME | STATX_CTIME;
   constexpr int kFlags = AT_SYMLINK_NOFOLLOW | AT_NO_AUTOMOUNT | AT_EMPTY_PATH;
   const std::int64_t now = FileClock();
   if (statx(dir_fd, name, kFlags, kWanted, &status) != 0) return std::nullopt;
@@ -63,9 +64,11 @@ std::optional<Found> Look(int dir_fd, const char* name) {
   const bool is_folder = S_ISDIR(status.stx_mode);
   if (is_folder ? LeftOut(name) : !S_ISREG(status.stx_mode)) return std::nullopt;
   const index::Stamp stamp = StampOf(status);
+  const bool mounted = status.stx_attributes & STATX_ATTR_MOUNT_ROOT;
   return Found{.name = name,
                .type = is_folder ? FileType::kFolder : FileType::kFile,
                .is_racy = stamp.ctime_ns >= now,
+               .is_elsewhere = !is_folder && (status.stx_nlink > 1 || mounted),
                .stamp = stamp};
 }
 

@@ -30,6 +30,9 @@ struct Found {
   /// It changed within the current tick of the clock that stamps files: a further change in that
   /// tick could not be told.
   bool is_racy = false;
+  /// A file that also changes where its folder does not tell: one with other names, or that is
+  /// mounted here.
+  bool is_elsewhere = false;
   index::Stamp stamp{};
 
   bool IsFolder() const { return type == FileType::kFolder; }

@@ -4,6 +4,7 @@
 #include <thread>
 #include <utility>
 
+#include "indexer/tree/listing.h"
 #include "system/log.h"
 
 namespace maru::indexer {
@@ -77,6 +78,13 @@ FolderHandle Tree::Enter(int dir_fd, DirectoryId id) {
   if (listener_) listener_->Entering(dir_fd, id);
   CloseUnused();
   return Open(id);
+}
+
+void Tree::Met(int dir_fd, const Folder& folder, std::span<const Found> found) {
+  if (!listener_) return;
+  for (const Found& file : found) {
+    if (file.is_elsewhere) listener_->MetElsewhere(dir_fd, folder.id, file);
+  }
 }
 
 DirectoryId Tree::ParentOf(DirectoryId id) const {

@@ -4,6 +4,7 @@
 #include <cstddef>
 #include <map>
 #include <memory>
+#include <span>
 #include <string>
 #include <string_view>
 #include <unordered_map>
@@ -41,6 +42,8 @@ inline bool IsOrphan(const index::Entry& entry) {
 /// Names to look at, by folder.
 using NamesByFolder = std::map<index::DirectoryId, std::vector<std::string>>;
 
+struct Found;
+
 /// Hears what becomes of folders, to follow them.
 class FolderListener {
  public:
@@ -48,6 +51,8 @@ class FolderListener {
   /// About to look into a folder, which is open.
   virtual void Entering(int dir_fd, index::DirectoryId id) = 0;
   virtual void Removed(index::DirectoryId id) = 0;
+  /// Found in such a folder: a file that changes elsewhere too.
+  virtual void MetElsewhere(int dir_fd, index::DirectoryId folder, const Found& file) = 0;
 };
 
 /// One share's tree as it is indexed, and its only owner: names and stamps stand in the index's
@@ -77,6 +82,8 @@ class Tree {
   FolderHandle Open(index::DirectoryId id);
   /// The same for one that is about to be looked into.
   FolderHandle Enter(int dir_fd, index::DirectoryId id);
+  /// Tells the listener of the files among `found` that change elsewhere too.
+  void Met(int dir_fd, const Folder& folder, std::span<const Found> found);
   /// 0: it is the share's own, is gone, or lies where nobody has looked yet.
   index::DirectoryId ParentOf(index::DirectoryId id) const;
 

@@ -44,6 +44,7 @@ void FullWalk::Visit(int dir_fd, DirectoryId id, std::vector<Child>& children) {
   const FolderHandle folder = tree.Enter(dir_fd, id);
   if (!listing_.Read(dir_fd)) return updater_.NoteUnreadable(Path());
   const std::span<const Found> found = listing_.Entries();
+  tree.Met(dir_fd, *folder, found);
   const std::vector<Difference> differences = Compare(*folder, found);
   const auto changed = std::count_if(differences.begin(), differences.end(),
                                      [](const Difference& one) { return one.found != nullptr; });

@@ -1,3 +1,6 @@
+#include <sys/mount.h>
+#include <sys/stat.h>
+
 #include "fixture.h"
 #include "indexer/keeper.h"
 
@@ -21,8 +24,18 @@ class FollowTest : public ShareTest {
     EXPECT_EQ("", Differences(OnDisk(), Indexed())) << what;
   }
 
+  /// The same of what everybody may read.
+  void ExpectRightsCaughtUp(const std::string& what) {
+    const Identity other{12345, {}, false};
+    const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(60);
+    while (Indexed(other) != OnDisk(true) && std::chrono::steady_clock::now() < end) {
+      std::this_thread::sleep_for(std::chrono::milliseconds(50));
+    }
+    EXPECT_EQ("", Differences(OnDisk(true), Indexed(other))) << what;
+  }
+
   std::mutex turn_;
-  Keeper::Settings settings_;
+  Keeper::Settings settings_{.lost_events_gap = std::chrono::seconds(0)};
   std::unique_ptr<Keeper> keeper_;
 };
 
@@ -49,13 +62,48 @@ TEST_F(FollowTest, FindsEveryKindOfChange) {
   ExpectCaughtUp("in the moved folder");
 
   Chmod("old", 0700);
-  const Identity other{12345, {}, false};
-  while (Indexed(other) != OnDisk(true)) std::this_thread::sleep_for(std::chrono::milliseconds(50));
+  ExpectRightsCaughtUp("rights of a folder");
   fs::rename(Share() + "/old", root_ + "/out");
   ExpectCaughtUp("moved out");
   std::ofstream(root_ + "/out/outside.txt") << "no business of the share";
   fs::rename(root_ + "/out", Share() + "/in");
   ExpectCaughtUp("moved in");
+}
+
+/// Rights and contents that change where the folder above does not hear of it.
+TEST_F(FollowTest, AFileChangesUnderItsOtherNames) {
+  const std::string outside = root_ + "/outside.txt";
+  Write("a/one.txt", "first words");
+  fs::create_hard_link(Share() + "/a/one.txt", outside);
+  Follow();
+  ExpectCaughtUp("first crawl");
+  chmod(outside.c_str(), 0600);
+  ExpectRightsCaughtUp("rights by a name outside the share");
+  std::ofstream(outside, std::ios::app) << " and the lastword";
+  ExpectCaughtUp("content by a name outside the share");
+  EXPECT_EQ(1u, Search("lastword").size());
+  Write("b/two.txt", "second");
+  ExpectCaughtUp();
+  fs::create_hard_link(Share() + "/b/two.txt", Share() + "/a/too.txt");
+  ExpectCaughtUp("a second name");
+  chmod((Share() + "/a/too.txt").c_str(), 0600);
+  ExpectRightsCaughtUp("rights by the second name");
+}
+
+TEST_F(FollowTest, WhatIsMountedInAShareIsFollowed) {
+  Write("disk/below.txt", "hidden by the disk");
+  const std::string disk = Share() + "/disk";
+  Follow();
+  ExpectCaughtUp("first crawl");
+  if (mount("none", disk.c_str(), "tmpfs", 0, "mode=755") != 0) GTEST_SKIP() << "needs mounts";
+  ExpectCaughtUp("a disk is mounted");
+  Write("disk/above.txt", "on the disk");
+  ExpectCaughtUp("a file on the disk");
+  chmod(disk.c_str(), 0700);
+  ExpectRightsCaughtUp("rights of the mount point");
+  umount(disk.c_str());
+  ExpectCaughtUp("the disk is gone");
+  EXPECT_EQ(1u, Search("hidden").size());
 }
 
 TEST_F(FollowTest, AChangeIsFoundInAFolderThatMovesBeforeItIsLookedAt) {
