@@ -35,11 +35,11 @@ Json::Value HighlightCommand(const Request& request) {
   const Scope scope = ScopeOf(request.core, EyesOf(request.caller, {}), {id});
   if (scope.indices.empty() || document < 1 || document > UINT32_MAX) throw NotThere();
   const auto view = OpenView(request.core, scope, request.cancelled);
-  const auto hit = view->Find(0, static_cast<index::DocumentId>(document));
+  const auto hit = view->FindAlias(0, static_cast<std::uint32_t>(document));
   if (!hit || !Readable(scope, *hit)) throw NotThere();
   index::Highlighter highlighter(*view, query);
   Json::Value reply;
-  reply["doc_id"] = hit->document;
+  reply["doc_id"] = hit->alias;
   reply["fragments"] = FragmentsOf(highlighter, *hit, {options});
   return reply;
 }

@@ -82,7 +82,7 @@ std::string HitMessage(const ShareIndex& from, const Hit& hit,
                        const std::vector<const Field*>& fields, const Json::Value& highlight) {
   json::ObjectWriter message;
   for (const Field* field : fields) AddField(message, from, hit, field->name);
-  message.AddNumber("doc_id", hit.document);
+  message.AddNumber("doc_id", hit.alias);
   if (!highlight.isNull()) message.AddValue("highlight", highlight);
   message.AddText("id", from.id);
   message.AddNumber("score", std::llround(hit.score * 1000));

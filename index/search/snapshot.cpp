@@ -34,6 +34,7 @@ Snapshot::Snapshot(const Xapian::Database& database, const Snapshot* before,
                    std::shared_ptr<Cache> cache)
     : cache_(std::move(cache)),
       owner_(before ? before->owner_ : NewOwner()),
+      aliases_(database.get_metadata(Aliases::kMetadata)),
       documents_(database.get_doccount()),
       last_document_(database.get_lastdocid()),
       total_length_(database.get_total_length()) {

@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "index/search/cache.h"
+#include "index/store/aliases.h"
 #include "index/store/change_log.h"
 #include "index/store/directory_table.h"
 
@@ -32,6 +33,7 @@ class Snapshot {
   /// Words in all documents.
   std::uint64_t TotalLength() const { return total_length_; }
   const DirectoryTable& Table() const { return table_; }
+  const Aliases& Outside() const { return aliases_; }
 
   /// The value that is kept of this kind and name, set right for this commit by `advance(value,
   /// changes)`, which returns null when it cannot; else null.
@@ -65,6 +67,7 @@ class Snapshot {
   /// The same for all snapshots made from each other.
   std::uint32_t owner_;
   DirectoryTable table_;
+  Aliases aliases_;
   std::uint64_t documents_;
   DocumentId last_document_;
   std::uint64_t total_length_;

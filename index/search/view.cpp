@@ -60,6 +60,7 @@ Hit HitOf(const Reader& reader, std::size_t share, DocumentId id, Stored stored)
   Hit hit;
   hit.share = share;
   hit.document = id;
+  hit.alias = reader.State().Outside().Of(id);
   hit.record = std::move(stored.record);
   hit.owner = table.Rights(stored.place.rights).uid;
   hit.text = stored.text;
@@ -222,6 +223,11 @@ std::optional<Hit> View::Find(std::size_t share, DocumentId document) {
     if (!stored || !sight.Sees(stored->place)) return std::nullopt;
     return HitOf(sight.Source(), share, document, std::move(*stored));
   });
+}
+
+std::optional<Hit> View::FindAlias(std::size_t share, std::uint32_t alias) {
+  if (share >= state_->Shares()) return std::nullopt;
+  return Find(share, state_->At(share).State().Outside().DocumentOf(alias));
 }
 
 std::optional<Hit> View::Find(std::size_t share, std::string_view path) {

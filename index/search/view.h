@@ -20,6 +20,8 @@ struct Hit {
   /// Which of the searched shares, as an index into the View's list.
   std::size_t share = 0;
   DocumentId document = 0;
+  /// What it goes by outside: an alias of its id, which tells of no other document.
+  std::uint32_t alias = 0;
   double score = 0;
   Record record;
   uid_t owner = 0;
@@ -68,10 +70,11 @@ class View {
   /// How many matches of `query` each of `filters` keeps (kFilter without weights), in one pass.
   std::vector<std::uint64_t> Count(const Query& query, const std::vector<Query>& filters);
 
-  /// A document by its id, or by its path within the share ("" is the share itself); none when it
-  /// does not exist.
+  /// A document by its id, by its path within the share ("" is the share itself), or by its alias;
+  /// none when it does not exist.
   std::optional<Hit> Find(std::size_t share, DocumentId document);
   std::optional<Hit> Find(std::size_t share, std::string_view path);
+  std::optional<Hit> FindAlias(std::size_t share, std::uint32_t alias);
 
   /// Words of `field` ("" for all text fields, one after the other) that begin with `prefix`, those
   /// in most documents first; at most `limit`.

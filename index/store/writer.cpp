@@ -11,6 +11,7 @@
 #include <filesystem>
 #include <map>
 
+#include "index/store/aliases.h"
 #include "index/store/bulk.h"
 #include "index/store/change_log.h"
 #include "index/store/codec.h"
@@ -62,6 +63,7 @@ Xapian::WritableDatabase OpenIndex(const std::string& path) {
       database = OpenDatabase(path + kDatabaseFolder);
     }
     database.set_metadata(kFormatKey, kFormat);
+    database.set_metadata(Aliases::kMetadata, Aliases::NewKey());
     database.commit();
     return database;
   });
@@ -175,7 +177,9 @@ void Writer::State::CopyTexts(const std::vector<std::uint32_t>& segments) {
 /// A fresh index is built in parts and appears whole: nobody could see it grow anyway.
 void Writer::State::BeginBulk() {
   database = OpenDatabase(folder + kMetadataPart);
-  database.set_metadata(kFormatKey, kFormat);
+  for (const char* key : {kFormatKey, Aliases::kMetadata}) {
+    database.set_metadata(key, main.get_metadata(key));
+  }
   bulk = std::make_unique<BulkBuilder>(folder);
 }
 
