@@ -16,6 +16,7 @@
 #include "indexer/service.h"
 #include "program/program.h"
 #include "system/config.h"
+#include "system/indexed_shares.h"
 #include "system/log.h"
 #include "system/throw_errno.h"
 

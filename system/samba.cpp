@@ -9,10 +9,14 @@
 
 #include <array>
 #include <chrono>
+#include <map>
+#include <optional>
 #include <stdexcept>
 
+#include "system/text.h"
 #include "system/throw_errno.h"
 #include "system/unique_fd.h"
+#include "system/whole_file.h"
 
 namespace maru {
 namespace {
@@ -136,6 +140,80 @@ class Testparm {
   pid_t child_ = 0;
 };
 
+/// "name = value" of a line of settings; a name may be spelt with any capitals and spaces.
+std::optional<std::pair<std::string, std::string>> Assignment(std::string_view line) {
+  const std::size_t equals = line.find('=');
+  if (equals == line.npos) return std::nullopt;
+  std::string name = Lowered(line.substr(0, equals));
+  std::erase_if(name, [](char c) { return c == ' ' || c == '\t'; });
+  return std::pair(name, std::string(Trimmed(line.substr(equals + 1))));
+}
+
+/// By section: what it includes that is another file for each client. testparm shows these with the
+/// variables as they are for itself.
+class Includes {
+ public:
+  void Read(const std::string& path, int depth = 0) {
+    std::string text;
+    if (depth > kMaxIncludes || !ReadWholeFile(path, kMaxOutput, text, Link::kFollow)) return;
+    for (std::string_view rest = text; !rest.empty();) {
+      std::string line = TakeLine(rest);
+      if (line.starts_with('#') || line.starts_with(';')) continue;
+      if (line.starts_with('[')) section_ = Lowered(Trimmed(line.substr(1, line.find(']') - 1)));
+      if (const auto set = Assignment(line)) Take(set->first, set->second, depth);
+    }
+  }
+
+  std::map<std::string, std::string> varying;
+
+ private:
+  static constexpr int kMaxIncludes = 100;
+
+  /// The next line, with those that it goes on in.
+  static std::string TakeLine(std::string_view& rest) {
+    std::string line;
+    bool goes_on = true;
+    while (goes_on && !rest.empty()) {
+      const std::size_t end = std::min(rest.find('\n'), rest.size());
+      line += Trimmed(rest.substr(0, end));
+      rest.remove_prefix(std::min(end + 1, rest.size()));
+      goes_on = line.ends_with('\\');
+      if (goes_on) line.pop_back();
+    }
+    return line;
+  }
+
+  void Take(const std::string& name, const std::string& value, int depth) {
+    if (name == "copy" && varying.contains(Lowered(value))) {
+      varying[section_] = varying[Lowered(value)];
+    }
+    if (name != "include") return;
+    if (value.find('%') != value.npos) {
+      varying[section_] = value;
+    } else {
+      Read(value, depth + 1);
+    }
+  }
+
+  std::string section_ = "global";
+};
+
+/// The canonical text with these includes in the place of testparm's own.
+std::string Restored(std::string_view text, const std::map<std::string, std::string>& varying) {
+  std::string restored;
+  while (!text.empty()) {
+    const std::string_view line = text.substr(0, text.find('\n'));
+    text.remove_prefix(std::min(line.size() + 1, text.size()));
+    const std::string_view words = Trimmed(line);
+    if (words.starts_with("include =")) continue;
+    restored.append(line).append("\n");
+    if (!words.starts_with('[') || !words.ends_with(']')) continue;
+    const auto include = varying.find(Lowered(words.substr(1, words.size() - 2)));
+    if (include != varying.end()) restored.append("\tinclude = " + include->second + "\n");
+  }
+  return restored;
+}
+
 }  // namespace
 
 std::string CanonicalSamba(const std::string& path) {
@@ -143,7 +221,10 @@ std::string CanonicalSamba(const std::string& path) {
   if (!UniqueFd(open(path.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC))) {
     ThrowErrno(path);
   }
-  return Testparm(path).Result();
+  const std::string text = Testparm(path).Result();
+  Includes includes;
+  includes.Read(path);
+  return Restored(text, includes.varying);
 }
 
 }  // namespace maru

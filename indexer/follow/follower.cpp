@@ -52,6 +52,7 @@ class Round : public PartialWalk {
     std::sort(names.begin(), names.end());
     names.erase(std::unique(names.begin(), names.end()), names.end());
     listing_.LookAt(dir_fd, names);
+    updater_.Select(listing_, folder->id);
     // What is a folder only now is walked when this is settled: what happened in it before its
     // place was known went unseen. There is room for as many as are ever due.
     for (const Found& found : listing_.Entries()) {

@@ -158,7 +158,7 @@ TEST_F(SearchTest, NoPathIsFollowedWithoutEnd) {
   std::string path = "/photo";
   for (std::size_t depth = 1; depth < kMaxPathDepth; ++depth) path += "/d";
   File(path + "/d/f", "word");
-  const Scope scope{{bin_, "bin"}, {{"fileindex_photo", table_->Find("photo")}}, table_};
+  const Scope scope{{bin_, "bin"}, {{"fileindex_photo", table_->Find("photo"), bin_}}, table_};
   index::Hit last, deeper;
   last.path = path.substr(std::string("/photo").size()) + "/d";
   deeper.path = last.path + "/f";
@@ -171,7 +171,7 @@ TEST_F(SearchTest, NobodySeesMoreThanTheirOwn) {
   File("photo/games.txt", "word", 0600, games_.uid);
   AddShare("club", "valid users = games");
   File("club/member.txt", "word");
-  AddShare("homes", "valid users = nobody");
+  AddShare("homes", "invalid users = games");
   File("homes/bin/diary.txt", "word", 0600, bin_.uid);
   for (const char* share : {"photo", "club", "homes"}) Index(share);
   const auto named = [](const char* user) {

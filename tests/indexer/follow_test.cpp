@@ -7,8 +7,8 @@ namespace {
 class FollowTest : public ShareTest {
  protected:
   void Follow() {
-    keeper_ = std::make_unique<Keeper>(Target{"share", Share(), IndexFolder(), {}}, TheWorkers(),
-                                       turn_, settings_);
+    keeper_ = std::make_unique<Keeper>(Target{"share", Share(), IndexFolder(), {}, {}, {}},
+                                       TheWorkers(), turn_, settings_);
   }
 
   /// Waits until the index says what the disk says.
