@@ -113,7 +113,7 @@ std::optional<Identity> ForcedIdentity(const std::string& account) {
   return identity;
 }
 
-/// False when there is no such group, or a forced user is to be its member and is not.
+/// False when there is no such group, or who is forced is to be its member and is not.
 bool ForceGroup(const ShareSettings& share, Identity& identity) {
   std::string_view group = share.force_group;
   const bool members_only = group.starts_with('+');
@@ -121,7 +121,7 @@ bool ForceGroup(const ShareSettings& share, Identity& identity) {
   const std::optional<gid_t> gid = GroupByName(std::string(group));
   if (!gid) return false;
   if (identity.InGroup(*gid)) return true;
-  if (members_only) return share.force_user.empty();
+  if (members_only) return share.force_user.empty() && !share.guest_only;
   identity.groups.insert(std::ranges::upper_bound(identity.groups, *gid), *gid);
   return true;
 }

@@ -23,10 +23,12 @@ void Replace(std::string& text, std::string_view what, std::string_view with) {
   }
 }
 
+constexpr uid_t kNobody = 65'534;
+
 /// By the ids that Debian gives people.
 bool IsPersons(const Account& account) {
-  constexpr uid_t first = 1000, last = 65'533;
-  return account.uid >= first && account.uid <= last;
+  constexpr uid_t first = 1000;
+  return account.uid >= first && account.uid < kNobody;
 }
 
 /// Where most people's homes lie.
@@ -112,9 +114,13 @@ void SettlePath(ShareSettings& share) {
   StripSlashes(share.path);
 }
 
-/// Samba takes a guest for nobody's account, also where it is a person's: what the person owns is
-/// closed to the guest.
-void CheckGuest(const ShareSettings& share) {
+/// Samba does not take its guest for a person, nor a forced nobody for nobody: to them it closes
+/// also what the account owns.
+void CheckForced(const ShareSettings& share) {
+  const std::optional<Account> forced = AccountByName(share.force_user);
+  if (forced && forced->uid == kNobody) {
+    throw std::runtime_error("its user is forced to nobody's account, " + share.force_user);
+  }
   const std::optional<Account> guest = AccountByName(share.guest_account);
   if (share.guest_only && guest && IsPersons(*guest)) {
     throw std::runtime_error("its guests have a person's account, " + share.guest_account);
@@ -226,7 +232,7 @@ class Parser {
         (section_.root_preexec_close && !section_.root_preexec.empty())) {
       throw std::runtime_error("a program of \"preexec\" decides who enters");
     }
-    CheckGuest(section_.share);
+    CheckForced(section_.share);
     if (section_.hides_apple_double) section_.share.veto.patterns.emplace_back("._*");
   }
 

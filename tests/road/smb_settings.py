@@ -75,7 +75,7 @@ class World:
                 ("read only = no", 0.3),
                 (f"veto files = {pick(PATTERNS)}", 0.35),
                 (f"case sensitive = {pick(('yes', 'no', 'auto'))}", 0.2),
-                (f"force user = {pick((*USERS, 'root', 'nobody', 'no such'))}", 0.18),
+                (f"force user = {pick((*USERS, 'root', 'nobody', 'games', 'no such'))}", 0.18),
                 (f"force group = {pick(('work', '+work', '+family', '@work', 'no such', 'family'))}",
                  0.2),
                 ("guest only = yes", 0.1),
@@ -157,8 +157,8 @@ class World:
         return share
 
     def make(self):
-        shutil.rmtree(self.root, ignore_errors=True)
-        self.root.mkdir()
+        shutil.rmtree(self.root.parent, ignore_errors=True)
+        self.root.mkdir(parents=True)
         for number in range(self.random.randrange(3, 7)):
             self.shares.append(self.plain(f"needle{number}"))
         if self.chance(0.5):

@@ -4,8 +4,8 @@ import os
 import random
 import struct
 
-UIDS = (0, 60001, 60002, 60003, 60099, 65534)
-GIDS = (0, 60001, 60002, 60100, 60101, 60102, 60099, 65534)
+UIDS = (0, 5, 60001, 60002, 60003, 60099, 65534)
+GIDS = (0, 60, 60001, 60002, 60100, 60101, 60102, 60099, 65534)
 # What an ACL's entries are called in the attribute.
 USER_OBJ, USER, GROUP_OBJ, GROUP, MASK, OTHER = 0x01, 0x02, 0x04, 0x08, 0x10, 0x20
 ACL_ATTRIBUTE = "system.posix_acl_access"

@@ -98,6 +98,7 @@ TEST(ShareTable, WithholdsABadShareAlone) {
       {"invalid users = S-1-5-32-544", "no account"},
       {"force user = OTHER\\alice", "plainly"},
       {"guest only = yes\nforce user = bin", "guests"},
+      {"force user = nobody", "nobody's account"},
       {"path = /srv/%U\nadmin users = bin", "another's rights"},
   };
   for (const auto& [lines, why] : bad) {
@@ -208,6 +209,7 @@ TEST(ShareAccess, PutsOthersInTheUsersPlace) {
   EXPECT_TRUE(Access("force group = work").identity.InGroup(60102));
   EXPECT_EQ(Access("force group = +work").identity, own);
   EXPECT_FALSE(Access("force user = carol\nforce group = +work").Admits());
+  EXPECT_FALSE(Access("guest only = yes\nforce group = +work").Admits());
   EXPECT_EQ(Access("guest only = yes").identity.uid, IdentityOfUser("nobody").value().uid);
   EXPECT_TRUE(Access("force user = bob\nadmin users = alice").identity.unrestricted);
   EXPECT_FALSE(Access("admin users = alice\ninvalid users = alice").Admits());
