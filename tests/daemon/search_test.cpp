@@ -200,6 +200,33 @@ TEST_F(SearchTest, NobodySeesMoreThanTheirOwn) {
   EXPECT_EQ(Names(root_user_, "word"), (Strings{"all.txt", "bins.txt", "games.txt"}));
 }
 
+TEST_F(SearchTest, ShareRulesPutOthersInTheUsersPlace) {
+  const auto others = IdentityOfUser("daemon").value();
+  AddShare("forced", "force user = games");
+  AddShare("root", "admin users = bin");
+  AddShare("veto", "veto files = /*.bak/");
+  std::filesystem::create_directories(root_ + "/closed/below");
+  std::filesystem::create_directory_symlink("closed/below", root_ + "/below");
+  AddShare("below");
+  File("forced/g", "word", 0600, games_.uid);
+  File("forced/b", "word", 0600, bin_.uid);
+  File("root/r", "word", 0600);
+  File("veto/v.bak", "word");
+  File("below/c", "word");
+  ASSERT_EQ(chmod((root_ + "/closed").c_str(), 0700), 0);
+  ASSERT_EQ(chown((root_ + "/closed").c_str(), games_.uid, 0), 0);
+  for (const char* share : {"forced", "root", "veto", "below"}) Index(share);
+  EXPECT_EQ(Names(bin_, "word"), (Strings{"g", "r"}));
+  EXPECT_EQ(Names(games_, "word"), (Strings{"c", "g"}));
+  EXPECT_EQ(Names(others, "word"), (Strings{"g"}));
+  // An index that knows nothing of the veto patterns is none.
+  EXPECT_EQ(Names(root_user_, "word", R"({"indice": ["fileindex_veto"]})"), (Strings{}));
+  RecordCrawlTerms(root_ + "/index/fileindex_veto", CrawlTermsOf(*table_->Find("veto")));
+  EXPECT_EQ(Names(root_user_, "word", R"({"indice": ["fileindex_veto"]})"), (Strings{"v.bak"}));
+  EXPECT_EQ(Names(bin_, "word", R"({"indice": ["fileindex_veto"]})"), (Strings{}))
+      << "the page check judges patterns too";
+}
+
 /// What the child process of that user can open.
 Strings Openable(const Identity& who, const std::string& folder) {
   int ends[2];
