@@ -46,17 +46,18 @@ struct Standing {
   maru::ShareAccess access;
   /// The rights that count are the user's own.
   bool is_own = true;
-  /// Enters the share, and can cross the folders on the way to it.
-  bool is_in = true;
+  /// Can cross the folders on the way to the share.
+  bool can_reach = true;
 };
 
 Standing StandingOf(const maru::ShareSettings& share, const std::string& user_name,
                     const maru::Identity& session) {
   Standing standing{maru::AccessOf(share, user_name, session)};
+  if (!standing.access.Admits()) standing.access.identity = session;
   standing.is_own = standing.access.identity == session;
   std::optional<maru::RootsEyes> eyes;
   if (!standing.is_own) eyes.emplace();
-  standing.is_in = standing.access.Admits() && maru::CanReach(standing.access.identity, share.path);
+  standing.can_reach = maru::CanReach(standing.access.identity, share.path);
   return standing;
 }
 
@@ -113,7 +114,8 @@ std::optional<int> BitsByShare(const char* path, int asked) {
   const std::optional<maru::Account> account = maru::AccountByUID(uid);
   if (!share || !account) return std::nullopt;
   const Standing& standing = OwnStanding(table, *share, *account);
-  if (!standing.is_in || !maru::Serves(*share, account->name, place.rest)) return 0;
+  const bool is_in = standing.access.Admits() && standing.can_reach;
+  if (!is_in || !maru::Serves(*share, account->name, place.rest)) return 0;
   if (standing.is_own) return std::nullopt;
   const maru::RootsEyes eyes;
   const int bits = Walk(standing.access.identity, std::string(place.folder), place.rest);
@@ -134,7 +136,7 @@ int BitsOf(const char* user_name, const MLIBCSzList* groups, const char* path) {
   const std::string folder(place.folder);
   if (session->unrestricted) return Walk(*session, folder, place.rest);
   const Standing standing = StandingOf(*share, user_name, *session);
-  if (!standing.is_in || !maru::Serves(*share, user_name, place.rest)) return 0;
+  if (!standing.can_reach || !maru::Serves(*share, user_name, place.rest)) return 0;
   std::optional<maru::RootsEyes> eyes;
   if (!standing.is_own) eyes.emplace();
   return Walk(standing.access.identity, folder, place.rest);

@@ -14,8 +14,8 @@ int MARUACLPermGet(const char* path, unsigned int* bits);
 
 /// Permission bits of any user, computed from owners, modes and ACLs of the path and, for the way
 /// there, of every directory from "/" down; no right on the way means no bits. They are of whom the
-/// share's settings put in the user's place, and none outside of what it serves the user.
-/// `groups` is that user's list of MLIBGroupInfoListGet. Members of the administrators' group have
-/// all bits. 0, or -1 with errno when the path cannot be examined; a path that the *calling*
-/// identity cannot reach gives 0 bits.
+/// share's settings put in the user's place, and none outside of what it serves the user; whether
+/// it admits the user is not asked. `groups` is that user's list of MLIBGroupInfoListGet. Members
+/// of the administrators' group have all bits. 0, or -1 with errno when the path cannot be
+/// examined; a path that the *calling* identity cannot reach gives 0 bits.
 int MARUACLPermCalc(const char* user_name, const MLIBCSzList* groups, const char* path, int* bits);

@@ -5,15 +5,17 @@
 #include <poll.h>
 #include <signal.h>
 #include <spawn.h>
+#include <sys/mman.h>
 #include <sys/wait.h>
 
 #include <array>
 #include <chrono>
-#include <map>
-#include <optional>
+#include <span>
 #include <stdexcept>
+#include <vector>
 
-#include "system/text.h"
+#include "system/samba_text.h"
+#include "system/share_table.h"
 #include "system/throw_errno.h"
 #include "system/unique_fd.h"
 #include "system/whole_file.h"
@@ -41,11 +43,20 @@ struct Pipe {
   UniqueFd reading, writing;
 };
 
+/// testparm's own, as opposed to what keeps it from running at all.
+class TestparmRefusal : public std::runtime_error {
+ public:
+  using std::runtime_error::runtime_error;
+};
+
 /// What a child writes to its standard output and standard error, both bounded: output beyond its
 /// bound is a failure, complaints beyond theirs are dropped.
 class Testparm {
  public:
-  explicit Testparm(const std::string& path) { Start(path); }
+  /// `input`, unless it is empty, is its standard input.
+  explicit Testparm(const std::string& path, const UniqueFd& input = UniqueFd()) {
+    Start(path, input);
+  }
   ~Testparm() {
     if (child_ <= 0) return;
     kill(child_, SIGKILL);
@@ -57,17 +68,21 @@ class Testparm {
   std::string Result() {
     while (output_.reading || complaint_.reading) ReadSome();
     const int status = Wait();
-    if (!WIFEXITED(status) || WEXITSTATUS(status) != 0) throw std::runtime_error(Complaint());
+    if (!WIFEXITED(status) || WEXITSTATUS(status) != 0) throw TestparmRefusal(Complaint());
     return std::move(text_);
   }
 
  private:
-  void Start(const std::string& path) {
+  void Start(const std::string& path, const UniqueFd& input) {
     posix_spawn_file_actions_t files;
     posix_spawnattr_t attributes;
     sigset_t signals;
     posix_spawn_file_actions_init(&files);
-    posix_spawn_file_actions_addopen(&files, STDIN_FILENO, "/dev/null", O_RDONLY, 0);
+    if (input) {
+      posix_spawn_file_actions_adddup2(&files, input.Get(), STDIN_FILENO);
+    } else {
+      posix_spawn_file_actions_addopen(&files, STDIN_FILENO, "/dev/null", O_RDONLY, 0);
+    }
     posix_spawn_file_actions_adddup2(&files, output_.writing.Get(), STDOUT_FILENO);
     posix_spawn_file_actions_adddup2(&files, complaint_.writing.Get(), STDERR_FILENO);
     posix_spawn_file_actions_addclosefrom_np(&files, STDERR_FILENO + 1);
@@ -140,78 +155,45 @@ class Testparm {
   pid_t child_ = 0;
 };
 
-/// "name = value" of a line of settings; a name may be spelt with any capitals and spaces.
-std::optional<std::pair<std::string, std::string>> Assignment(std::string_view line) {
-  const std::size_t equals = line.find('=');
-  if (equals == line.npos) return std::nullopt;
-  std::string name = Lowered(line.substr(0, equals));
-  std::erase_if(name, [](char c) { return c == ' ' || c == '\t'; });
-  return std::pair(name, std::string(Trimmed(line.substr(equals + 1))));
+std::string CanonicalText(const std::string& text) {
+  UniqueFd file(memfd_create("smb.conf", MFD_CLOEXEC));
+  CheckErrno(file && WriteAll(file, text), "testparm: memory");
+  return Testparm("/proc/self/fd/0", file).Result();
 }
 
-/// By section: what it includes that is another file for each client. testparm shows these with the
-/// variables as they are for itself.
-class Includes {
- public:
-  void Read(const std::string& path, int depth = 0) {
-    std::string text;
-    if (depth > kMaxIncludes || !ReadWholeFile(path, kMaxOutput, text, Link::kFollow)) return;
-    for (std::string_view rest = text; !rest.empty();) {
-      std::string line = TakeLine(rest);
-      if (line.starts_with('#') || line.starts_with(';')) continue;
-      if (line.starts_with('[')) section_ = Lowered(Trimmed(line.substr(1, line.find(']') - 1)));
-      if (const auto set = Assignment(line)) Take(set->first, set->second, depth);
-    }
+/// Which sections testparm takes, with those of `base`: found by halves.
+void Sift(const std::string& base, std::span<const SambaSection> sections, std::string& good,
+          std::vector<WithheldShare>& bad) {
+  if (sections.empty()) return;
+  std::string text = base;
+  for (const SambaSection& section : sections) text += section.text;
+  try {
+    CanonicalText(text);
+    good += text.substr(base.size());
+  } catch (const TestparmRefusal& refusal) {
+    if (sections.size() == 1) return bad.push_back({sections[0].name, refusal.what()});
+    const std::size_t half = sections.size() / 2;
+    Sift(base, sections.first(half), good, bad);
+    Sift(base, sections.subspan(half), good, bad);
   }
+}
 
-  std::map<std::string, std::string> varying;
-
- private:
-  static constexpr int kMaxIncludes = 100;
-
-  /// The next line, with those that it goes on in.
-  static std::string TakeLine(std::string_view& rest) {
-    std::string line;
-    bool goes_on = true;
-    while (goes_on && !rest.empty()) {
-      const std::size_t end = std::min(rest.find('\n'), rest.size());
-      line += Trimmed(rest.substr(0, end));
-      rest.remove_prefix(std::min(end + 1, rest.size()));
-      goes_on = line.ends_with('\\');
-      if (goes_on) line.pop_back();
-    }
-    return line;
+/// The canonical form without the sections that testparm refuses; these say so themselves. Throws
+/// what testparm says when it refuses the rest too.
+std::string WithoutRefused(const std::string& path) {
+  std::string text;
+  if (!ReadWholeFile(path, kMaxOutput, text, Link::kFollow)) ThrowErrno(path);
+  std::string base;
+  const std::vector<SambaSection> sections = SectionsOf(text, base);
+  CanonicalText(base);
+  std::string good;
+  std::vector<WithheldShare> bad;
+  Sift(base, sections, good, bad);
+  std::string canonical = CanonicalText(base + good);
+  for (const WithheldShare& share : bad) {
+    canonical += "[" + share.name + "]\n\tmaruseeker:refused = " + share.reason + "\n";
   }
-
-  void Take(const std::string& name, const std::string& value, int depth) {
-    if (name == "copy" && varying.contains(Lowered(value))) {
-      varying[section_] = varying[Lowered(value)];
-    }
-    if (name != "include") return;
-    if (value.find('%') != value.npos) {
-      varying[section_] = value;
-    } else {
-      Read(value, depth + 1);
-    }
-  }
-
-  std::string section_ = "global";
-};
-
-/// The canonical text with these includes in the place of testparm's own.
-std::string Restored(std::string_view text, const std::map<std::string, std::string>& varying) {
-  std::string restored;
-  while (!text.empty()) {
-    const std::string_view line = text.substr(0, text.find('\n'));
-    text.remove_prefix(std::min(line.size() + 1, text.size()));
-    const std::string_view words = Trimmed(line);
-    if (words.starts_with("include =")) continue;
-    restored.append(line).append("\n");
-    if (!words.starts_with('[') || !words.ends_with(']')) continue;
-    const auto include = varying.find(Lowered(words.substr(1, words.size() - 2)));
-    if (include != varying.end()) restored.append("\tinclude = " + include->second + "\n");
-  }
-  return restored;
+  return canonical;
 }
 
 }  // namespace
@@ -221,10 +203,13 @@ std::string CanonicalSamba(const std::string& path) {
   if (!UniqueFd(open(path.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC))) {
     ThrowErrno(path);
   }
-  const std::string text = Testparm(path).Result();
-  Includes includes;
-  includes.Read(path);
-  return Restored(text, includes.varying);
+  std::string text;
+  try {
+    text = Testparm(path).Result();
+  } catch (const TestparmRefusal&) {
+    text = WithoutRefused(path);
+  }
+  return WithIncludes(text, VaryingIncludes(path));
 }
 
 }  // namespace maru

@@ -110,6 +110,17 @@ void SetInclude(Section&, Value value) {
   if (value.find('%') != value.npos) throw std::runtime_error("is another for each client");
 }
 
+/// Samba knows no %S here.
+void SetAdminUsers(Section& section, Value value) {
+  section.share.admin_users = Names(value);
+  std::erase_if(section.share.admin_users,
+                [](const std::string& name) { return name.find("%S") != name.npos; });
+}
+
+void SetRefused(Section&, Value) {
+  throw std::runtime_error("is all there is of it");
+}
+
 void SetHiddenWhileNew(Section&, Value value) {
   if (value != "0") throw std::runtime_error("hides files for a time");
 }
@@ -132,8 +143,7 @@ constexpr ShareParameter kParameters[] = {
     {"write list", "who also writes", [](Section& s, Value v) { s.share.write_list = Names(v); }},
     {"read only", "whether the others write",
      [](Section& s, Value v) { s.share.read_only = Flag(v); }},
-    {"admin users", "who has root's rights on files",
-     [](Section& s, Value v) { s.share.admin_users = Names(v); }},
+    {"admin users", "who has root's rights on files", SetAdminUsers},
     {"force user", "whose rights on files count",
      [](Section& s, Value v) { s.share.force_user = PlainName(v); }},
     {"force group", "a further group; with `+` only for its members",
@@ -171,6 +181,8 @@ constexpr ShareParameter kParameters[] = {
     {"state directory", "where `share_info.tdb` lies: a share with an ACL of its own is withheld",
      [](Section& s, Value v) { s.samba_state = v; }},
     {"printable", "no share with files", [](Section& s, Value v) { s.printable = Flag(v); }},
+    {"maruseeker:refused", "set by MaruSeeker where testparm refuses the section: withheld",
+     SetRefused},
     {"maruseeker:index", "`no`: the share is not indexed",
      [](Section& s, Value v) { s.share.index = Flag(v); }},
     {"maruseeker:deny", "`list read`: listing, or reading, through the web is forbidden",

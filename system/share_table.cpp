@@ -98,8 +98,7 @@ void CheckPersonal(const ShareSettings& share) {
 }
 
 void SettlePath(ShareSettings& share) {
-  const bool homes = SameWord(share.name, kHomesShare);
-  if (homes) share.name = kHomesShare;
+  const bool homes = share.name == kHomesShare;
   SettlePersonal(share, homes);
   if (share.personal) CheckPersonal(share);
   if (!homes) Replace(share.path, "%S", share.name);
@@ -114,14 +113,14 @@ void SettlePath(ShareSettings& share) {
   StripSlashes(share.path);
 }
 
-/// Samba does not take its guest for a person, nor a forced nobody for nobody: to them it closes
-/// also what the account owns.
+/// Samba does not take its guest for a person, nor who is forced to the guest's account for the
+/// guest: to them it closes also what the account owns.
 void CheckForced(const ShareSettings& share) {
   const std::optional<Account> forced = AccountByName(share.force_user);
-  if (forced && forced->uid == kNobody) {
+  const std::optional<Account> guest = AccountByName(share.guest_account);
+  if (forced && (forced->uid == kNobody || (guest && forced->uid == guest->uid))) {
     throw std::runtime_error("its user is forced to nobody's account, " + share.force_user);
   }
-  const std::optional<Account> guest = AccountByName(share.guest_account);
   if (share.guest_only && guest && IsPersons(*guest)) {
     throw std::runtime_error("its guests have a person's account, " + share.guest_account);
   }
@@ -194,7 +193,7 @@ class Parser {
 
   void BeginSection(std::string_view name) {
     section_ = defaults_;
-    section_.share.name = name;
+    section_.share.name = SameWord(name, kHomesShare) ? kHomesShare : name;
     section_.global = SameWord(name, "global");
     open_ = true;
   }
@@ -215,6 +214,7 @@ class Parser {
     ShareSettings& share = section_.share;
     try {
       CheckName(share.name);
+      for (const auto& [parameter, reason] : section_.reasons) throw std::runtime_error(reason);
       SettlePath(share);
       CheckSection();
       shares.push_back(share);
@@ -224,7 +224,6 @@ class Parser {
   }
 
   void CheckSection() {
-    for (const auto& [parameter, reason] : section_.reasons) throw std::runtime_error(reason);
     if (AsksForAddress(section_) || AsksForAddress(defaults_)) {
       throw std::runtime_error("\"hosts allow\" or \"hosts deny\" ask for the client's address");
     }

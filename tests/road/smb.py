@@ -49,6 +49,10 @@ class Server:
                            check=True, stdout=subprocess.DEVNULL)
 
     def start(self):
+        # A guest account of before would stay one.
+        for folder in ("/var/cache/samba", "/var/lib/samba", "/run/samba"):
+            for cache in pathlib.Path(folder).glob("gencache*"):
+                cache.unlink()
         with open(self.log, "wb") as log:
             # It ends its process group with itself.
             self.process = subprocess.Popen(

@@ -99,6 +99,7 @@ TEST(ShareTable, WithholdsABadShareAlone) {
       {"force user = OTHER\\alice", "plainly"},
       {"guest only = yes\nforce user = bin", "guests"},
       {"force user = nobody", "nobody's account"},
+      {"guest account = bin\nforce user = bin", "nobody's account"},
       {"path = /srv/%U\nadmin users = bin", "another's rights"},
   };
   for (const auto& [lines, why] : bad) {
@@ -213,6 +214,9 @@ TEST(ShareAccess, PutsOthersInTheUsersPlace) {
   EXPECT_EQ(Access("guest only = yes").identity.uid, IdentityOfUser("nobody").value().uid);
   EXPECT_TRUE(Access("force user = bob\nadmin users = alice").identity.unrestricted);
   EXPECT_FALSE(Access("admin users = alice\ninvalid users = alice").Admits());
+  EXPECT_EQ(
+      AccessOf(ShareTable::Parse("[homes]\nadmin users = %S\n").Shares()[0], "alice", own).identity,
+      own);
 }
 
 TEST(Way, IsOpenToWhoCanCrossEveryFolder) {
@@ -283,6 +287,21 @@ TEST_F(Samba, SettingsAreReadThroughTestparm) {
   EXPECT_EQ(ShareTable::Current(), table);
 }
 
+TEST_F(Samba, WithholdsWhatTestparmRefuses) {
+  std::string text = "[global]\nhide unreadable = yes\n";
+  for (const std::string name : {"a", "b", "c", "d", "e"}) {
+    text += "[" + name + "]\npath = /mnt/" + name + "\n";
+    if (name == "b" || name == "e") text += "read only = perhaps\n";
+  }
+  Write(text);
+  const auto table = ShareTable::Current();
+  EXPECT_EQ(table->Error(), "");
+  EXPECT_THAT(Names(*table), ElementsAre("a", "c", "d"));
+  ASSERT_EQ(table->Withheld().size(), 2u);
+  EXPECT_EQ(table->Withheld()[1].name, "e");
+  EXPECT_THAT(table->Withheld()[1].reason, HasSubstr("perhaps"));
+}
+
 TEST_F(Samba, WithholdsWhatTestparmDoesNotShow) {
   folder_.Write("included", "[docs]\npath = /mnt/docs\nInClude =\\\n /etc/%m.conf\n");
   std::filesystem::create_directory(folder_ / "samba");
@@ -302,7 +321,7 @@ TEST_F(Samba, WithholdsWhatTestparmDoesNotShow) {
 
 TEST_F(Samba, BadSettingsLeaveTheLastGoodOnes) {
   ASSERT_EQ(ShareTable::Current()->Error(), "");
-  Write("[photo]\npath = /mnt/photo\nread only = perhaps\n[new]\npath=/new\n");
+  Write("[global]\nread only = perhaps\n[photo]\npath = /mnt/photo\n[new]\npath=/new\n");
   const auto table = ShareTable::Current();
   EXPECT_THAT(table->Error(), HasSubstr("perhaps"));
   EXPECT_THAT(Names(*table), ElementsAre("photo"));
@@ -316,7 +335,7 @@ TEST_F(Samba, BadSettingsLeaveTheLastGoodOnes) {
 
 TEST_F(Samba, BadSettingsAtTheStartBringTheCopyBack) {
   NEEDS_ACCOUNTS();
-  Write("[photo\n");
+  Write("[global]\nread only = perhaps\n");
   if (StatusOfChild([] { _exit(ShareTable::Current()->Shares().empty() ? 0 : 1); }) != 0) {
     GTEST_SKIP() << "needs a process that has read no settings yet";
   }
@@ -325,7 +344,7 @@ TEST_F(Samba, BadSettingsAtTheStartBringTheCopyBack) {
   struct stat status;
   ASSERT_EQ(stat((folder_ / "state/shares.conf").c_str(), &status), 0);
   EXPECT_EQ(status.st_uid, 60000u);
-  Write("[photo]\nread only = perhaps\n");
+  Write("[global]\nread only = perhaps\n");
   // Another program: nothing in memory.
   EXPECT_EQ(StatusOfChild([] {
               const auto table = ShareTable::Current();
