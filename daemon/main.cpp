@@ -56,6 +56,11 @@ int Serve(const Config& config) {
   UsageStore usage(config.state_dir + "/usage.db");
   Core core{.indices = indices, .usage = usage};
   core.history = history::NewestSearches;
+  // Samba's own ACLs of shares are for root to read.
+  core.shares = [] {
+    const RaisedReadSearch raised;
+    return ShareTable::Current();
+  };
   Server server(core, listener.Socket(), identity.uid, {});
   running = &server;
   for (const int signal : {SIGTERM, SIGINT}) std::signal(signal, OnSignal);

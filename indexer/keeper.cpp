@@ -102,13 +102,16 @@ void Keeper::CrawlBy(Clock::time_point time) {
 }
 
 void Keeper::Crawl() {
-  if (!tree_) tree_ = std::make_unique<Tree>(target_.index_folder, counts_, &follower_);
+  if (!tree_) {
+    PrepareIndex(target_);
+    tree_ = std::make_unique<Tree>(target_.index_folder, counts_, &follower_);
+  }
   const Clock::time_point begin = Clock::now();
   follower_.Renew();
   const UniqueFd top = OpenTop(target_.path);
   if (!top) MARU_LOG("Cannot open the folder of share %s", target_.share.c_str());
-  Updater updater(*tree_, workers_, stop_);
-  compared_ = top && indexer::Crawl(updater).Run(top.Get(), target_.share);
+  Updater updater(*tree_, target_.selection, workers_, stop_);
+  compared_ = top && CrawlByTerms(updater, target_, top.Get());
   last_crawl_ = Clock::now();
   const auto took = std::chrono::duration_cast<seconds>(last_crawl_ - begin);
   const auto rest = std::max<seconds>(kUnwatchedInterval, took * kUnwatchedRest);
@@ -121,7 +124,7 @@ void Keeper::Follow() {
   NamesByFolder due = follower_.TakeDue();
   const UniqueFd top = due.empty() || !compared_ ? UniqueFd() : OpenTop(target_.path);
   if (!top) return;
-  Updater updater(*tree_, workers_, stop_);
+  Updater updater(*tree_, target_.selection, workers_, stop_);
   follower_.CatchUp(updater, top.Get(), std::move(due));
   tree_->Commit();
 }

@@ -25,6 +25,14 @@ std::string Admitted(const ShareSettings& share) {
   return names.empty() ? "everyone" : names;
 }
 
+void ShowWithheld(const ShareTable& table) {
+  if (table.Withheld().empty()) return;
+  std::vector<std::vector<std::string>> rows{{"WITHHELD", "BECAUSE"}};
+  for (const WithheldShare& share : table.Withheld()) rows.push_back({share.name, share.reason});
+  std::printf("\n");
+  PrintTable(rows);
+}
+
 }  // namespace
 
 int ShowShares() {
@@ -35,6 +43,7 @@ int ShowShares() {
     rows.push_back({share.name, share.path, IndexState(share, indexed), Admitted(share)});
   }
   PrintTable(rows);
+  ShowWithheld(*table);
   if (table->Error().empty()) return kGood;
   std::printf(
       "\nThe newest settings are not in force; these are the last good ones. The reason: %s\n",

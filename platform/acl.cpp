@@ -7,14 +7,19 @@
 
 #include <algorithm>
 #include <charconv>
+#include <chrono>
+#include <memory>
 #include <string_view>
 
 #include "platform/account.h"
 #include "platform/guard.h"
 #include "system/accounts.h"
+#include "system/acting.h"
+#include "system/share_access.h"
 #include "system/share_table.h"
 #include "system/unique_fd.h"
 #include "system/volume_path.h"
+#include "system/way.h"
 
 namespace {
 
@@ -34,6 +39,47 @@ std::optional<maru::Identity> IdentityWith(const char* user_name, const MLIBCSzL
   std::sort(who->groups.begin(), who->groups.end());
   who->unrestricted = who->unrestricted || maru::IsAdministrator(*account);
   return who;
+}
+
+/// A user in a share.
+struct Standing {
+  maru::ShareAccess access;
+  /// The rights that count are the user's own.
+  bool is_own = true;
+  /// Can cross the folders on the way to the share.
+  bool can_reach = true;
+};
+
+Standing StandingOf(const maru::ShareSettings& share, const std::string& user_name,
+                    const maru::Identity& session) {
+  Standing standing{maru::AccessOf(share, user_name, session)};
+  if (!standing.access.Admits()) standing.access.identity = session;
+  standing.is_own = standing.access.identity == session;
+  std::optional<maru::RootsEyes> eyes;
+  if (!standing.is_own) eyes.emplace();
+  standing.can_reach = maru::CanReach(standing.access.identity, share.path);
+  return standing;
+}
+
+/// That of the process's own user, kept for the moment that an account is: a page asks for each of
+/// its hits.
+const Standing& OwnStanding(const std::shared_ptr<const maru::ShareTable>& table,
+                            const maru::ShareSettings& share, const maru::Account& account) {
+  static struct {
+    std::shared_ptr<const maru::ShareTable> table;
+    const maru::ShareSettings* share;
+    uid_t uid;
+    std::chrono::steady_clock::time_point until;
+    Standing standing;
+  } kept;
+  const auto now = std::chrono::steady_clock::now();
+  if (kept.table != table || kept.share != &share || kept.uid != account.uid || now > kept.until) {
+    const auto session =
+        maru::IdentityOfUser(account.name).value_or(maru::Identity{account.uid, {}});
+    kept = {table, &share, account.uid, now + maru::kNameServiceAge,
+            StandingOf(share, account.name, session)};
+  }
+  return kept.standing;
 }
 
 bool IsLink(int descriptor) {
@@ -57,6 +103,45 @@ int Walk(const maru::Identity& who, const std::string& folder, std::string_view 
   return errno == EACCES ? 0 : -1;
 }
 
+/// What the share says of the process's user on the path: the bits that are left of those asked
+/// for, or nothing, where the kernel is to say.
+std::optional<int> BitsByShare(const char* path, int asked) {
+  const uid_t uid = geteuid();
+  maru::VolumePath place;
+  if (uid == 0 || !maru::SplitVolumePath(path, place)) return std::nullopt;
+  const auto table = maru::ShareTable::Current();
+  const maru::ShareSettings* share = table->Find(std::string(place.share));
+  const std::optional<maru::Account> account = maru::AccountByUID(uid);
+  if (!share || !account) return std::nullopt;
+  const Standing& standing = OwnStanding(table, *share, *account);
+  const bool is_in = standing.access.Admits() && standing.can_reach;
+  if (!is_in || !maru::Serves(*share, account->name, place.rest)) return 0;
+  if (standing.is_own) return std::nullopt;
+  const maru::RootsEyes eyes;
+  const int bits = Walk(standing.access.identity, std::string(place.folder), place.rest);
+  return bits < 0 ? bits : bits & asked;
+}
+
+/// Bits of any user; -1 with errno.
+int BitsOf(const char* user_name, const MLIBCSzList* groups, const char* path) {
+  maru::VolumePath place;
+  const auto table = maru::ShareTable::Current();
+  const maru::ShareSettings* share = nullptr;
+  if (maru::SplitVolumePath(path, place)) share = table->Find(std::string(place.share));
+  const auto session = share ? IdentityWith(user_name, groups) : std::nullopt;
+  if (!session) {
+    errno = ENOENT;
+    return -1;
+  }
+  const std::string folder(place.folder);
+  if (session->unrestricted) return Walk(*session, folder, place.rest);
+  const Standing standing = StandingOf(*share, user_name, *session);
+  if (!standing.can_reach || !maru::Serves(*share, user_name, place.rest)) return 0;
+  std::optional<maru::RootsEyes> eyes;
+  if (!standing.is_own) eyes.emplace();
+  return Walk(standing.access.identity, folder, place.rest);
+}
+
 }  // namespace
 
 int MARUACLPermGet(const char* path, unsigned int* bits) {
@@ -64,6 +149,16 @@ int MARUACLPermGet(const char* path, unsigned int* bits) {
   if (!path || !bits) return -1;
   const int asked = static_cast<int>(*bits) & (kACLRead | kACLWrite | kACLExecute);
   *bits = static_cast<unsigned int>(asked);
+  int by_share = 0;
+  const bool told = maru::Guarded("MARUACLPermGet", true, [&] {
+    const std::optional<int> left = BitsByShare(path, asked);
+    by_share = left.value_or(0);
+    return left.has_value();
+  });
+  if (told) {
+    *bits = static_cast<unsigned int>(std::max(by_share, 0));
+    return by_share < 0 ? -1 : 0;
+  }
   {
     // One look, when the user has them all.
     const maru::KeepErrno keep;
@@ -87,17 +182,7 @@ int MARUACLPermCalc(const char* user_name, const MLIBCSzList* groups, const char
     return -1;
   }
   return maru::Guarded("MARUACLPermCalc", -1, [&] {
-    maru::VolumePath place;
-    std::optional<maru::Identity> who;
-    if (maru::SplitVolumePath(path, place) &&
-        maru::ShareTable::Current()->Find(std::string(place.share))) {
-      who = IdentityWith(user_name, groups);
-    }
-    if (!who) {
-      errno = ENOENT;
-      return -1;
-    }
-    const int walked = Walk(*who, std::string(place.folder), place.rest);
+    const int walked = BitsOf(user_name, groups, path);
     if (walked < 0) return -1;
     errno = 0;
     *bits = walked;

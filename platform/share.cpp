@@ -9,6 +9,7 @@
 
 #include "platform/account.h"
 #include "platform/guard.h"
+#include "system/share_access.h"
 #include "system/share_table.h"
 #include "system/volume_path.h"
 
@@ -77,7 +78,8 @@ int MARUShareUserPrivGet(const char* user_name, const MARUSHARE* share) {
     const std::optional<maru::Identity> identity = maru::IdentityOfUser(user_name);
     if (!identity) return int{kSharePrivNone};
     if (MLIBGroupIsAdminGroupMem(user_name, 0) == 1) return int{kSharePrivReadWrite};
-    return int{maru::PrivilegeOf(*settings, user_name, *identity)};
+    const maru::ShareAccess access = maru::AccessOf(*settings, user_name, *identity);
+    return int{access.privilege};
   });
 }
 

@@ -5,8 +5,8 @@
 
 #include "platform/string_list.h"
 
-/// Shared folders, as the server's Samba settings define them. No function throws; failures are
-/// negative results with the last error set (platform/process.h).
+/// Shared folders, as the server's Samba settings define them, but for those that are withheld. No
+/// function throws; failures are negative results with the last error set (platform/process.h).
 
 struct MARUSHARE {
   char* szName;
@@ -24,9 +24,9 @@ enum MARUSHAREPRIV { kSharePrivReadWrite = 1, kSharePrivReadOnly = 2, kSharePriv
 int MARUShareGet(const char* name, MARUSHARE** share);
 void MARUShareFree(MARUSHARE* share);
 
-/// MARUSHAREPRIV of the user on the share, from `available`, `invalid users`, `valid users`, `read
-/// list`, `write list` and `read only`, with @, + and & groups and %S. Members of the
-/// administrators' group have kSharePrivReadWrite everywhere. An unknown user has none.
+/// MARUSHAREPRIV of the user on the share, by its lists and the accounts it puts in users' places.
+/// Members of the administrators' group have kSharePrivReadWrite everywhere. An unknown user has
+/// none.
 int MARUShareUserPrivGet(const char* user_name, const MARUSHARE* share);
 
 /// The share that holds a volume path (lexically; ".." is refused): writes its name and its own

@@ -7,6 +7,7 @@
 #include <algorithm>
 #include <chrono>
 #include <map>
+#include <mutex>
 #include <type_traits>
 #include <utility>
 
@@ -109,6 +110,16 @@ std::optional<Account> AccountByName(const std::string& name) {
 
 std::optional<Account> AccountByUID(uid_t uid) {
   return recent.by_uid.Get(uid, [&] { return LookUp(getpwuid_r, uid, ToAccount); });
+}
+
+std::vector<Account> AllAccounts() {
+  static std::mutex mutex;  // the C library keeps one place in the list for all threads
+  const std::lock_guard lock(mutex);
+  std::vector<Account> accounts;
+  setpwent();
+  while (const passwd* entry = getpwent()) accounts.push_back(ToAccount(*entry));
+  endpwent();
+  return accounts;
 }
 
 std::optional<gid_t> GroupByName(const std::string& name) {

@@ -26,6 +26,8 @@ struct Account {
 
 std::optional<Account> AccountByName(const std::string& name);
 std::optional<Account> AccountByUID(uid_t uid);
+/// Those that the name service lists; some sources list none.
+std::vector<Account> AllAccounts();
 std::optional<gid_t> GroupByName(const std::string& name);
 
 /// The account's groups, the primary one first, each once.

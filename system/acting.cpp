@@ -67,6 +67,17 @@ std::optional<ProcessIdentity> IdentityToTake(const std::string& user_name, bool
 
 }  // namespace
 
+RootsEyes::RootsEyes() : before_(geteuid()) {
+  const int error = errno;
+  if (before_ != 0 && seteuid(0) != 0) errno = error;
+}
+
+RootsEyes::~RootsEyes() {
+  const int error = errno;
+  if (geteuid() != before_ && seteuid(before_) != 0) abort();
+  errno = error;
+}
+
 bool ActAs(const std::string& user_name, bool all_groups) {
   const std::optional<ProcessIdentity> wanted = IdentityToTake(user_name, all_groups);
   ProcessIdentity before;

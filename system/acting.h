@@ -1,8 +1,24 @@
 #pragma once
 
+#include <sys/types.h>
+
 #include <string>
 
 namespace maru {
+
+/// For its lifetime the process looks at files with root's rights, if its saved user id is root's;
+/// else nothing changes. For looking only: what it made would be root's. Comes back as it was, or
+/// ends the process. One thread only.
+class RootsEyes {
+ public:
+  RootsEyes();
+  ~RootsEyes();
+  RootsEyes(const RootsEyes&) = delete;
+  RootsEyes& operator=(const RootsEyes&) = delete;
+
+ private:
+  uid_t before_;
+};
 
 /// Makes the calling process act as the user in everything: first back to root through the saved
 /// id, then supplementary groups (with `all_groups` false just the primary one), group ids and user

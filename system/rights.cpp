@@ -18,6 +18,8 @@ namespace {
 
 constexpr const char* kAttribute = "system.posix_acl_access";
 constexpr std::uint32_t kVersion = 2;
+constexpr std::size_t kHeader = 4;
+constexpr std::size_t kEntry = 8;
 
 struct Entry {
   int tag;
@@ -43,9 +45,6 @@ class Entries {
   }
 
  private:
-  static constexpr std::size_t kHeader = 4;
-  static constexpr std::size_t kEntry = 8;
-
   template <class T>
   T Number(std::size_t at) const {
     T number;
@@ -140,6 +139,17 @@ int RightsOf(const Identity& who, const FileRights& rights) {
   // are empty, and judges by the mode alone.
   if (!rights.acl.empty() && (rights.mode & 070) != 0) return BitsOfACL(who, rights).value_or(0);
   return (who.InGroup(rights.gid) ? rights.mode >> 3 : rights.mode) & 7;
+}
+
+void WithoutRead(FileRights& rights) {
+  // Without any bit the group's would say that the ACL is left aside.
+  const bool has_acl = !rights.acl.empty() && (rights.mode & 070) != 0;
+  rights.mode = static_cast<std::uint16_t>((rights.mode & ~0444) | (has_acl ? 020 : 0));
+  for (std::size_t at = kHeader; at + kEntry <= rights.acl.size(); at += kEntry) {
+    const bool is_mask = static_cast<unsigned char>(rights.acl[at]) == ACL_MASK;
+    char& bits = rights.acl[at + sizeof(std::uint16_t)];
+    bits = static_cast<char>((bits & ~kACLRead) | (is_mask ? kACLWrite : 0));
+  }
 }
 
 }  // namespace maru

@@ -56,4 +56,8 @@ bool ReadFileRights(int directory, const char* path, FileRights& rights,
 /// malformed ACL gives none.
 int RightsOf(const Identity& who, const FileRights& rights);
 
+/// Takes reading from everybody; who may search a folder stays as it was, who may write it need
+/// not.
+void WithoutRead(FileRights& rights);
+
 }  // namespace maru

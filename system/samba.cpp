@@ -5,14 +5,20 @@
 #include <poll.h>
 #include <signal.h>
 #include <spawn.h>
+#include <sys/mman.h>
 #include <sys/wait.h>
 
 #include <array>
 #include <chrono>
+#include <span>
 #include <stdexcept>
+#include <vector>
 
+#include "system/samba_text.h"
+#include "system/share_table.h"
 #include "system/throw_errno.h"
 #include "system/unique_fd.h"
+#include "system/whole_file.h"
 
 namespace maru {
 namespace {
@@ -37,11 +43,20 @@ struct Pipe {
   UniqueFd reading, writing;
 };
 
+/// testparm's own, as opposed to what keeps it from running at all.
+class TestparmRefusal : public std::runtime_error {
+ public:
+  using std::runtime_error::runtime_error;
+};
+
 /// What a child writes to its standard output and standard error, both bounded: output beyond its
 /// bound is a failure, complaints beyond theirs are dropped.
 class Testparm {
  public:
-  explicit Testparm(const std::string& path) { Start(path); }
+  /// `input`, unless it is empty, is its standard input.
+  explicit Testparm(const std::string& path, const UniqueFd& input = UniqueFd()) {
+    Start(path, input);
+  }
   ~Testparm() {
     if (child_ <= 0) return;
     kill(child_, SIGKILL);
@@ -53,17 +68,21 @@ class Testparm {
   std::string Result() {
     while (output_.reading || complaint_.reading) ReadSome();
     const int status = Wait();
-    if (!WIFEXITED(status) || WEXITSTATUS(status) != 0) throw std::runtime_error(Complaint());
+    if (!WIFEXITED(status) || WEXITSTATUS(status) != 0) throw TestparmRefusal(Complaint());
     return std::move(text_);
   }
 
  private:
-  void Start(const std::string& path) {
+  void Start(const std::string& path, const UniqueFd& input) {
     posix_spawn_file_actions_t files;
     posix_spawnattr_t attributes;
     sigset_t signals;
     posix_spawn_file_actions_init(&files);
-    posix_spawn_file_actions_addopen(&files, STDIN_FILENO, "/dev/null", O_RDONLY, 0);
+    if (input) {
+      posix_spawn_file_actions_adddup2(&files, input.Get(), STDIN_FILENO);
+    } else {
+      posix_spawn_file_actions_addopen(&files, STDIN_FILENO, "/dev/null", O_RDONLY, 0);
+    }
     posix_spawn_file_actions_adddup2(&files, output_.writing.Get(), STDOUT_FILENO);
     posix_spawn_file_actions_adddup2(&files, complaint_.writing.Get(), STDERR_FILENO);
     posix_spawn_file_actions_addclosefrom_np(&files, STDERR_FILENO + 1);
@@ -136,6 +155,47 @@ class Testparm {
   pid_t child_ = 0;
 };
 
+std::string CanonicalText(const std::string& text) {
+  UniqueFd file(memfd_create("smb.conf", MFD_CLOEXEC));
+  CheckErrno(file && WriteAll(file, text), "testparm: memory");
+  return Testparm("/proc/self/fd/0", file).Result();
+}
+
+/// Which sections testparm takes, with those of `base`: found by halves.
+void Sift(const std::string& base, std::span<const SambaSection> sections, std::string& good,
+          std::vector<WithheldShare>& bad) {
+  if (sections.empty()) return;
+  std::string text = base;
+  for (const SambaSection& section : sections) text += section.text;
+  try {
+    CanonicalText(text);
+    good += text.substr(base.size());
+  } catch (const TestparmRefusal& refusal) {
+    if (sections.size() == 1) return bad.push_back({sections[0].name, refusal.what()});
+    const std::size_t half = sections.size() / 2;
+    Sift(base, sections.first(half), good, bad);
+    Sift(base, sections.subspan(half), good, bad);
+  }
+}
+
+/// The canonical form without the sections that testparm refuses; these say so themselves. Throws
+/// what testparm says when it refuses the rest too.
+std::string WithoutRefused(const std::string& path) {
+  std::string text;
+  if (!ReadWholeFile(path, kMaxOutput, text, Link::kFollow)) ThrowErrno(path);
+  std::string base;
+  const std::vector<SambaSection> sections = SectionsOf(text, base);
+  CanonicalText(base);
+  std::string good;
+  std::vector<WithheldShare> bad;
+  Sift(base, sections, good, bad);
+  std::string canonical = CanonicalText(base + good);
+  for (const WithheldShare& share : bad) {
+    canonical += "[" + share.name + "]\n\tmaruseeker:refused = " + share.reason + "\n";
+  }
+  return canonical;
+}
+
 }  // namespace
 
 std::string CanonicalSamba(const std::string& path) {
@@ -143,7 +203,13 @@ std::string CanonicalSamba(const std::string& path) {
   if (!UniqueFd(open(path.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC))) {
     ThrowErrno(path);
   }
-  return Testparm(path).Result();
+  std::string text;
+  try {
+    text = Testparm(path).Result();
+  } catch (const TestparmRefusal&) {
+    text = WithoutRefused(path);
+  }
+  return WithIncludes(text, VaryingIncludes(path));
 }
 
 }  // namespace maru

@@ -2,6 +2,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <chrono>
 #include <mutex>
 
@@ -10,6 +11,7 @@
 #include "system/keep_errno.h"
 #include "system/log.h"
 #include "system/samba.h"
+#include "system/share_acls.h"
 #include "system/share_table.h"
 #include "system/throw_errno.h"
 #include "system/whole_file.h"
@@ -109,12 +111,35 @@ class ShareTableSource {
   void Read(const Config& config) {
     try {
       std::string text = ReadSettings(config);
-      if (table_ && table_->Error().empty() && text == text_) return;
-      Take(std::make_shared<ShareTable>(ShareTable::Parse(text)));
+      auto table = std::make_shared<ShareTable>(ShareTable::Parse(text));
+      WithholdByACL(*table);
+      const bool is_same = table_ && table_->Error().empty() && text == text_ &&
+                           table_->Withheld() == table->Withheld();
+      if (is_same) return;
+      LogWithheld(*table);
+      Take(std::move(table));
       text_ = std::move(text);
       KeepCopy(config, text_);
     } catch (const std::exception& error) {
       Stay(config, error.what());
+    }
+  }
+
+  static void WithholdByACL(ShareTable& table) {
+    const ShareACLs acls(table.samba_state_);
+    for (const ShareSettings& share : std::vector(table.shares_)) {
+      const std::string reason = acls.ReasonAgainst(share.name);
+      if (!reason.empty()) table.Withhold(share.name, reason);
+    }
+  }
+
+  /// What was not so in the table before.
+  void LogWithheld(const ShareTable& table) const {
+    errno = 0;
+    for (const WithheldShare& share : table.Withheld()) {
+      const auto* known = table_ ? &table_->Withheld() : nullptr;
+      if (known && std::ranges::count(*known, share) > 0) continue;
+      MARU_LOG("Share %s is withheld from search: %s", share.name.c_str(), share.reason.c_str());
     }
   }
 
@@ -137,7 +162,9 @@ class ShareTableSource {
     std::string text;
     if (!ReadWholeFile(CopyPath(config), kMaxFile, text)) return {};
     try {
-      return ShareTable::Parse(text);
+      ShareTable table = ShareTable::Parse(text);
+      WithholdByACL(table);
+      return table;
     } catch (const std::exception& error) {
       errno = 0;
       MARU_LOG("%s: %s", CopyPath(config).c_str(), error.what());

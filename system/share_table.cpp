@@ -1,11 +1,13 @@
 #include "system/share_table.h"
 
 #include <algorithm>
-#include <functional>
-#include <limits>
+#include <map>
 #include <stdexcept>
 #include <string_view>
+#include <utility>
 
+#include "system/accounts.h"
+#include "system/share_parameters.h"
 #include "system/text.h"
 
 namespace maru {
@@ -15,106 +17,126 @@ constexpr std::string_view kHomesByDefault = "/home";
 // "fileindex_" and the name make one file name.
 constexpr std::size_t kMaxName = 240;
 
-/// One section while it is read.
-struct Section {
-  ShareSettings share;
-  bool printable = false;
-  bool global = false;
-};
-
-std::vector<std::string> List(std::string_view text) {
-  std::vector<std::string> words;
-  std::string word;
-  bool quoted = false;
-  const auto end_word = [&] {
-    if (!word.empty()) words.push_back(std::move(word));
-    word.clear();
-  };
-  for (const char c : text) {
-    if (c == '"') {
-      quoted = !quoted;
-    } else if (!quoted && std::string_view(" \t,;").find(c) != std::string_view::npos) {
-      end_word();
-    } else {
-      word += c;
-    }
-  }
-  end_word();
-  return words;
-}
-
-bool Flag(std::string_view value) {
-  const std::optional<bool> truth = Truth(value);
-  if (!truth) throw std::runtime_error("must be yes or no");
-  return *truth;
-}
-
-unsigned int DenyFlags(std::string_view value) {
-  unsigned int flags = 0;
-  for (const std::string& word : List(value)) {
-    if (word != "list" && word != "read") throw std::runtime_error("must be of: list read");
-    flags |= word == "list" ? 1 : 4;
-  }
-  return flags;
-}
-
-bool HasRecycle(std::string_view value) {
-  const std::vector<std::string> modules = List(value);
-  return std::any_of(modules.begin(), modules.end(), [](const std::string& module) {
-    return module == "recycle" || module.starts_with("recycle:");
-  });
-}
-
-struct Parameter {
-  std::string_view name;
-  void (*set)(Section& section, std::string_view value);
-};
-
-/// The parameters that matter here.
-constexpr Parameter kParameters[] = {
-    {"path", [](Section& s, std::string_view v) { s.share.path = v; }},
-    {"available", [](Section& s, std::string_view v) { s.share.available = Flag(v); }},
-    {"printable", [](Section& s, std::string_view v) { s.printable = Flag(v); }},
-    {"read only", [](Section& s, std::string_view v) { s.share.read_only = Flag(v); }},
-    {"hide unreadable", [](Section& s, std::string_view v) { s.share.hide_unreadable = Flag(v); }},
-    {"vfs objects", [](Section& s, std::string_view v) { s.share.recycle = HasRecycle(v); }},
-    {"valid users", [](Section& s, std::string_view v) { s.share.valid_users = List(v); }},
-    {"invalid users", [](Section& s, std::string_view v) { s.share.invalid_users = List(v); }},
-    {"read list", [](Section& s, std::string_view v) { s.share.read_list = List(v); }},
-    {"write list", [](Section& s, std::string_view v) { s.share.write_list = List(v); }},
-    {"maruseeker:index", [](Section& s, std::string_view v) { s.share.index = Flag(v); }},
-    {"maruseeker:deny", [](Section& s, std::string_view v) { s.share.deny = DenyFlags(v); }},
-};
-
 void Replace(std::string& text, std::string_view what, std::string_view with) {
   for (std::size_t at = 0; (at = text.find(what, at)) != std::string::npos; at += with.size()) {
     text.replace(at, what.size(), with);
   }
 }
 
-/// Home folders lie beside each other, in what stands before the user's own component.
-std::string HomesFolder(const std::string& path) {
-  if (path.empty()) return std::string(kHomesByDefault);
-  const std::size_t variable = path.find('%');
-  return variable == std::string::npos ? path : path.substr(0, path.rfind('/', variable));
+constexpr uid_t kNobody = 65'534;
+
+/// By the ids that Debian gives people.
+bool IsPersons(const Account& account) {
+  constexpr uid_t first = 1000;
+  return account.uid >= first && account.uid < kNobody;
 }
 
-/// Makes the path final. False when the section is no folder of one place.
-bool Settle(Section& section) {
-  ShareSettings& share = section.share;
-  if (section.global || section.printable || SameWord(share.name, "printers") ||
-      SameWord(share.name, "print$")) {
-    return false;
+/// Where most people's homes lie.
+std::string HomesFolder() {
+  std::map<std::string, int> folders;
+  for (const Account& account : AllAccounts()) {
+    const std::size_t slash = account.home.rfind('/');
+    const bool is_deep = slash != 0 && slash != std::string::npos;
+    if (is_deep && IsPersons(account)) ++folders[account.home.substr(0, slash)];
   }
-  if (SameWord(share.name, kHomesShare)) {
-    share.name = kHomesShare;
-    share.path = HomesFolder(share.path);
+  const auto most = std::max_element(folders.begin(), folders.end(),
+                                     [](auto& a, auto& b) { return a.second < b.second; });
+  return most == folders.end() ? std::string(kHomesByDefault) : most->first;
+}
+
+bool IsOwnName(const std::vector<std::string>& list) {
+  return list == std::vector<std::string>{"%S"};
+}
+
+bool NamesShare(const std::vector<std::string>& list) {
+  return std::any_of(list.begin(), list.end(),
+                     [](const std::string& name) { return name.find("%S") != std::string::npos; });
+}
+
+/// Where a folder of each user's own stands in a path, as one component; npos when it does not.
+std::size_t PersonalComponent(const std::string& path, bool homes) {
+  for (const std::string_view variable : {"/%U", "/%u", "/%S"}) {
+    const std::size_t at = path.find(variable);
+    if (at == std::string::npos || (variable == "/%S" && !homes)) continue;
+    const std::size_t end = at + variable.size();
+    if (end == path.size() || path[end] == '/') return at;
   }
-  Replace(share.path, "%S", share.name);
-  if (share.path.empty() || share.path.find('%') != std::string::npos) return false;
-  if (!share.path.starts_with('/')) throw std::runtime_error("its path must be absolute");
-  while (share.path.size() > 1 && share.path.ends_with('/')) share.path.pop_back();
-  return true;
+  return std::string::npos;
+}
+
+void StripSlashes(std::string& path) {
+  while (path.size() > 1 && path.ends_with('/')) path.pop_back();
+}
+
+/// The folders of users beside each other, instead of the one user's.
+void SettlePersonal(ShareSettings& share, bool homes) {
+  if (homes && share.path.empty()) {
+    share.personal = {.by_home = true, .own_only = IsOwnName(share.valid_users), .inside = {}};
+    share.path = HomesFolder();
+    return;
+  }
+  const std::size_t at = PersonalComponent(share.path, homes);
+  if (at == std::string::npos) return;
+  constexpr std::size_t component = std::string_view("/%U").size();
+  share.personal = {.by_home = false,
+                    .own_only = share.path[at + 2] != 'S' || IsOwnName(share.valid_users),
+                    .inside = share.path.substr(at + component)};
+  StripSlashes(share.personal->inside);
+  share.path.resize(std::max<std::size_t>(at, 1));
+}
+
+/// Whose folder is whose, and whose rights count in it, must not depend on each other.
+void CheckPersonal(const ShareSettings& share) {
+  const bool others = !share.force_user.empty() || share.guest_only || !share.admin_users.empty();
+  if (share.personal->own_only && others) {
+    throw std::runtime_error("everybody has a folder of their own, with another's rights in it");
+  }
+  if (!share.personal->own_only &&
+      (NamesShare(share.valid_users) || NamesShare(share.invalid_users))) {
+    throw std::runtime_error("each user's folder admits others");
+  }
+}
+
+void SettlePath(ShareSettings& share) {
+  const bool homes = share.name == kHomesShare;
+  SettlePersonal(share, homes);
+  if (share.personal) CheckPersonal(share);
+  if (!homes) Replace(share.path, "%S", share.name);
+  if (share.path.empty()) throw std::runtime_error("it has no path");
+  if (share.path.find('%') != std::string::npos ||
+      (share.personal && share.personal->inside.find('%') != std::string::npos)) {
+    throw std::runtime_error("its path " + share.path + " is another for each client");
+  }
+  if (!share.path.starts_with('/')) {
+    throw std::runtime_error("its path " + share.path + " is not absolute");
+  }
+  StripSlashes(share.path);
+}
+
+/// Samba does not take its guest for a person, nor who is forced to the guest's account for the
+/// guest: to them it closes also what the account owns.
+void CheckForced(const ShareSettings& share) {
+  const std::optional<Account> forced = AccountByName(share.force_user);
+  const std::optional<Account> guest = AccountByName(share.guest_account);
+  if (forced && (forced->uid == kNobody || (guest && forced->uid == guest->uid))) {
+    throw std::runtime_error("its user is forced to nobody's account, " + share.force_user);
+  }
+  if (share.guest_only && guest && IsPersons(*guest)) {
+    throw std::runtime_error("its guests have a person's account, " + share.guest_account);
+  }
+  if (share.guest_only && !share.force_user.empty()) {
+    throw std::runtime_error("its guests are forced to another account");
+  }
+}
+
+/// Whether a client's address is asked for: what no request of a search carries.
+bool AsksForAddress(const ShareSection& section) {
+  const auto is_open = [](const std::string& host) { return SameWord(host, "ALL"); };
+  const auto is_exception = [](const std::string& host) { return SameWord(host, "EXCEPT"); };
+  const auto& allow = section.hosts_allow;
+  if (allow.empty() && section.hosts_deny.empty()) return false;
+  return std::none_of(allow.begin(), allow.end(), is_open) ||
+         std::any_of(allow.begin(), allow.end(), is_exception);
 }
 
 void CheckName(std::string_view name) {
@@ -123,13 +145,13 @@ void CheckName(std::string_view name) {
   });
   if (name.empty() || name.size() > kMaxName || name == "." || name == ".." || control ||
       name.find('/') != name.npos) {
-    throw std::runtime_error("is no name of a share");
+    throw std::runtime_error("it has no name for a share");
   }
 }
 
 class Parser {
  public:
-  std::vector<ShareSettings> Parse(std::string_view text) {
+  void Parse(std::string_view text) {
     while (!text.empty()) {
       const std::size_t end = std::min(text.find('\n'), text.size());
       const std::string_view line = Trimmed(text.substr(0, end));
@@ -137,11 +159,12 @@ class Parser {
       ++number_;
       AtLine(line, [&] { Take(line); });
     }
-    AtLine("", [&] { EndSection(); });
-    std::sort(shares_.begin(), shares_.end(),
-              [](const auto& a, const auto& b) { return a.name < b.name; });
-    return std::move(shares_);
+    EndSection();
   }
+
+  std::vector<ShareSettings> shares;
+  std::vector<WithheldShare> withheld;
+  std::string samba_state;
 
  private:
   template <class Work>
@@ -165,40 +188,56 @@ class Parser {
     const std::size_t equals = line.find('=');
     if (equals == line.npos) throw std::runtime_error("is not of the form name = value");
     if (!open_) throw std::runtime_error("stands before any section");
-    const std::string_view name = Trimmed(line.substr(0, equals));
-    for (const Parameter& parameter : kParameters) {
-      if (SameWord(name, parameter.name)) {
-        parameter.set(section_, Trimmed(line.substr(equals + 1)));
-      }
-    }
+    SetShareParameter(section_, Trimmed(line.substr(0, equals)), Trimmed(line.substr(equals + 1)));
   }
 
   void BeginSection(std::string_view name) {
-    CheckName(name);
     section_ = defaults_;
-    section_.share.name = name;
+    section_.share.name = SameWord(name, kHomesShare) ? kHomesShare : name;
     section_.global = SameWord(name, "global");
     open_ = true;
   }
 
   void EndSection() {
-    if (!open_) return;
-    open_ = false;
+    if (!std::exchange(open_, false)) return;
     // What [global] says of shares holds where they say nothing.
-    if (section_.global) defaults_ = section_;
-    if (!Settle(section_)) return;
-    for (const ShareSettings& share : shares_) {
-      if (SameWord(share.name, section_.share.name)) {
-        throw std::runtime_error("follows a second section [" + share.name + "]");
-      }
+    if (section_.global) {
+      defaults_ = section_;
+      samba_state = section_.samba_state;
+    } else if (!section_.printable && !SameWord(section_.share.name, "printers") &&
+               !SameWord(section_.share.name, "print$")) {
+      AddShare();
     }
-    shares_.push_back(std::move(section_.share));
+  }
+
+  void AddShare() {
+    ShareSettings& share = section_.share;
+    try {
+      CheckName(share.name);
+      for (const auto& [parameter, reason] : section_.reasons) throw std::runtime_error(reason);
+      SettlePath(share);
+      CheckSection();
+      shares.push_back(share);
+    } catch (const std::runtime_error& error) {
+      withheld.push_back({share.name, error.what()});
+    }
+  }
+
+  void CheckSection() {
+    if (AsksForAddress(section_) || AsksForAddress(defaults_)) {
+      throw std::runtime_error("\"hosts allow\" or \"hosts deny\" ask for the client's address");
+    }
+    if ((section_.preexec_close && !section_.preexec.empty()) ||
+        (section_.root_preexec_close && !section_.root_preexec.empty())) {
+      throw std::runtime_error("a program of \"preexec\" decides who enters");
+    }
+    CheckForced(section_.share);
+    if (section_.hides_apple_double) section_.share.veto.patterns.emplace_back("._*");
   }
 
   int number_ = 0;
   bool open_ = false;
-  Section defaults_, section_;
-  std::vector<ShareSettings> shares_;
+  ShareSection defaults_, section_;
 };
 
 }  // namespace
@@ -208,9 +247,40 @@ std::string ShareSettings::VolumePath() const {
 }
 
 ShareTable ShareTable::Parse(const std::string& text) {
+  Parser parser;
+  parser.Parse(text);
   ShareTable table;
-  table.shares_ = Parser().Parse(text);
+  table.shares_ = std::move(parser.shares);
+  table.withheld_ = std::move(parser.withheld);
+  if (!parser.samba_state.empty()) table.samba_state_ = parser.samba_state;
+  std::ranges::sort(table.shares_, {}, &ShareSettings::name);
+  std::ranges::sort(table.withheld_, {}, &WithheldShare::name);
+  table.WithholdTwins();
   return table;
+}
+
+/// Names that differ in capitals only are one to Samba.
+void ShareTable::WithholdTwins() {
+  std::map<std::string, std::vector<std::string>> names;
+  const auto add = [&](const std::string& name) { names[Lowered(name)].push_back(name); };
+  for (const ShareSettings& share : shares_) add(share.name);
+  for (const WithheldShare& share : withheld_) add(share.name);
+  for (const auto& [word, twins] : names) {
+    for (const std::string& name : twins) {
+      if (twins.size() > 1) Withhold(name, "another section has its name");
+    }
+  }
+}
+
+void ShareTable::Withhold(const std::string& name, const std::string& reason) {
+  if (std::erase_if(shares_, [&](const auto& share) { return share.name == name; }) == 0) return;
+  withheld_.push_back({name, reason});
+  std::ranges::sort(withheld_, {}, &WithheldShare::name);
+}
+
+bool ShareTable::IsWithheld(const std::string& name) const {
+  return std::ranges::any_of(withheld_,
+                             [&](const WithheldShare& share) { return share.name == name; });
 }
 
 const ShareSettings* ShareTable::Find(const std::string& name) const {

@@ -1,17 +1,30 @@
 #pragma once
 
 #include <memory>
+#include <optional>
 #include <string>
 #include <vector>
 
 #include "system/rights.h"
+#include "system/veto.h"
 
 namespace maru {
+
+/// A share whose folder is another for each user: they lie beside each other in the share's `path`,
+/// each under its user's name, or where the account's home is.
+struct PersonalFolders {
+  /// The account's home says which folder is whose.
+  bool by_home = false;
+  /// Nobody enters another's.
+  bool own_only = false;
+  /// Below the user's own folder, "files/public": what is shared of it; empty for all.
+  std::string inside;
+};
 
 /// One shared folder, as the Samba settings define it.
 struct ShareSettings {
   std::string name;
-  /// Where it lies on the disk. For "homes": the folder that holds the home folders.
+  /// Where it lies on the disk. Of personal folders: the folder that holds them.
   std::string path;
   bool available = true;
   bool read_only = true;
@@ -21,10 +34,28 @@ struct ShareSettings {
   bool index = true;
   /// Parametric option `maruseeker:deny`, as bits: `list` is 1, `read` is 4.
   unsigned int deny = 0;
-  std::vector<std::string> valid_users, invalid_users, read_list, write_list;
+  std::vector<std::string> valid_users, invalid_users, read_list, write_list, admin_users;
+  std::string force_user;
+  /// With the "+" of "members only", when it has one.
+  std::string force_group;
+  bool guest_only = false;
+  std::string guest_account = "nobody";
+  VetoPatterns veto;
+  std::optional<PersonalFolders> personal;
+  /// The name by which accounts of this server may be called before a backslash.
+  std::string server_name;
 
   /// "/volume1/NAME".
   std::string VolumePath() const;
+};
+
+/// A share that cannot be searched, because something in its settings is wrong or is not judged as
+/// Samba judges it.
+struct WithheldShare {
+  std::string name;
+  std::string reason;
+
+  friend bool operator==(const WithheldShare&, const WithheldShare&) = default;
 };
 
 /// The shares of this server at one moment; immutable.
@@ -39,31 +70,31 @@ class ShareTable {
   /// The table as it was last read, without looking at the file: for request children.
   static void Freeze();
 
-  /// Parses the canonical form. Shares that are no folders of one place (printers, paths with
-  /// variables) are left out. Throws std::runtime_error naming the line.
+  /// Parses the canonical form. Printers are left out. A section with a value that is wrong or not
+  /// honoured withholds its share and no other. Throws std::runtime_error naming the line that is
+  /// no settings at all.
   static ShareTable Parse(const std::string& text);
 
   const std::vector<ShareSettings>& Shares() const { return shares_; }
-  /// Null when there is no such share.
+  /// Null when there is no such share, or it is withheld.
   const ShareSettings* Find(const std::string& name) const;
+  /// In the order of their names.
+  const std::vector<WithheldShare>& Withheld() const { return withheld_; }
+  bool IsWithheld(const std::string& name) const;
   /// Empty, or why the newest settings are not in force.
   const std::string& Error() const { return error_; }
 
  private:
+  void Withhold(const std::string& name, const std::string& reason);
+  void WithholdTwins();
+
   std::vector<ShareSettings> shares_;
+  std::vector<WithheldShare> withheld_;
+  /// Where Samba keeps the shares' own ACLs.
+  std::string samba_state_ = "/var/lib/samba";
   std::string error_;
   friend class ShareTableSource;
 };
-
-/// What a user may do with a share as a whole.
-enum SharePrivilege { kSharePrivReadWrite = 1, kSharePrivReadOnly = 2, kSharePrivNone = 4 };
-
-/// That of the user on the share by `available`, `invalid users`, `valid users`, `read
-/// list`, `write list` and `read only`, with @, + and & groups and %S. Administrators are not
-/// treated specially here, nor are Samba's `admin users`, whose file operations are root's but who
-/// enter no share and write to none without the lists.
-SharePrivilege PrivilegeOf(const ShareSettings& share, const std::string& user_name,
-                           const Identity& identity);
 
 /// The share that holds the users' home folders.
 inline constexpr const char* kHomesShare = "homes";

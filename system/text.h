@@ -1,6 +1,7 @@
 #pragma once
 
 #include <optional>
+#include <string>
 #include <string_view>
 
 /// Words of settings files and headers.
@@ -14,14 +15,24 @@ inline std::string_view Trimmed(std::string_view text) {
   return text.substr(start, text.find_last_not_of(space) - start + 1);
 }
 
+inline char Lowered(char c) {
+  return c >= 'A' && c <= 'Z' ? static_cast<char>(c | 0x20) : c;
+}
+
 /// ASCII letters compare without case.
 inline bool SameWord(std::string_view a, std::string_view b) {
-  const auto lower = [](char c) { return c >= 'A' && c <= 'Z' ? static_cast<char>(c | 0x20) : c; };
   if (a.size() != b.size()) return false;
   for (std::size_t i = 0; i < a.size(); ++i) {
-    if (lower(a[i]) != lower(b[i])) return false;
+    if (Lowered(a[i]) != Lowered(b[i])) return false;
   }
   return true;
+}
+
+/// With small ASCII letters.
+inline std::string Lowered(std::string_view text) {
+  std::string lowered(text);
+  for (char& c : lowered) c = Lowered(c);
+  return lowered;
 }
 
 /// yes, true, on, 1 and their opposites, in any case.

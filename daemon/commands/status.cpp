@@ -13,7 +13,7 @@ Json::Value IndexStatus(const Core& core, const std::string& id) {
   status["share"] = core.shares()->Find(share) ? Json::Value(share) : Json::Value();
   try {
     status["documents"] =
-        Json::UInt64{core.indices.Open({id}, {0, {}, true}, nullptr)->Documents()};
+        Json::UInt64{core.indices.Open({{id, {0, {}, true}}}, nullptr)->Documents()};
   } catch (const maruseeker::Error& error) {
     status["error"] = error.Reason();
   }

@@ -10,6 +10,7 @@
 
 #include "daemon/core/usage.h"
 #include "index/search/library.h"
+#include "system/indexed_shares.h"
 #include "system/rights.h"
 #include "system/share_table.h"
 
@@ -22,26 +23,32 @@ class Indices {
  public:
   virtual ~Indices() = default;
   /// As index::Library::Open.
-  virtual std::unique_ptr<index::View> Open(const std::vector<std::string>& ids,
-                                            const Identity& who, index::IsCancelled cancelled) = 0;
+  virtual std::unique_ptr<index::View> Open(const std::vector<index::IndexFor>& wanted,
+                                            index::IsCancelled cancelled) = 0;
   virtual bool Has(const std::string& id) const = 0;
   virtual std::vector<std::string> Ids() const = 0;
+  /// As RecordedCrawlTerms of the index.
+  virtual std::string CrawlTerms(const std::string&) const { return {}; }
   virtual index::Library::Kept Cached() const { return {}; }
 };
 
 /// Those on the disk.
 class LibraryIndices : public Indices {
  public:
-  explicit LibraryIndices(std::string path) : library_(std::move(path)) {}
-  std::unique_ptr<index::View> Open(const std::vector<std::string>& ids, const Identity& who,
+  explicit LibraryIndices(std::string path) : path_(path), library_(std::move(path)) {}
+  std::unique_ptr<index::View> Open(const std::vector<index::IndexFor>& wanted,
                                     index::IsCancelled cancelled) override {
-    return library_.Open(ids, who, std::move(cancelled));
+    return library_.Open(wanted, std::move(cancelled));
   }
   bool Has(const std::string& id) const override { return library_.Has(id); }
   std::vector<std::string> Ids() const override { return library_.IndexIds(); }
+  std::string CrawlTerms(const std::string& id) const override {
+    return RecordedCrawlTerms(path_ + "/" + id);
+  }
   index::Library::Kept Cached() const override { return library_.Cached(); }
 
  private:
+  const std::string path_;
   index::Library library_;
 };
 

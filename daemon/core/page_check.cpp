@@ -9,6 +9,7 @@
 
 #include "daemon/core/capability.h"
 #include "system/rights_cache.h"
+#include "system/share_access.h"
 #include "system/unique_fd.h"
 
 namespace maru::daemon {
@@ -95,6 +96,10 @@ class Walk {
   std::vector<Step> way_;
 };
 
+bool IsServed(const Scope& scope, const ShareIndex& index, const std::string& path) {
+  return scope.eyes.identity.unrestricted || Serves(*index.share, scope.eyes.user_name, path);
+}
+
 }  // namespace
 
 std::vector<bool> ReadableNow(const Scope& scope, const std::vector<index::Hit>& hits) {
@@ -107,9 +112,11 @@ std::vector<bool> ReadableNow(const Scope& scope, const std::vector<index::Hit>&
   std::vector<bool> readable(hits.size());
   for (std::size_t i = 0; i < order.size();) {
     const std::size_t share = hits[order[i]].share;
-    Walk walk(scope.eyes.identity, *scope.indices[share].share);
+    const ShareIndex& index = scope.indices[share];
+    Walk walk(index.who, *index.share);
     for (; i < order.size() && hits[order[i]].share == share; ++i) {
-      readable[order[i]] = walk.Readable(hits[order[i]]);
+      const index::Hit& hit = hits[order[i]];
+      readable[order[i]] = IsServed(scope, index, hit.path) && walk.Readable(hit);
     }
   }
   return readable;

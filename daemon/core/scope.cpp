@@ -3,16 +3,25 @@
 #include <algorithm>
 
 #include "daemon/core/arguments.h"
+#include "daemon/core/capability.h"
 #include "system/accounts.h"
 #include "system/index_id.h"
+#include "system/share_access.h"
+#include "system/way.h"
 
 namespace maru::daemon {
 namespace {
 
-bool MayUse(const Eyes& eyes, const ShareSettings& share) {
-  // Homes are judged by their own rights alone.
-  if (eyes.identity.unrestricted || share.name == kHomesShare) return true;
-  return PrivilegeOf(share, eyes.user_name, eyes.identity) != kSharePrivNone;
+/// Whose rights count in the share; nothing when the eyes may not enter it.
+std::optional<Identity> Admitted(const Eyes& eyes, const ShareSettings& share) {
+  if (eyes.identity.unrestricted) return eyes.identity;
+  ShareAccess access = AccessOf(share, eyes.user_name, eyes.identity);
+  if (!access.Admits() || !CanReach(access.identity, share.path)) return std::nullopt;
+  return std::move(access.identity);
+}
+
+bool IsOfNow(const Core& core, const std::string& id, const ShareSettings& share) {
+  return core.indices.Has(id) && core.indices.CrawlTerms(id) == CrawlTermsOf(share);
 }
 
 Eyes Blind() {
@@ -51,20 +60,31 @@ void CheckIndexId(const std::string& id) {
 
 Scope ScopeOf(const Core& core, Eyes eyes, const std::vector<std::string>& ids) {
   Scope scope{std::move(eyes), {}, core.shares()};
+  const RaisedReadSearch raised;
   for (const std::string& id : ids) {
     CheckIndexId(id);
     const ShareSettings* share = scope.table->Find(std::string(ShareOfIndexId(id)));
     if (!share || scope.eyes.blind) continue;
     const bool known = std::ranges::count(scope.indices, id, &ShareIndex::id) > 0;
-    if (known || !core.indices.Has(id) || !MayUse(scope.eyes, *share)) continue;
-    scope.indices.push_back({id, share});
+    if (known || !IsOfNow(core, id, *share)) continue;
+    if (auto who = Admitted(scope.eyes, *share)) {
+      scope.indices.push_back({id, share, std::move(*who)});
+    }
   }
   return scope;
 }
 
 std::unique_ptr<index::View> OpenView(const Core& core, const Scope& scope,
                                       const CancelCheck& cancelled) {
-  return core.indices.Open(scope.Ids(), scope.eyes.identity, cancelled);
+  std::vector<index::IndexFor> wanted;
+  for (const ShareIndex& index : scope.indices) wanted.push_back({index.id, index.who});
+  auto view = core.indices.Open(wanted, cancelled);
+  // Terms are withdrawn before an index is changed to others: what was opened is still of these.
+  for (const ShareIndex& index : scope.indices) {
+    if (IsOfNow(core, index.id, *index.share)) continue;
+    throw maruseeker::Error(maruseeker::kErrorStorage, "The index is being made anew");
+  }
+  return view;
 }
 
 }  // namespace maru::daemon

@@ -29,10 +29,11 @@ struct Eyes {
 /// account sees nothing either.
 Eyes EyesOf(const Identity& caller, const std::vector<std::string>& users);
 
-/// One admitted index, and whose it is.
+/// One admitted index, whose it is, and whose rights on files count in it.
 struct ShareIndex {
   std::string id;
   const ShareSettings* share;
+  Identity who;
 };
 
 struct Scope {
@@ -44,15 +45,16 @@ struct Scope {
   std::vector<std::string> Ids() const;
 };
 
-/// Of the index ids those that exist and whose share the eyes may use. A malformed one throws Error
-/// (120).
+/// Of the index ids those that exist, as their share's settings are now, and whose share the eyes
+/// may enter and reach from "/" on. A malformed one throws Error (120).
 Scope ScopeOf(const Core& core, Eyes eyes, const std::vector<std::string>& ids);
 
 /// Throws Error (120) for what can be no index id at all: empty, with a slash or a control
 /// character, "." or "..".
 void CheckIndexId(const std::string& id);
 
-/// The scope's indices, in their order, through its eyes.
+/// The scope's indices, in their order, each through the eyes that count in it. Throws Error (121)
+/// when one is about to be made by other settings.
 std::unique_ptr<index::View> OpenView(const Core& core, const Scope& scope,
                                       const CancelCheck& cancelled);
 

@@ -42,7 +42,7 @@ class Library::State {
 };
 
 View::State::State(std::vector<std::string> ids, std::vector<std::shared_ptr<Share>> shares,
-                   Identity who, IsCancelled cancelled)
+                   std::vector<Identity> who, IsCancelled cancelled)
     : ids_(std::move(ids)),
       shares_(std::move(shares)),
       who_(std::move(who)),
@@ -60,7 +60,8 @@ void View::State::Open() {
   for (const auto& share : shares_) {
     const Share::Handle& handle = handles_.emplace_back(share->Take());
     Reader reader(handle.snapshot, handle.database, share->Texts());
-    auto eyes = who_.unrestricted ? nullptr : Eyes::Of(reader, who_);
+    const Identity& who = who_[sights_.size()];
+    auto eyes = who.unrestricted ? nullptr : Eyes::Of(reader, who);
     sights_.emplace_back(std::move(reader), std::move(eyes), [this] { PollCancelled(); });
   }
 }
@@ -106,16 +107,26 @@ std::vector<std::string> Library::IndexIds() const {
 
 std::unique_ptr<View> Library::Open(const std::vector<std::string>& index_ids, const Identity& who,
                                     IsCancelled cancelled) {
-  for (const std::string& id : index_ids) {
-    if (!Has(id)) {
-      throw maruseeker::Error(maruseeker::kErrorStorage, "There is no index " + id);
+  std::vector<IndexFor> indices;
+  for (const std::string& id : index_ids) indices.push_back({id, who});
+  return Open(indices, std::move(cancelled));
+}
+
+std::unique_ptr<View> Library::Open(const std::vector<IndexFor>& indices, IsCancelled cancelled) {
+  std::vector<std::string> ids;
+  std::vector<Identity> who;
+  for (const IndexFor& index : indices) {
+    if (!Has(index.id)) {
+      throw maruseeker::Error(maruseeker::kErrorStorage, "There is no index " + index.id);
     }
+    ids.push_back(index.id);
+    who.push_back(index.who);
   }
   const auto open = [&](bool forget) {
     std::vector<std::shared_ptr<Share>> shares;
-    for (const std::string& id : index_ids) shares.push_back(state_->ShareOf(id, forget));
+    for (const std::string& id : ids) shares.push_back(state_->ShareOf(id, forget));
     return std::make_unique<View>(
-        std::make_unique<View::State>(index_ids, std::move(shares), who, cancelled));
+        std::make_unique<View::State>(ids, std::move(shares), who, cancelled));
   };
   return WithEngine("Cannot open the index", [&] {
     try {

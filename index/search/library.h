@@ -8,6 +8,12 @@
 
 namespace maru::index {
 
+/// One index, and through whose eyes it is looked at.
+struct IndexFor {
+  std::string id;
+  Identity who;
+};
+
 /// All indices of this server. Thread-safe; keeps open handles and what is derived from the indices
 /// from request to request, and follows the writer's commits.
 class Library {
@@ -24,8 +30,10 @@ class Library {
   explicit Library(std::string path);
   ~Library();
 
-  /// The shares whose index ids are given, in that order, at their newest commits, as `who` sees
-  /// them. An id without an index is an Error (121) that names it.
+  /// The shares whose index ids are given, in that order, at their newest commits, each through its
+  /// own eyes. An id without an index is an Error (121) that names it.
+  std::unique_ptr<View> Open(const std::vector<IndexFor>& indices, IsCancelled cancelled = nullptr);
+  /// The same, all through one pair of eyes.
   std::unique_ptr<View> Open(const std::vector<std::string>& index_ids, const Identity& who,
                              IsCancelled cancelled = nullptr);
   bool Has(const std::string& index_id) const;

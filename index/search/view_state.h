@@ -19,8 +19,9 @@ namespace maru::index {
 /// Inside of a View: the sight of each share, complete from the beginning.
 class View::State {
  public:
-  State(std::vector<std::string> ids, std::vector<std::shared_ptr<Share>> shares, Identity who,
-        IsCancelled cancelled);
+  /// `who`: through whose eyes each share is looked at.
+  State(std::vector<std::string> ids, std::vector<std::shared_ptr<Share>> shares,
+        std::vector<Identity> who, IsCancelled cancelled);
   ~State();
   State(const State&) = delete;
   State& operator=(const State&) = delete;
@@ -70,7 +71,7 @@ class View::State {
 
   const std::vector<std::string> ids_;
   const std::vector<std::shared_ptr<Share>> shares_;
-  const Identity who_;
+  const std::vector<Identity> who_;
   const IsCancelled cancelled_;
   std::vector<Share::Handle> handles_;
   std::vector<Sight> sights_;

@@ -2,6 +2,7 @@
 
 #include <cerrno>
 
+#include "system/indexed_shares.h"
 #include "system/log.h"
 
 namespace maru::indexer {
@@ -25,6 +26,22 @@ bool Crawl::Run(int top, const std::string& share_name) {
   }
   Settle(updater_, top);
   tree.Commit();
+  return true;
+}
+
+void PrepareIndex(const Target& target) {
+  constexpr const char* personal = "personal";
+  const std::string before = RecordedCrawlTerms(target.index_folder);
+  const bool depends = before.starts_with(personal) || target.terms.starts_with(personal);
+  if (depends && before != target.terms) RemoveIndex(target.index_folder);
+}
+
+bool CrawlByTerms(Updater& updater, const Target& target, int top) {
+  const bool settled = RecordedCrawlTerms(target.index_folder) == target.terms;
+  const bool is_first = !updater.Indexed().HasRoot();
+  if (!settled) RecordCrawlTerms(target.index_folder, is_first ? target.terms : kUnsettledTerms);
+  if (!Crawl(updater).Run(top, target.share)) return false;
+  if (!settled && !updater.Stopped()) RecordCrawlTerms(target.index_folder, target.terms);
   return true;
 }
 

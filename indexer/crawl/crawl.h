@@ -2,6 +2,7 @@
 
 #include <string>
 
+#include "indexer/tree/shares.h"
 #include "indexer/update/walks.h"
 
 namespace maru::indexer {
@@ -19,5 +20,12 @@ class Crawl : private FullWalk {
   void Meet(int dir_fd, Folder& folder, const Found& found) override;
   bool LooksUnmounted(int top);
 };
+
+/// Before the share's tree is opened: an index whose personal folders were others is made anew.
+void PrepareIndex(const Target& target);
+
+/// Crawls the target's open folder as Crawl::Run. While the index is between its old terms and the
+/// target's it is of no use to anybody. Throws also std::system_error.
+bool CrawlByTerms(Updater& updater, const Target& target, int top);
 
 }  // namespace maru::indexer

@@ -63,6 +63,7 @@ bool CrawlTarget(const Target& target, Workers& workers, Counts& counts,
     MARU_LOG("Cannot open the folder of share %s", target.share.c_str());
     return false;
   }
+  PrepareIndex(target);
   Tree tree(target.index_folder, counts, nullptr);
   std::unique_ptr<Counter> counter;
   if (tree.HasRoot()) {
@@ -70,8 +71,8 @@ bool CrawlTarget(const Target& target, Workers& workers, Counts& counts,
   } else {
     counter = std::make_unique<Counter>(target.path, counts, stop);
   }
-  Updater updater(tree, workers, stop);
-  return Crawl(updater).Run(top.Get(), target.share);
+  Updater updater(tree, target.selection, workers, stop);
+  return CrawlByTerms(updater, target, top.Get());
 }
 
 bool CrawlNoThrow(const Target& target, Workers& workers, Counts& counts,

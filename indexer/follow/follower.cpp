@@ -55,6 +55,7 @@ class Round : public PartialWalk {
     std::sort(names.begin(), names.end());
     names.erase(std::unique(names.begin(), names.end()), names.end());
     listing_.LookAt(dir_fd, names);
+    updater_.Select(listing_, folder->id);
     updater_.Indexed().Met(dir_fd, *folder, listing_.Entries());
     // What is a folder only now is walked when this is settled: what happened in it before its
     // place was known went unseen. There is room for as many as are ever due.

@@ -51,6 +51,11 @@ class Listing {
   bool Read(int dir_fd);
   /// Looks at some names of a folder, which are in byte order and stay while the entries are used.
   void LookAt(int dir_fd, const std::vector<std::string>& names);
+  /// Keeps only the entries of which `keep` is true.
+  template <class Keep>
+  void Filter(Keep&& keep) {
+    std::erase_if(entries_, [&](const Found& found) { return !keep(found); });
+  }
   std::span<const Found> Entries() const { return entries_; }
 
  private:

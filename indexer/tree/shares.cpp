@@ -25,8 +25,12 @@ Targets FindTargets(const ShareTable& table) {
       continue;
     }
     const std::string id = IndexIdOf(share.name);
-    targets.present.push_back(
-        {share.name, share.path, IndexHome() + "/" + id, {status.st_dev, status.st_ino}});
+    targets.present.push_back({share.name,
+                               share.path,
+                               IndexHome() + "/" + id,
+                               {status.st_dev, status.st_ino},
+                               CrawlTermsOf(share),
+                               Selection(share)});
   }
   return targets;
 }
@@ -44,8 +48,9 @@ void RemoveForeignIndices(const ShareTable& table, const std::vector<std::string
   for (const fs::directory_entry& entry : fs::directory_iterator(IndexHome(), error)) {
     const std::string name = entry.path().filename();
     if (!name.starts_with(kIndexPrefix)) continue;
-    const ShareSettings* share = table.Find(name.substr(kIndexPrefix.size()));
-    const bool wanted = share && share->index;
+    const std::string of = name.substr(kIndexPrefix.size());
+    const ShareSettings* share = table.Find(of);
+    const bool wanted = share ? share->index : table.IsWithheld(of);
     const bool in_use = std::find(used.begin(), used.end(), entry.path()) != used.end();
     const bool is_folder = entry.symlink_status(error).type() == fs::file_type::directory;
     if (!wanted && !in_use && is_folder) foreign.push_back(entry.path());

@@ -91,6 +91,12 @@ DirectoryId Tree::ParentOf(DirectoryId id) const {
   return id < parents_.size() ? parents_[id] : 0;
 }
 
+std::size_t Tree::DepthOf(DirectoryId id) const {
+  std::size_t depth = 0;
+  while ((id = ParentOf(id)) != 0) ++depth;
+  return depth;
+}
+
 void Tree::SetParent(DirectoryId id, DirectoryId parent) {
   if (id >= parents_.size()) parents_.resize(id + 1);
   parents_[id] = parent;

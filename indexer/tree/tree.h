@@ -86,6 +86,8 @@ class Tree {
   void Met(int dir_fd, const Folder& folder, std::span<const Found> found);
   /// 0: it is the share's own, is gone, or lies where nobody has looked yet.
   index::DirectoryId ParentOf(index::DirectoryId id) const;
+  /// How many folders lie above it on the way from the share's own, which has 0.
+  std::size_t DepthOf(index::DirectoryId id) const;
 
   index::Entry Root() const { return writer_.Root(); }
   bool HasRoot() const { return writer_.HasRoot(); }

@@ -18,20 +18,6 @@ using index::DirectoryId;
 using index::Document;
 using index::Entry;
 
-/// None when it has vanished or cannot be examined.
-std::optional<Document> Describe(int dir_fd, DirectoryId parent, const Found& found) {
-  Document document;
-  document.name = found.name;
-  document.parent = parent;
-  document.is_dir = found.IsFolder();
-  document.size = document.is_dir ? 0 : found.stamp.size;
-  document.mtime = found.ModTime();
-  document.inode = found.stamp.inode;
-  if (ReadFileRights(dir_fd, document.name.c_str(), document.rights)) return document;
-  if (!HasVanished(errno)) MARU_LOG("Cannot read the rights of [%s]", document.name.c_str());
-  return std::nullopt;
-}
-
 /// Fails with ENOENT when it is another file than was seen.
 UniqueFd OpenFile(int dir_fd, const Found& found) {
   constexpr int kFlags = O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC;
@@ -47,6 +33,35 @@ UniqueFd OpenFile(int dir_fd, const Found& found) {
 }
 
 }  // namespace
+
+/// None when it has vanished or cannot be examined.
+std::optional<Document> Updater::Describe(int dir_fd, DirectoryId parent,
+                                          const Found& found) const {
+  Document document;
+  document.name = found.name;
+  document.parent = parent;
+  document.is_dir = found.IsFolder();
+  document.size = document.is_dir ? 0 : found.stamp.size;
+  document.mtime = found.ModTime();
+  document.inode = found.stamp.inode;
+  if (ReadFileRights(dir_fd, document.name.c_str(), document.rights)) {
+    const std::size_t depth = parent == 0 ? 0 : tree_.DepthOf(parent) + 1;
+    selection_.Narrow(depth, document.name, document.rights);
+    return document;
+  }
+  if (!HasVanished(errno)) MARU_LOG("Cannot read the rights of [%s]", document.name.c_str());
+  return std::nullopt;
+}
+
+bool Updater::Selects(const Found& found, DirectoryId folder) const {
+  return selection_.Takes(tree_.DepthOf(folder) + 1, found);
+}
+
+void Updater::Select(Listing& listing, DirectoryId folder) const {
+  listing.Filter([&, depth = tree_.DepthOf(folder) + 1](const Found& found) {
+    return selection_.Takes(depth, found);
+  });
+}
 
 bool Updater::UpdateTop(int top, const std::string& share_name) {
   const std::optional<Found> found = Look(top, "");

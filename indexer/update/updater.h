@@ -5,6 +5,7 @@
 #include <string>
 #include <vector>
 
+#include "indexer/tree/selection.h"
 #include "indexer/update/compare.h"
 #include "indexer/update/moves.h"
 #include "indexer/update/workers.h"
@@ -17,9 +18,9 @@ namespace maru::indexer {
 /// thread. Throws maruseeker::Error when the index cannot be read or written.
 class Updater {
  public:
-  /// `stop` ends it early; what it did by then stays.
-  Updater(Tree& tree, Workers& workers, const std::atomic<bool>& stop)
-      : tree_(tree), stop_(stop), moves_(tree), lane_(workers, tree) {}
+  /// `stop` ends it early; what it did by then stays. `selection` stays the caller's.
+  Updater(Tree& tree, const Selection& selection, Workers& workers, const std::atomic<bool>& stop)
+      : tree_(tree), selection_(selection), stop_(stop), moves_(tree), lane_(workers, tree) {}
 
   Tree& Indexed() { return tree_; }
   Moves& Moved() { return moves_; }
@@ -31,6 +32,10 @@ class Updater {
   /// returns, for the caller to take in or to let wait.
   std::vector<Found> Update(int dir_fd, const FolderHandle& folder,
                             std::vector<Difference> differences);
+
+  /// Leaves of a listing of this folder what is to be indexed.
+  void Select(Listing& listing, index::DirectoryId folder) const;
+  bool Selects(const Found& found, index::DirectoryId folder) const;
 
   /// Takes a new folder from where it is known to be gone. False when it is gone nowhere.
   bool Adopt(int dir_fd, Folder& folder, const Found& found);
@@ -51,7 +56,11 @@ class Updater {
   bool Refresh(int dir_fd, Folder& folder, index::Entry& entry, const Found& found);
   void Submit(int dir_fd, const FolderHandle& folder, const Found& found);
 
+  std::optional<index::Document> Describe(int dir_fd, index::DirectoryId parent,
+                                          const Found& found) const;
+
   Tree& tree_;
+  const Selection& selection_;
   const std::atomic<bool>& stop_;
   Moves moves_;
   Lane lane_;

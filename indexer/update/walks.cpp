@@ -25,7 +25,7 @@ class ArrivalsWalk : public PartialWalk {
 
   void Arrive(int dir_fd, Folder& folder, const std::string& name) {
     const std::optional<Found> found = Look(dir_fd, name.c_str());
-    if (!found || !found->IsFolder()) return;
+    if (!found || !found->IsFolder() || !updater_.Selects(*found, folder.id)) return;
     if (!folder.Find(name)) updater_.TakeIn(dir_fd, folder, *found);
     folder.Merge();
     const Entry* entry = folder.Find(name);
@@ -43,6 +43,7 @@ void FullWalk::Visit(int dir_fd, DirectoryId id, std::vector<Child>& children) {
   Tree& tree = updater_.Indexed();
   const FolderHandle folder = tree.Enter(dir_fd, id);
   if (!listing_.Read(dir_fd)) return updater_.NoteUnreadable(Path());
+  updater_.Select(listing_, id);
   const std::span<const Found> found = listing_.Entries();
   tree.Met(dir_fd, *folder, found);
   const std::vector<Difference> differences = Compare(*folder, found);

@@ -24,7 +24,8 @@ TEST_F(DaemonTest, TheServiceCanExamineAllFilesAndOpenNone) {
   ASSERT_EQ(chmod((root_ + "/photo/shut").c_str(), 0700), 0);
   ASSERT_EQ(chown((root_ + "/photo/shut").c_str(), games_.uid, 0), 0);
   const index::Hit hit = HitAt("photo", "/shut/secret.txt");
-  const Scope scope{{games_, "games"}, {{"fileindex_photo", table_->Find("photo")}}, table_};
+  const Scope scope{
+      {games_, "games"}, {{"fileindex_photo", table_->Find("photo"), games_}}, table_};
   const std::string secret = root_ + "/photo/shut/secret.txt";
   const int result = InChild([&] {
     BecomeDaemon("bin");

@@ -158,7 +158,7 @@ TEST_F(SearchTest, NoPathIsFollowedWithoutEnd) {
   std::string path = "/photo";
   for (std::size_t depth = 1; depth < kMaxPathDepth; ++depth) path += "/d";
   File(path + "/d/f", "word");
-  const Scope scope{{bin_, "bin"}, {{"fileindex_photo", table_->Find("photo")}}, table_};
+  const Scope scope{{bin_, "bin"}, {{"fileindex_photo", table_->Find("photo"), bin_}}, table_};
   const index::Hit last = HitAt("photo", path.substr(std::string("/photo").size()) + "/d");
   const index::Hit deeper = HitAt("photo", last.path + "/f");
   EXPECT_EQ(ReadableNow(scope, {last, deeper}), (std::vector<bool>{true, false}));
@@ -190,7 +190,7 @@ TEST_F(SearchTest, NobodySeesMoreThanTheirOwn) {
   File("photo/games.txt", "word", 0600, games_.uid);
   AddShare("club", "valid users = games");
   File("club/member.txt", "word");
-  AddShare("homes", "valid users = nobody");
+  AddShare("homes", "invalid users = games");
   File("homes/bin/diary.txt", "word", 0600, bin_.uid);
   for (const char* share : {"photo", "club", "homes"}) Index(share);
   const auto named = [](const char* user) {
@@ -217,6 +217,33 @@ TEST_F(SearchTest, NobodySeesMoreThanTheirOwn) {
   table_ = std::make_shared<const ShareTable>(
       ShareTable::Parse("[global]\n[photo]\n\tpath = " + root_ + "/photo\n"));
   EXPECT_EQ(Names(root_user_, "word"), (Strings{"all.txt", "bins.txt", "games.txt"}));
+}
+
+TEST_F(SearchTest, ShareRulesPutOthersInTheUsersPlace) {
+  const auto others = IdentityOfUser("daemon").value();
+  AddShare("forced", "force user = games");
+  AddShare("root", "admin users = bin");
+  AddShare("veto", "veto files = /*.bak/");
+  std::filesystem::create_directories(root_ + "/closed/below");
+  std::filesystem::create_directory_symlink("closed/below", root_ + "/below");
+  AddShare("below");
+  File("forced/g", "word", 0600, games_.uid);
+  File("forced/b", "word", 0600, bin_.uid);
+  File("root/r", "word", 0600);
+  File("veto/v.bak", "word");
+  File("below/c", "word");
+  ASSERT_EQ(chmod((root_ + "/closed").c_str(), 0700), 0);
+  ASSERT_EQ(chown((root_ + "/closed").c_str(), games_.uid, 0), 0);
+  for (const char* share : {"forced", "root", "veto", "below"}) Index(share);
+  EXPECT_EQ(Names(bin_, "word"), (Strings{"g", "r"}));
+  EXPECT_EQ(Names(games_, "word"), (Strings{"c", "g"}));
+  EXPECT_EQ(Names(others, "word"), (Strings{"g"}));
+  // An index that knows nothing of the veto patterns is none.
+  EXPECT_EQ(Names(root_user_, "word", R"({"indice": ["fileindex_veto"]})"), (Strings{}));
+  RecordCrawlTerms(root_ + "/index/fileindex_veto", CrawlTermsOf(*table_->Find("veto")));
+  EXPECT_EQ(Names(root_user_, "word", R"({"indice": ["fileindex_veto"]})"), (Strings{"v.bak"}));
+  EXPECT_EQ(Names(bin_, "word", R"({"indice": ["fileindex_veto"]})"), (Strings{}))
+      << "the page check judges patterns too";
 }
 
 /// What the child process of that user can open.

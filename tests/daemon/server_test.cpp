@@ -91,10 +91,10 @@ class SlowIndices : public Indices {
     }
   };
 
-  std::unique_ptr<index::View> Open(const std::vector<std::string>&, const Identity& who,
+  std::unique_ptr<index::View> Open(const std::vector<index::IndexFor>&,
                                     index::IsCancelled cancelled) override {
     if (cancelled) WaitForRelease(cancelled);
-    return nothing_.Open({}, who);
+    return nothing_.Open(std::vector<index::IndexFor>{});
   }
   bool Has(const std::string&) const override { return true; }
   std::vector<std::string> Ids() const override { return {"fileindex_photo"}; }

@@ -4,6 +4,7 @@
 
 #include "fixture.h"
 #include "index/store/fields.h"
+#include "system/indexed_shares.h"
 
 namespace maru::indexer::test {
 namespace {
@@ -43,6 +44,63 @@ TEST_F(CrawlTest, IndexesFilesAndFoldersOnceAndThenLeavesThemAlone) {
             Search("bytes"));
   EXPECT_EQ(std::set<std::string>{"/picture.jpg"}, Search("picture", index::kName));
   ExpectNothingToDo();
+}
+
+/// A crawl by the lines of a share's settings; whether it is done by their terms.
+class TermsTest : public ShareTest {
+ protected:
+  bool CrawlBy(const std::string& lines) {
+    const ShareTable table = ShareTable::Parse("[share]\npath = " + Share() + "\n" + lines);
+    const ShareSettings& share = table.Shares().at(0);
+    const Target target{share.name, share.path,          IndexFolder(),
+                        {},         CrawlTermsOf(share), Selection(share)};
+    PrepareIndex(target);
+    Counts counts;
+    Tree tree(IndexFolder(), counts, nullptr);
+    Updater updater(tree, target.selection, TheWorkers(), stop_);
+    CrawlByTerms(updater, target, OpenTop(Share()).Get());
+    return RecordedCrawlTerms(IndexFolder()) == target.terms;
+  }
+
+  std::set<std::string> Paths(const Identity& who = {0, {}, true}) {
+    std::set<std::string> paths;
+    const auto reader = Read(who);
+    for (const index::Hit& hit : All(*reader, {})) paths.insert(hit.path);
+    return paths;
+  }
+};
+
+TEST_F(TermsTest, WhatIsVetoedIsNotIndexed) {
+  using Set = std::set<std::string>;
+  Write("a/Secret/x", "deep");
+  Write("b.bak", "copy");
+  EXPECT_TRUE(CrawlBy("veto files = /secret/*.BAK/"));
+  EXPECT_EQ(Paths(), (Set{"", "/a"}));
+  stop_ = true;
+  EXPECT_FALSE(CrawlBy("")) << "cut off, it is of no terms";
+  stop_ = false;
+  EXPECT_TRUE(CrawlBy(""));
+  EXPECT_EQ(Paths(), (Set{"", "/a", "/a/Secret", "/a/Secret/x", "/b.bak"}));
+  EXPECT_TRUE(CrawlBy("veto files = /secret/*.BAK/\ncase sensitive = yes"));
+  EXPECT_EQ(Paths(), (Set{"", "/a", "/a/Secret", "/a/Secret/x", "/b.bak"}));
+}
+
+TEST_F(TermsTest, PersonalFoldersAreTheirOwnersAlone) {
+  using Set = std::set<std::string>;
+  Write("bin/in/a", "own");
+  Write("bin/b", "beside");
+  Write("games/in/c", "own");
+  Write("nobody here/in/d", "stray");
+  Write("e", "stray");
+  const Identity bin = IdentityOfUser("bin").value();
+  EXPECT_TRUE(CrawlBy("path = " + Share() + "/%U"));
+  EXPECT_EQ(Paths(bin), (Set{"/bin", "/bin/b", "/bin/in", "/bin/in/a"}));
+  EXPECT_EQ(Paths(), (Set{"", "/bin", "/bin/b", "/bin/in", "/bin/in/a", "/games", "/games/in",
+                          "/games/in/c"}));
+  EXPECT_TRUE(CrawlBy("path = " + Share() + "/%u/in"));
+  EXPECT_EQ(Paths(bin), (Set{"/bin/in", "/bin/in/a"}));
+  EXPECT_TRUE(CrawlBy(""));
+  EXPECT_EQ(Paths(bin).size(), 12u);
 }
 
 TEST_F(CrawlTest, NeverOpensOrFollowsWhatIsNoFileOrFolder) {

@@ -108,7 +108,7 @@ class ShareTest : public testing::Test {
     Counts counts;
     {
       Tree tree(IndexFolder(), counts, nullptr);
-      Updater updater(tree, TheWorkers(), stop_);
+      Updater updater(tree, selection_, TheWorkers(), stop_);
       compared_ = indexer::Crawl(updater).Run(OpenTop(Share()).Get(), "share");
     }
     return {counts.added,  counts.changed,    counts.unchanged, counts.removed,
@@ -191,6 +191,7 @@ class ShareTest : public testing::Test {
   }();
   index::Library library_{root_ + "/index"};
   std::atomic<bool> stop_{false};
+  Selection selection_;
   bool compared_ = false;
 
  private:

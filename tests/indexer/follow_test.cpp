@@ -10,8 +10,9 @@ namespace {
 class FollowTest : public ShareTest {
  protected:
   void Follow() {
-    keeper_ = std::make_unique<Keeper>(Target{"share", Share(), IndexFolder(), {}}, TheWorkers(),
-                                       turn_, settings_);
+    keeper_ =
+        std::make_unique<Keeper>(Target{"share", Share(), IndexFolder(), {}, {}, Selection(share_)},
+                                 TheWorkers(), turn_, settings_);
   }
 
   /// Waits until the index says what the disk says.
@@ -34,10 +35,26 @@ class FollowTest : public ShareTest {
     EXPECT_EQ("", Differences(OnDisk(true), Indexed(other))) << what;
   }
 
+  ShareSettings share_;
   std::mutex turn_;
   Keeper::Settings settings_{.lost_events_gap = std::chrono::seconds(0)};
   std::unique_ptr<Keeper> keeper_;
 };
+
+TEST_F(FollowTest, LeavesOutWhatIsVetoed) {
+  share_.veto.patterns = {"*.bak"};
+  Follow();
+  ExpectCaughtUp("first crawl");
+  Write("a.bak/b", "vetoed");
+  Write("c.bak", "vetoed");
+  Write("d", "soon vetoed");
+  while (Search("soon").empty()) std::this_thread::sleep_for(std::chrono::milliseconds(50));
+  Rename("d", "d.bak");
+  while (!Search("soon").empty()) std::this_thread::sleep_for(std::chrono::milliseconds(50));
+  Write("e", "last");
+  while (Search("last").empty()) std::this_thread::sleep_for(std::chrono::milliseconds(50));
+  EXPECT_EQ(Indexed().size(), 1u);
+}
 
 TEST_F(FollowTest, FindsEveryKindOfChange) {
   Write("old/file.txt", "before");

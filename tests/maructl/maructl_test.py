@@ -38,7 +38,11 @@ class MaructlTest(unittest.TestCase):
 
     def test_shares_tell_who_may_enter_and_what_is_indexed(self):
         (road.STATE / "index/fileindex_docs").mkdir(parents=True)
+        with open("/etc/samba/smb.conf", "a", encoding="utf-8") as settings:
+            settings.write("\n[odd]\n\tpath = somewhere\n")
         status, said = maructl("shares")
+        said, withheld = said.split("\n\n")
+        self.assertIn("\nodd       its path somewhere is not absolute\n", withheld)
         rows = {line.split()[0]: line.split()[2:] for line in said.splitlines()}
         self.assertEqual(GOOD, status, said)
         self.assertEqual(["yes", "everyone"], rows["docs"])

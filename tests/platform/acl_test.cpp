@@ -23,7 +23,16 @@ class Volume : public testing::Test {
     mkdir("/volume1", 0755);
     ASSERT_EQ(mount("test", "/volume1", "tmpfs", 0, "mode=0700"), 0);
     mkdir("/volume1/photo", 0755);
-    folder_.Write("smb.conf", "[photo]\n\tpath = /srv\n[gone]\n\tpath = /gone\n");
+    mkdir((folder_ / "bobs").c_str(), 0700);
+    EXPECT_EQ(chown((folder_ / "bobs").c_str(), 60002, 60002), 0);
+    folder_.Write("smb.conf",
+                  "[photo]\n\tpath = /srv\n[gone]\n\tpath = /gone\n[forced]\n\tpath = " +
+                      (folder_ / "bobs/in") +
+                      "\n\tforce user = bob\n\tveto files = /*.bak/\n[closed]\n\tpath = " +
+                      (folder_ / "bobs/in") + "\n[bobs]\n\tpath = /srv\n\tvalid users = bob\n");
+    for (const std::string share : {"forced", "closed", "bobs", "bobs/a"}) {
+      mkdir(("/volume1/" + share).c_str(), 0755);
+    }
     Configure(folder_, "samba_config_canonical = yes\n");
   }
   void TearDown() override { umount("/volume1"); }
@@ -56,6 +65,38 @@ TEST_F(Volume, EveryFolderOnTheWayCounts) {
   chmod("/volume1/photo", 0700);
   EXPECT_EQ(Bits("alice", "/volume1/photo/a/b/c.jpg"), 0);
   EXPECT_EQ(Bits("alice", "/volume1/photo"), 0);
+}
+
+TEST_F(Volume, ShareRulesPutOthersInTheUsersPlace) {
+  for (const std::string file : {"a.txt", "a.bak"}) {
+    std::ofstream("/volume1/forced/" + file) << "x";
+    ASSERT_EQ(chown(("/volume1/forced/" + file).c_str(), 60002, 60002), 0);
+    chmod(("/volume1/forced/" + file).c_str(), 0640);
+  }
+  chmod("/volume1", 0755);
+  const auto expect_all = [] {
+    EXPECT_EQ(Bits("alice", "/volume1/forced/a.txt"), 6);
+    EXPECT_EQ(Bits("alice", "/volume1/forced/a.bak"), 0);
+    EXPECT_EQ(Bits("alice", "/volume1/forced/none"), -ENOENT);
+    EXPECT_EQ(Bits("alice", "/volume1/closed"), 0);  // behind a folder that is bob's alone
+    EXPECT_EQ(Bits("alice", "/volume1/bobs/a"), 5);  // whom the share admits is asked elsewhere
+  };
+  expect_all();
+  EXPECT_EQ(
+      StatusOfChild([&] {
+        maru::ShareTable::Current();
+        ASSERT_TRUE(ResetCredentialsByName("alice", true));
+        expect_all();
+        const std::pair<const char*, unsigned int> had[] = {
+            {"forced/a.txt", 6}, {"forced/a.bak", 0}, {"closed", 0}, {"bobs/a", 0}, {"photo", 5}};
+        for (const auto& [path, expected] : had) {
+          unsigned int bits = 7;
+          EXPECT_EQ(MARUACLPermGet((std::string("/volume1/") + path).c_str(), &bits), 0);
+          EXPECT_EQ(bits, expected) << path;
+        }
+        EXPECT_EQ(geteuid(), 60001u);
+      }),
+      0);
 }
 
 TEST_F(Volume, NothingLeadsOutOfTheShare) {
