@@ -7,7 +7,7 @@
 namespace maru::daemon::test {
 namespace {
 
-/// One request of every command, with every member.
+/// One request of every command, with every member; the document by its number.
 const char* const kCorpus[] = {
     R"-({"command":"search","data":{"pre_query":{"keyword":"old \"harbour boats\" -sun OR (lake*)",
 "criteria_list":[{"field":"MARUMDFSSize","value":"1k..2MB"},{"field":"MARUMDModTime","value":
@@ -18,7 +18,7 @@ const char* const kCorpus[] = {
 "has_criteria":true},"highlight":[{"field":"MARUMDTextContent","frag_length":50,
 "num_fragments":2}],"filters":[{"name":"permission","data":"bin"}],
 "sort":{"field":"MARUMDFSSize","direction":"ASC"}}})-",
-    R"-({"command":"highlight","data":{"id":"fileindex_photo","doc_id":1,"highlight":{"field":
+    R"-({"command":"highlight","data":{"id":"fileindex_photo","doc_id":@,"highlight":{"field":
 "MARUMDTextContent","frag_length":40,"num_fragments":3},"keyword":"harbour","search_weight_list":
 []}})-",
     R"-({"command":"term_suggest","data":{"uid":2,"terms":"old harb","suggest_num":5,"indice":
@@ -44,10 +44,21 @@ std::vector<std::string> Pieces() {
   return {std::istream_iterator<std::string>(stream), {}};
 }
 
+std::vector<std::string> Corpus(std::uint32_t document) {
+  std::vector<std::string> corpus(std::begin(kCorpus), std::end(kCorpus));
+  for (std::string& request : corpus) {
+    const std::size_t at = request.find('@');
+    if (at != std::string::npos) request.replace(at, 1, std::to_string(document));
+  }
+  return corpus;
+}
+
 class Mutator {
  public:
+  explicit Mutator(std::vector<std::string> corpus) : corpus_(std::move(corpus)) {}
+
   std::string Next() {
-    std::string text = kCorpus[Below(std::size(kCorpus))];
+    std::string text = corpus_[Below(corpus_.size())];
     const std::size_t changes = Below(4);
     for (std::size_t i = 0; i <= changes; ++i) {
       if (Below(2)) {
@@ -75,7 +86,7 @@ class Mutator {
         if (!text.empty()) text[at] = static_cast<char>(random_());
         break;
       case 3: {
-        const std::string other = kCorpus[Below(std::size(kCorpus))];
+        const std::string other = corpus_[Below(corpus_.size())];
         text = text.substr(0, at) + other.substr(Below(other.size()));
         break;
       }
@@ -96,6 +107,7 @@ class Mutator {
     text.replace(begin, end + 1 - begin, values[Below(std::size(values))]);
   }
 
+  const std::vector<std::string> corpus_;
   const std::vector<std::string> pieces_ = Pieces();
   std::mt19937 random_{1977};
 };
@@ -105,11 +117,13 @@ TEST_F(DaemonTest, AnswersWhateverComes) {
   File("photo/lake.jpg", "sun");
   Index();
   history_[bin_.uid] = {"old harbour"};
-  for (const char* request : kCorpus) {
+  const auto view = indices_.Open({{"fileindex_photo", {0, {}, true}}});
+  const std::vector<std::string> corpus = Corpus(view->Find(0, "/trip/a.txt")->alias);
+  for (const std::string& request : corpus) {
     EXPECT_TRUE(Say(bin_, request).back()["success"].asBool())
         << request << json::ToString(Say(bin_, request).back());
   }
-  Mutator mutator;
+  Mutator mutator(corpus);
   int understood = 0;
   for (int round = 0; round < 6000; ++round) {
     const std::string line = mutator.Next();
