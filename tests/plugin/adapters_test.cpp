@@ -80,8 +80,10 @@ TEST_F(Adapters, Shares) {
   EXPECT_EQ(SDKShare("private").GetPrivilege("alice"), 4);
   EXPECT_EQ(SDKShare("private").GetPrivilege("bob"), 2);
   EXPECT_EQ(photo.GetPrivilege("no such user"), 4);
+  EXPECT_EQ(SDKShare("homes").GetPrivilege("alice"), 4);
   EXPECT_EQ(photo.GetFTPPrivilege(), 0u);
-  EXPECT_EQ(deny.GetFTPPrivilege(), 5u);
+  EXPECT_EQ(SDKShare("unlisted").GetFTPPrivilege(), 1u);
+  EXPECT_EQ(deny.GetFTPPrivilege(), 4u);
   EXPECT_FALSE(photo.IsHideUnReadable());
   EXPECT_TRUE(hidden.IsHideUnReadable());
   EXPECT_FALSE(photo.IsEnableRecycleBin());
@@ -116,12 +118,14 @@ TEST_F(Adapters, Shares) {
     for (const std::string& name : SDKShare::Enum()) all.append(name);
     return all;
   });
-  EXPECT_EQ(ToText(names.value), "['deny','docs','hidden','homes','photo','private']");
+  EXPECT_EQ(ToText(names.value), "['deny','docs','hidden','homes','photo','private','unlisted']");
 }
 
 TEST_F(Adapters, FolderThatIsGone) {
-  rename("/volume1/deny", "/volume1/gone");
   const Ran ran = InChild([] {
+    EXPECT_EQ(unshare(CLONE_NEWNS), 0);
+    EXPECT_EQ(mount("", "/", nullptr, MS_REC | MS_PRIVATE, nullptr), 0);
+    EXPECT_EQ(umount2("/volume1", MNT_DETACH), 0);
     const SDKShare deny("deny");
     // What cannot be told about the space is no reason to stop.
     EXPECT_TRUE(deny.IsSpaceEnough());
@@ -135,7 +139,6 @@ TEST_F(Adapters, FolderThatIsGone) {
     }
     return told;
   });
-  rename("/volume1/gone", "/volume1/deny");
   EXPECT_EQ(ToText(ran.value),
             "['502 MLIBShareis_encryptedGet failed, share=deny',"
             "'502 MLIBShareIsEncryptionGet failed, share=deny']");
@@ -148,16 +151,24 @@ TEST_F(Adapters, PermissionsOnFiles) {
   chmod("/volume1/hidden/closed", 0744);
   WriteFile("/volume1/hidden/open.txt", "");
   WriteFile("/volume1/hidden/shut.txt", "", 0600);
+  WriteFile("/volume1/photo/primary.txt", "", 0640);
+  WriteFile("/volume1/photo/family.txt", "", 0640);
+  EXPECT_EQ(chown("/volume1/photo/primary.txt", 0, 60001), 0);
+  EXPECT_EQ(chown("/volume1/photo/family.txt", 0, 60101), 0);
   FilePermission alice("alice");
   EXPECT_TRUE(alice.CheckRead("/volume1/photo/trip/a.jpg"));
   EXPECT_FALSE(alice.CheckRead("/volume1/photo/secret.txt"));
+  EXPECT_TRUE(alice.CheckRead("/volume1/photo/primary.txt"));
+  EXPECT_TRUE(alice.CheckRead("/volume1/photo/family.txt"));
   EXPECT_FALSE(alice.CheckRead("/volume1/deny/d.txt"));
+  EXPECT_TRUE(alice.CheckRead("/volume1/unlisted/u.txt"));
   EXPECT_FALSE(alice.CheckRead("/volume1/private"));
-  EXPECT_TRUE(alice.CheckRead("/volume1/homes/alice/x.txt"));
+  EXPECT_TRUE(alice.CheckRead("/volume1/homes/alice/x.txt")) << "whom the share admits or not";
   EXPECT_FALSE(alice.CheckRead("/volume1/homes/bob/x.txt"));
 
   EXPECT_TRUE(alice.CheckList("/volume1/photo/secret.txt"));
-  EXPECT_FALSE(alice.CheckList("/volume1/deny/d.txt"));
+  EXPECT_TRUE(alice.CheckList("/volume1/deny/d.txt"));
+  EXPECT_FALSE(alice.CheckList("/volume1/unlisted/u.txt"));
   EXPECT_TRUE(alice.CheckList("/volume1/hidden/open.txt"));
   EXPECT_FALSE(alice.CheckList("/volume1/hidden/shut.txt"));
   EXPECT_FALSE(alice.CheckList("/volume1/hidden/closed/x"));

@@ -99,9 +99,9 @@ class History : public PluginTest {
 TEST_F(History, PagesSortedAndFiltered) {
   EXPECT_EQ(Get(Alice()), "0:");
   ASSERT_TRUE(Record(60001, {"pear", "apple", "fig", "grape"}));
-  ASSERT_TRUE(Record(60002, {"bob's"}));
+  ASSERT_TRUE(Record(60002, {"bob's", "fig"}, 0, 2000));
   EXPECT_EQ(Get(Alice()), "4: pear@1000 apple@1001 fig@1002 grape@1003");
-  EXPECT_EQ(Get(Bob()), "1: bob's@1000");
+  EXPECT_EQ(Get(Bob()), "2: bob's@2000 fig@2001");
   EXPECT_EQ(Get(Alice(), "{'limit':2,'offset':1}"), "4: apple@1001 fig@1002");
   EXPECT_EQ(Get(Alice(), "{'limit':-2,'offset':-1}"),
             "4: pear@1000 apple@1001 fig@1002 grape@1003");

@@ -167,7 +167,8 @@ TEST_F(Lifecycle, CredentialsComeBack) {
   const Ran ran = InChild([] {
     Json::Value ids;
     const auto note = [&ids] {
-      ids.append(std::to_string(geteuid()) + ":" + std::to_string(getegid()));
+      ids.append(std::to_string(geteuid()) + ":" + std::to_string(getegid()) + ":" +
+                 std::to_string(getgroups(0, nullptr)));
     };
     {
       SDKCredentials back_to_root;
@@ -175,7 +176,7 @@ TEST_F(Lifecycle, CredentialsComeBack) {
       note();
       {
         // A scope with a name comes back to that name, not to the one before.
-        SDKCredentials service("MaruSeeker");
+        SDKCredentials bob("bob");
         note();
       }
       note();
@@ -185,7 +186,7 @@ TEST_F(Lifecycle, CredentialsComeBack) {
     note();
     return ids;
   });
-  EXPECT_EQ(ToText(ran.value), "['60001:60001','60000:60000','60000:60000','0:0','0:0']");
+  EXPECT_EQ(ToText(ran.value), "['60001:60001:2','60002:60002:2','60002:60002:2','0:0:1','0:0:1']");
 }
 
 TEST_F(Lifecycle, CredentialsThatFail) {

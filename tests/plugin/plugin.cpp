@@ -15,9 +15,11 @@
 #include <filesystem>
 #include <fstream>
 
+#include "server/mounts.h"
 #include "system/config.h"
 #include "system/json.h"
 #include "system/log.h"
+#include "system/share_table.h"
 
 namespace {
 
@@ -28,23 +30,26 @@ constexpr unsigned kCarol = 60003;
 
 constexpr const char* kShares = R"([global]
 [homes]
-	path = /volume1/homes/%S
-	valid users = %S
+	path = /mnt/homes/%S
+	valid users = bob
 	read only = No
 [photo]
-	path = /volume1/photo
+	path = /mnt/photo
 	read only = No
 [docs]
-	path = /volume1/docs
+	path = /mnt/our docs
 	valid users = alice
 [private]
-	path = /volume1/private
+	path = /mnt/private
 	valid users = bob
 [deny]
-	path = /volume1/deny
-	maruseeker:deny = list read
+	path = /mnt/deny
+	maruseeker:deny = read
+[unlisted]
+	path = /mnt/unlisted
+	maruseeker:deny = list
 [hidden]
-	path = /volume1/hidden
+	path = /mnt/hidden
 	hide unreadable = Yes
 	vfs objects = recycle
 )";
@@ -92,6 +97,32 @@ bool EmptyFolder(const char* path) {
   return mount("plugin_test", path, "tmpfs", 0, "mode=1777") == 0;
 }
 
+void MakeShares() {
+  for (const std::string name :
+       {"photo", "docs", "private", "deny", "unlisted", "hidden", "homes"}) {
+    MakeFolder(name == "docs" ? "/mnt/our docs" : "/mnt/" + name, 0755, 0);
+    if (name == "unlisted" || name == "hidden") continue;
+    MakeFolder("/var/lib/maruseeker/index/fileindex_" + name, 0755, kService);
+  }
+  MakeFolder("/mnt/homes/alice", 0700, kAlice);
+  MakeFolder("/mnt/homes/bob", 0700, kBob);
+  MakeFolder("/mnt/photo/trip", 0755, 0);
+  WriteFile("/mnt/photo/trip/a.jpg", "a");
+  WriteFile("/mnt/photo/secret.txt", "s", 0600, kBob);
+  WriteFile("/mnt/deny/d.txt", "d");
+  WriteFile("/mnt/unlisted/u.txt", "u");
+  WriteFile("/mnt/homes/alice/x.txt", "x", 0600, kAlice);
+  WriteFile("/mnt/homes/bob/x.txt", "x", 0600, kBob);
+}
+
+/// As the web server does it. What is mounted on the disk later appears in the shares too, like the
+/// machine's own mounts among those of the web server.
+void MountShares() {
+  static maru::server::ShareMounts mounts;
+  if (mount(nullptr, "/mnt", nullptr, MS_SHARED, nullptr) != 0) throw std::runtime_error("/mnt");
+  mounts.Apply(*maru::ShareTable::Current());
+}
+
 /// Empty, or why there can be no such world.
 std::string MakeWorld() {
   const passwd* alice = getpwnam("alice");
@@ -99,27 +130,17 @@ std::string MakeWorld() {
   Symbol("gTable");  // loaded while the build can be seen: it may lie below /tmp
   if (unshare(CLONE_NEWNS) != 0 || mount("", "/", nullptr, MS_REC | MS_PRIVATE, nullptr) != 0 ||
       !EmptyFolder("/tmp") || !EmptyFolder("/run") || !EmptyFolder("/var/lib/maruseeker") ||
-      !EmptyFolder("/volume1")) {
+      !EmptyFolder("/mnt")) {
     return "needs the right to mount";
   }
   MakeFolder("/var/lib/maruseeker", 0755, kService);
   MakeFolder("/var/lib/maruseeker/index", 0755, kService);
-  for (const std::string name : {"photo", "docs", "private", "deny", "hidden", "homes"}) {
-    MakeFolder("/volume1/" + name, 0755, 0);
-    if (name != "hidden") MakeFolder("/var/lib/maruseeker/index/fileindex_" + name, 0755, kService);
-  }
-  MakeFolder("/volume1/homes/alice", 0700, kAlice);
-  MakeFolder("/volume1/homes/bob", 0700, kBob);
-  MakeFolder("/volume1/photo/trip", 0755, 0);
-  WriteFile("/volume1/photo/trip/a.jpg", "a");
-  WriteFile("/volume1/photo/secret.txt", "s", 0600, kBob);
-  WriteFile("/volume1/deny/d.txt", "d");
-  WriteFile("/volume1/homes/alice/x.txt", "x", 0600, kAlice);
-  WriteFile("/volume1/homes/bob/x.txt", "x", 0600, kBob);
+  MakeShares();
   WriteFile("/run/shares.conf", kShares);
   WriteFile("/run/maruseeker.conf",
             "samba_config = /run/shares.conf\nsamba_config_canonical = yes\n");
   maru::Config::Load("/run/maruseeker.conf");
+  MountShares();
   return {};
 }
 

@@ -55,10 +55,12 @@ Json::Value FromText(std::string text);
 std::string ToText(const Json::Value& value);
 
 /// A world for each test process: in a mount namespace of its own, with empty /tmp and /run, a
-/// state folder, and under /volume1 the shares photo, docs (only alice may enter), private (only
-/// bob may), deny (nobody may list or read), hidden (hides what cannot be read, has a recycle bin)
-/// and homes; all but hidden are indexed. Files: photo/trip/a.jpg (readable for all),
-/// photo/secret.txt (bob only), homes/alice/x.txt, homes/bob/x.txt.
+/// state folder, and under /mnt, mounted under /volume1 by the web server's own hand, the shares
+/// photo, docs ("/mnt/our docs"; only alice may enter), private (only bob may), deny (nobody may
+/// read), unlisted (nobody may list), hidden (hides what cannot be read, has a recycle bin) and
+/// homes (by its own list for bob only); all but unlisted and hidden are indexed. Files:
+/// photo/trip/a.jpg (readable for all), photo/secret.txt (bob only), deny/d.txt, unlisted/u.txt,
+/// homes/alice/x.txt, homes/bob/x.txt.
 class PluginTest : public testing::Test {
  protected:
   /// Skips where the accounts are missing.

@@ -246,8 +246,10 @@ TEST_F(Search, DaemonThatFails) {
 }
 
 TEST_F(Search, WhatHitsGain) {
-  mkdir("/volume1/photo/mounted", 0755);
-  ASSERT_EQ(mount("/volume1/docs", "/volume1/photo/mounted", nullptr, MS_BIND, nullptr), 0);
+  mkdir("/mnt/photo/mounted", 0755);
+  ASSERT_EQ(mount("/mnt/private", "/mnt/photo/mounted", nullptr, MS_BIND, nullptr), 0);
+  ASSERT_EQ(mount("disk", "/mnt/our docs", "tmpfs", 0, "mode=755"), 0);
+  WriteFile("/volume1/photo/dropbox.txt", "", 0733);
   struct Case {
     const char* hit;
     const char* gained;
@@ -270,6 +272,13 @@ TEST_F(Search, WhatHitsGain) {
       {"{'MARUMDPath':'/volume1/photo','MARUMDOwnerUserID':'54321'}",
        "{'MARUMDOwnerUserName':'','MARUMDSharePath':'/photo','additional':"
        "{'is_mount_point':false},'readable':true}"},
+      {"{'MARUMDPath':'/volume1/docs'}",
+       "{'MARUMDSharePath':'/docs','additional':{'is_mount_point':true},'readable':true}"},
+      {"{'MARUMDPath':'/volume1/photo/dropbox.txt'}",
+       "{'MARUMDSharePath':'/photo/dropbox.txt','additional':{'is_mount_point':false},"
+       "'readable':false}"},
+      {"{'MARUMDPath':'/volume1/nowhere'}",
+       "{'MARUMDSharePath':'','additional':{'is_mount_point':false},'readable':false}"},
       {"{'MARUMDPath':'/elsewhere/a','MARUMDOwnerUserID':'letters'}",
        "{'MARUMDOwnerUserName':'','MARUMDSharePath':'','additional':{'is_mount_point':false},"
        "'readable':false}"},
@@ -283,7 +292,8 @@ TEST_F(Search, WhatHitsGain) {
   }
   script.push_back(FakeDaemon::Message(kGood));
   const Answer answer = FindWith(std::move(script));
-  umount("/volume1/photo/mounted");
+  umount("/mnt/photo/mounted");
+  umount("/mnt/our docs");
   ASSERT_EQ(answer.data["hits"].size(), std::size(cases));
   for (unsigned i = 0; i < std::size(cases); ++i) {
     Json::Value expected = FromText(cases[i].hit);

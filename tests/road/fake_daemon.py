@@ -12,6 +12,7 @@ import contextlib
 import json
 import os
 import socket
+import struct
 import subprocess
 import sys
 import threading
@@ -66,6 +67,8 @@ class FakeDaemon:
     def __init__(self, behaviour):
         self.behaviour = behaviour
         self.requests = []
+        # The processes that asked, in turn.
+        self.peers = []
         self.ended = threading.Event()
         self.threads = []
 
@@ -99,6 +102,8 @@ class FakeDaemon:
     def serve(self, connection):
         with connection, contextlib.suppress(OSError), connection.makefile("rb") as stream:
             request = json.loads(stream.readline() or b"null")
+            credentials = connection.getsockopt(socket.SOL_SOCKET, socket.SO_PEERCRED, 12)
+            self.peers.append(struct.unpack("3i", credentials)[0])
             self.requests.append(request)
             self.behaviour(connection, request, self.ended)
 

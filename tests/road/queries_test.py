@@ -119,6 +119,35 @@ class QueriesTest(road.RoadTest):
             road.wait_until(lambda: not processes_of(ALICE), "the query to end with its client")
         self.assert_served_as_ever()
 
+    def test_a_late_kill_meets_no_other_request(self):
+        def served_by():
+            """The process that serves a plain query, which nothing names afterwards."""
+            self.services.wait_until_idle()
+            with fake_daemon.FakeDaemon(fake_daemon.replies({"success": True})) as daemon:
+                road.search(self.services, self.token, "harbour")
+                self.services.wait_until_idle()
+                return daemon.peers[0]
+
+        def without_a_socket():
+            road.search(self.services, self.token, "harbour", query_id="named", query_serial=1)
+
+        def without_an_answer():
+            with fake_daemon.FakeDaemon(lambda *_: None):
+                self.assertEqual(502, self.services.finish(self.send(1, "named"))[0])
+
+        def without_a_client():
+            with fake_daemon.FakeDaemon(fake_daemon.silence) as daemon:
+                query = self.send(1, "named")
+                road.wait_until(lambda: daemon.requests, "the query")
+                query.close()
+                self.services.wait_until_idle()
+
+        for abandon in (without_a_socket, without_an_answer, without_a_client):
+            road.wait_until(lambda: served_by() == served_by(), "one process to serve two requests")
+            before = served_by()
+            abandon()
+            self.assertNotEqual(before, served_by(), abandon.__name__)
+        self.assert_served_as_ever()
 
     def test_a_stopped_process_is_ended(self):
         with fake_daemon.FakeDaemon(fake_daemon.silence) as daemon:

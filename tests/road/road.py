@@ -179,6 +179,13 @@ class Services:
         is_json = "json" in (response.getheader("Content-Type") or "")
         return response.status, json.loads(text) if is_json else text
 
+    def metric(self, name):
+        text = self.http("GET", "/metrics")[1].decode()
+        return int(next(line.split()[1] for line in text.splitlines() if line.split()[0] == name))
+
+    def wait_until_idle(self):
+        wait_until(lambda: self.metric("maruweb_children_busy") == 0, "all requests to end")
+
     def sign_in(self, user):
         status, answer = self.http("POST", "/session", {"user": user, "password": user})
         assert status == 200 and answer["success"], (status, answer)

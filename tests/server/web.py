@@ -58,11 +58,10 @@ class WebTest(RoadTest):
         return response, response.read()
 
     def metric(self, name):
-        text = self.services.http("GET", "/metrics")[1].decode()
-        return int(next(line.split()[1] for line in text.splitlines() if line.split()[0] == name))
+        return self.services.metric(name)
 
     def wait_until_idle(self):
-        wait_until(lambda: self.metric("maruweb_children_busy") == 0, "all requests to end")
+        self.services.wait_until_idle()
 
 
 def responses(connection, count):
