@@ -117,7 +117,7 @@ TEST_F(DaemonTest, AnswersWhateverComes) {
   File("photo/lake.jpg", "sun");
   Index();
   history_[bin_.uid] = {"old harbour"};
-  const auto view = indices_.Open({{"fileindex_photo", {0, {}, true}}});
+  const auto view = indices_.Open({{"fileindex_photo", {0, {}, true}}}, nullptr);
   const std::vector<std::string> corpus = Corpus(view->Find(0, "/trip/a.txt")->alias);
   for (const std::string& request : corpus) {
     EXPECT_TRUE(Say(bin_, request).back()["success"].asBool())
