@@ -221,6 +221,16 @@ class Roads:
         """Words asked once each."""
         return self.system.load([road.search_request(words) for words in self.options["distinct"]])
 
+    def clients(self):
+        """Sixty-four clients at once, of three users."""
+        parts = {"alice": 22, "bob": 21, "carol": 21}
+        for user in parts:
+            self.system.token(user)
+        with concurrent.futures.ThreadPoolExecutor(len(parts)) as pool:
+            results = list(pool.map(lambda item: self.system.load(
+                self.bodies(), user=item[0], connections=item[1], rounds=1), parts.items()))
+        return median_of(results) | {"per_second": sum(row["per_second"] for row in results)}
+
     def changes(self):
         """The same searches while nothing changes, and while four files a second do."""
         # The sandbox gives the corpus to read only; what is written there goes with the road.
