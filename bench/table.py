@@ -111,9 +111,9 @@ def other_rows(results):
                          f"{number(distinct['p50'])} / {number(distinct['p95'])}"])
         clients = figures.get("clients")
         if clients:
-            rows.append([f"{name}: 64 clients of three users, searches/s, p50 / p95, ms",
+            rows.append([f"{name}: 64 clients of three users, searches/s, p50 / p95, ms, refused",
                          f"{number(clients['per_second'])}, {number(clients['p50'] / 1e3)} / "
-                         f"{number(clients['p95'] / 1e3)}"])
+                         f"{number(clients['p95'] / 1e3)}, {number(clients['failed'])}"])
         changes = figures.get("changes")
         if changes:
             rows.append([f"{name}: p50 while four files a second change against quiet",
