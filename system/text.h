@@ -9,10 +9,10 @@ namespace maru {
 
 /// Without white space at both ends.
 inline std::string_view Trimmed(std::string_view text) {
-  constexpr std::string_view space = " \t\r\n\v\f";
-  const std::size_t start = text.find_first_not_of(space);
+  constexpr std::string_view kSpace = " \t\r\n\v\f";
+  const std::size_t start = text.find_first_not_of(kSpace);
   if (start == std::string_view::npos) return {};
-  return text.substr(start, text.find_last_not_of(space) - start + 1);
+  return text.substr(start, text.find_last_not_of(kSpace) - start + 1);
 }
 
 inline char Lowered(char c) {

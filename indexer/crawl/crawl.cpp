@@ -30,9 +30,9 @@ bool Crawl::Run(int top, const std::string& share_name) {
 }
 
 void PrepareIndex(const Target& target) {
-  constexpr const char* personal = "personal";
+  constexpr const char* kPersonal = "personal";
   const std::string before = RecordedCrawlTerms(target.index_folder);
-  const bool depends = before.starts_with(personal) || target.terms.starts_with(personal);
+  const bool depends = before.starts_with(kPersonal) || target.terms.starts_with(kPersonal);
   if (depends && before != target.terms) RemoveIndex(target.index_folder);
 }
 
