@@ -117,7 +117,7 @@ bool Move(const char* source, const char* destination, bool overwrite) {
 
 int MARUFSDirIsMntPoint(const char* path) {
   maru::VolumePath place;
-  if (path && maru::SplitVolumePath(path, place) && place.rest.empty()) {
+  if (path && maru::SplitVolumePath(path, place) && maru::TakeComponent(place.rest).empty()) {
     // That the share is seen here at all is a mount of the web server's.
     return maru::Guarded("MARUFSDirIsMntPoint", -1, [&] {
       const auto table = maru::ShareTable::Current();
