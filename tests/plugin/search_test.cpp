@@ -262,7 +262,8 @@ TEST_F(Search, WhatHitsGain) {
        "{'MARUMDOwnerUserName':'alice','MARUMDSharePath':'/photo/secret.txt','additional':"
        "{'is_mount_point':false},'readable':false}"},
       {"{'MARUMDPath':'/volume1/homes/alice/x.txt','MARUMDOwnerUserID':''}",
-       "{'MARUMDSharePath':'/home/x.txt','additional':{'is_mount_point':false},'readable':true}"},
+       // The homes admit bob only.
+       "{'MARUMDSharePath':'/home/x.txt','additional':{'is_mount_point':false},'readable':false}"},
       {"{'MARUMDPath':'/volume1/homes/bob/x.txt','MARUMDOwnerUserID':'60002xyz'}",
        "{'MARUMDOwnerUserName':'bob','MARUMDSharePath':'/homes/bob/x.txt','additional':"
        "{'is_mount_point':false},'readable':false}"},
