@@ -52,7 +52,8 @@ bool Connection::TakeIntroduction(std::string_view& bytes, uid_t sender) {
   constexpr std::string_view beginning = kIntroduction;
   if (!bytes.starts_with(beginning[0])) return true;
   const std::size_t end = bytes.find('\n');
-  if (WithinLine() || sender != 0 || !bytes.starts_with(beginning) || end == bytes.npos) return false;
+  if (WithinLine() || sender != 0 || !bytes.starts_with(beginning) || end == bytes.npos)
+    return false;
   client_ = ClientAddress(std::string(bytes.substr(beginning.size(), end - beginning.size())));
   bytes.remove_prefix(end + 1);
   return true;
