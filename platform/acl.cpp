@@ -15,6 +15,7 @@
 #include "platform/guard.h"
 #include "system/accounts.h"
 #include "system/acting.h"
+#include "system/client_address.h"
 #include "system/share_access.h"
 #include "system/share_table.h"
 #include "system/unique_fd.h"
@@ -108,9 +109,11 @@ int Walk(const maru::Identity& who, const std::string& folder, std::string_view 
 std::optional<int> BitsByShare(const char* path, int asked) {
   const uid_t uid = geteuid();
   maru::VolumePath place;
-  if (uid == 0 || !maru::SplitVolumePath(path, place)) return std::nullopt;
+  if (!maru::SplitVolumePath(path, place)) return std::nullopt;
   const auto table = maru::ShareTable::Current();
   const maru::ShareSettings* share = table->Find(std::string(place.share));
+  if (share && !share->IsOpenTo(maru::PresentClient())) return 0;
+  if (uid == 0) return std::nullopt;
   const std::optional<maru::Account> account = maru::AccountByUID(uid);
   if (!share || !account) return std::nullopt;
   const Standing& standing = OwnStanding(table, *share, *account);
@@ -133,6 +136,7 @@ int BitsOf(const char* user_name, const MLIBCSzList* groups, const char* path) {
     errno = ENOENT;
     return -1;
   }
+  if (!share->IsOpenTo(maru::PresentClient())) return 0;
   const std::string folder(place.folder);
   if (session->unrestricted) return Walk(*session, folder, place.rest);
   const Standing standing = StandingOf(*share, user_name, *session);

@@ -9,6 +9,7 @@
 
 #include "platform/account.h"
 #include "platform/guard.h"
+#include "system/client_address.h"
 #include "system/share_access.h"
 #include "system/share_table.h"
 #include "system/volume_path.h"
@@ -75,6 +76,7 @@ int MARUShareUserPrivGet(const char* user_name, const MARUSHARE* share) {
     const auto table = ShareTable::Current();
     const ShareSettings* settings = table->Find(share->szName);
     if (!settings) return Fail(kErrNotFound, -1);
+    if (!settings->IsOpenTo(maru::PresentClient())) return int{kSharePrivNone};
     const std::optional<maru::Identity> identity = maru::IdentityOfUser(user_name);
     if (!identity) return int{kSharePrivNone};
     if (MLIBGroupIsAdminGroupMem(user_name, 0) == 1) return int{kSharePrivReadWrite};

@@ -11,6 +11,8 @@
 #include <chrono>
 #include <utility>
 
+#include "system/client_address.h"
+
 namespace marudaemon {
 namespace {
 
@@ -128,6 +130,7 @@ bool DomainSockConnection::Connect() {
   memcpy(address.sun_path, path_.c_str(), path_.size());
   maru::UniqueFd socket_file(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
   if (!socket_file || !ConnectBefore(socket_file.Get(), address, After(kConnectTimeout)) ||
+      !maru::IntroduceClient(socket_file.Get()) ||
       fcntl(socket_file.Get(), F_SETFL, O_NONBLOCK) != 0) {
     return false;
   }

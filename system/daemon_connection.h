@@ -49,6 +49,7 @@ class SockConnection {
 class DomainSockConnection : public SockConnection {
  public:
   explicit DomainSockConnection(std::string path) : path_(std::move(path)) {}
+  /// Says also for whom this process works (system/client_address.h), when it was told.
   bool Connect() override;
 
  private:

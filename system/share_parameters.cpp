@@ -164,10 +164,14 @@ constexpr ShareParameter kParameters[] = {
      "`recycle` and others that leave rights alone; withheld with any other, such as "
      "`acl_xattr`",
      SetModules},
-    {"hosts allow", "withheld unless it admits `ALL`",
-     [](Section& s, Value v) { s.hosts_allow = List(v); }},
-    {"hosts deny", "withheld, unless `hosts allow` admits `ALL`",
-     [](Section& s, Value v) { s.hosts_deny = List(v); }},
+    {"hosts allow",
+     "from which addresses one enters: `ALL`, addresses, `192.168.`, networks, `EXCEPT`; withheld "
+     "with names",
+     [](Section& s, Value v) { s.share.hosts.allow = List(v); }},
+    {"hosts deny", "from which one does not; the same",
+     [](Section& s, Value v) { s.share.hosts.deny = List(v); }},
+    {"hostname lookups", "`yes`: withheld with any host named in the two",
+     [](Section& s, Value v) { s.hostname_lookups = Flag(v); }},
     {"preexec", "withheld with `preexec close`", [](Section& s, Value v) { s.preexec = v; }},
     {"preexec close", "the same", [](Section& s, Value v) { s.preexec_close = Flag(v); }},
     {"root preexec", "withheld with `root preexec close`",

@@ -21,7 +21,7 @@ struct ShareSection {
   bool hides_apple_double = false;
   std::string preexec, root_preexec;
   bool preexec_close = false, root_preexec_close = false;
-  std::vector<std::string> hosts_allow, hosts_deny;
+  bool hostname_lookups = false;
   std::string samba_state;
   /// What a parameter's present value is withheld for, by its name.
   std::map<std::string_view, std::string> reasons;

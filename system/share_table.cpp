@@ -129,14 +129,12 @@ void CheckForced(const ShareSettings& share) {
   }
 }
 
-/// Whether a client's address is asked for: what no request of a search carries.
-bool AsksForAddress(const ShareSection& section) {
-  const auto is_open = [](const std::string& host) { return SameWord(host, "ALL"); };
-  const auto is_exception = [](const std::string& host) { return SameWord(host, "EXCEPT"); };
-  const auto& allow = section.hosts_allow;
-  if (allow.empty() && section.hosts_deny.empty()) return false;
-  return std::none_of(allow.begin(), allow.end(), is_open) ||
-         std::any_of(allow.begin(), allow.end(), is_exception);
+/// With lookups Samba knows a client by its name as well.
+void CheckHosts(const ShareSection& section, const HostRules& hosts) {
+  hosts.Check();
+  if (section.hostname_lookups && !hosts.AdmitAll()) {
+    throw std::runtime_error("\"hostname lookups\" let names of hosts decide who enters");
+  }
 }
 
 void CheckName(std::string_view name) {
@@ -224,9 +222,9 @@ class Parser {
   }
 
   void CheckSection() {
-    if (AsksForAddress(section_) || AsksForAddress(defaults_)) {
-      throw std::runtime_error("\"hosts allow\" or \"hosts deny\" ask for the client's address");
-    }
+    section_.share.server_hosts = defaults_.share.hosts;
+    CheckHosts(section_, section_.share.hosts);
+    CheckHosts(section_, section_.share.server_hosts);
     if ((section_.preexec_close && !section_.preexec.empty()) ||
         (section_.root_preexec_close && !section_.root_preexec.empty())) {
       throw std::runtime_error("a program of \"preexec\" decides who enters");
@@ -244,6 +242,10 @@ class Parser {
 
 std::string ShareSettings::VolumePath() const {
   return std::string(kVolume) + "/" + name;
+}
+
+bool ShareSettings::IsOpenTo(const ClientAddress& client) const {
+  return hosts.Admit(client) && server_hosts.Admit(client);
 }
 
 ShareTable ShareTable::Parse(const std::string& text) {

@@ -5,6 +5,7 @@
 #include <string>
 #include <vector>
 
+#include "system/host_rules.h"
 #include "system/rights.h"
 #include "system/veto.h"
 
@@ -40,6 +41,8 @@ struct ShareSettings {
   std::string force_group;
   bool guest_only = false;
   std::string guest_account = "nobody";
+  /// From where one may enter it, and any share of this server.
+  HostRules hosts, server_hosts;
   VetoPatterns veto;
   std::optional<PersonalFolders> personal;
   /// The name by which accounts of this server may be called before a backslash.
@@ -47,6 +50,9 @@ struct ShareSettings {
 
   /// "/volume1/NAME".
   std::string VolumePath() const;
+  /// Whether anybody at all may enter from there: nothing of it is there for other clients, whoever
+  /// they are.
+  bool IsOpenTo(const ClientAddress& client) const;
 };
 
 /// A share that cannot be searched, because something in its settings is wrong or is not judged as

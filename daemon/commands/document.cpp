@@ -32,7 +32,7 @@ Json::Value HighlightCommand(const Request& request) {
   const index::FragmentOptions options =
       ReadFragmentOptions(data.Object("highlight", kFragmentMembers));
   const index::Query query = ToQuery(ReadClauses(data), false);
-  const Scope scope = ScopeOf(request.core, EyesOf(request.caller, {}), {id});
+  const Scope scope = ScopeOf(request, EyesOf(request.caller, {}), {id});
   if (scope.indices.empty() || document < 1 || document > UINT32_MAX) throw NotThere();
   const auto view = OpenView(request.core, scope, request.cancelled);
   const auto hit = view->FindAlias(0, static_cast<std::uint32_t>(document));
@@ -54,7 +54,7 @@ Json::Value RecordOpenCommand(const Request& request) {
     data.Refuse("full_path", "is not a path such as /volume1/photo/a.jpg");
   }
   if (id != IndexIdOf(path.share)) data.Refuse("full_path", "does not lie in " + Quoted(id));
-  const Scope scope = ScopeOf(request.core, EyesOf(request.caller, {}), {id});
+  const Scope scope = ScopeOf(request, EyesOf(request.caller, {}), {id});
   if (scope.indices.empty()) throw NotThere();
   const auto hit = OpenView(request.core, scope, request.cancelled)->Find(0, path.rest);
   if (!hit || !Readable(scope, *hit)) throw NotThere();

@@ -55,7 +55,7 @@ Json::Value IndicateCommand(const Request& request) {
   for (const auto& [what, facets] : passes) {
     const auto& [users, any_word] = what;
     for (const Facet& facet : facets) counts[facet.name] = 0;
-    const Scope scope = ScopeOf(request.core, EyesOf(request.caller, users), ids);
+    const Scope scope = ScopeOf(request, EyesOf(request.caller, users), ids);
     if (scope.indices.empty()) continue;
     std::vector<Query> filters;
     for (const Facet& facet : facets) filters.push_back(facet.filter);

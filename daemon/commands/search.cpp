@@ -98,7 +98,7 @@ SearchRequest ReadSearch(const Request& request) {
   const std::vector<std::string> ids = data.Has("indice")
                                            ? data.Strings("indice", kMaxIndices, kMaxIndexId)
                                            : request.core.indices.Ids();
-  search.scope = ScopeOf(request.core, EyesOf(request.caller, filters.users), ids);
+  search.scope = ScopeOf(request, EyesOf(request.caller, filters.users), ids);
   return search;
 }
 

@@ -82,7 +82,7 @@ Json::Value TermSuggestCommand(const Request& request) {
   const std::vector<const Suggester*> suggesters = ReadSuggesters(data);
   const std::vector<std::string> ids =
       data.Has("indice") ? ReadIndices(data) : request.core.indices.Ids();
-  const Scope scope = ScopeOf(request.core, EyesOf(request.caller, {}), ids);
+  const Scope scope = ScopeOf(request, EyesOf(request.caller, {}), ids);
   Json::Value reply;
   reply["suggestions"] = Json::arrayValue;
   if (index::WordsOf(text).empty()) return reply;
@@ -111,7 +111,7 @@ Json::Value ListSuggestersCommand(const Request& request) {
   }
   reply["indices"] = Json::arrayValue;
   const Eyes eyes = EyesOf(request.caller, {});
-  for (const std::string& id : ScopeOf(request.core, eyes, request.core.indices.Ids()).Ids()) {
+  for (const std::string& id : ScopeOf(request, eyes, request.core.indices.Ids()).Ids()) {
     reply["indices"].append(id);
   }
   return reply;

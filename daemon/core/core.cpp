@@ -13,8 +13,8 @@ namespace {
 
 constexpr std::size_t kMaxCommandName = 64;
 
-Json::Value Execute(Core& core, const Identity& caller, const std::string& line,
-                    const Output& output, const CancelCheck& cancelled) {
+Json::Value Execute(Core& core, const Caller& caller, const std::string& line, const Output& output,
+                    const CancelCheck& cancelled) {
   Json::Value message;
   std::string why;
   if (!json::FromString(line, message, &why)) throw BadParameter("Not a JSON text: " + why);
@@ -24,7 +24,8 @@ Json::Value Execute(Core& core, const Identity& caller, const std::string& line,
   const auto command = std::ranges::find(Commands(), name, &Command::name);
   if (command == Commands().end()) throw BadParameter("Unknown command " + Quoted(name));
   Json::Value reply(Json::objectValue);
-  Json::Value data = command->run({core, caller, envelope.Any("data"), output, cancelled});
+  Json::Value data =
+      command->run({core, caller.identity, caller.client, envelope.Any("data"), output, cancelled});
   if (!data.isNull()) reply["data"] = std::move(data);
   reply["success"] = true;
   return reply;
@@ -45,7 +46,7 @@ Json::Value ErrorReply(int code, const std::string& message) {
   return reply;
 }
 
-void Answer(Core& core, const Identity& caller, const std::string& line, const Output& output,
+void Answer(Core& core, const Caller& caller, const std::string& line, const Output& output,
             const CancelCheck& cancelled) {
   Json::Value reply;
   try {

@@ -10,6 +10,7 @@
 
 #include "daemon/core/usage.h"
 #include "index/search/library.h"
+#include "system/client_address.h"
 #include "system/indexed_shares.h"
 #include "system/rights.h"
 #include "system/share_table.h"
@@ -69,11 +70,18 @@ using Output = std::function<void(std::string_view message, bool last)>;
 /// True when nobody waits for the answer any more, or it takes too long.
 using CancelCheck = std::function<bool()>;
 
+/// Who asks: whom the kernel names at the socket, and from where.
+struct Caller {
+  const Identity& identity;
+  const ClientAddress& client;
+};
+
 /// One command being carried out.
 struct Request {
   Core& core;
   /// Who is connected, as the kernel says.
   const Identity& caller;
+  const ClientAddress& client;
   /// An object, null when empty; anything else its command refuses.
   const Json::Value& data;
   /// For replies of several messages.
@@ -84,7 +92,7 @@ struct Request {
 /// Carries out one line and gives every message of the reply to `output`; the last one has
 /// "success". Whatever the line holds, this neither throws nor ends the process; only what `output`
 /// throws on the last message comes out.
-void Answer(Core& core, const Identity& caller, const std::string& line, const Output& output,
+void Answer(Core& core, const Caller& caller, const std::string& line, const Output& output,
             const CancelCheck& cancelled);
 
 /// {"success": false, "error": {"code", "msg"}}

@@ -58,13 +58,14 @@ void CheckIndexId(const std::string& id) {
   if (!sound) throw BadParameter("Malformed index id " + Quoted(id));
 }
 
-Scope ScopeOf(const Core& core, Eyes eyes, const std::vector<std::string>& ids) {
+Scope ScopeOf(const Request& request, Eyes eyes, const std::vector<std::string>& ids) {
+  const Core& core = request.core;
   Scope scope{std::move(eyes), {}, core.shares()};
   const RaisedReadSearch raised;
   for (const std::string& id : ids) {
     CheckIndexId(id);
     const ShareSettings* share = scope.table->Find(std::string(ShareOfIndexId(id)));
-    if (!share || scope.eyes.blind) continue;
+    if (!share || scope.eyes.blind || !share->IsOpenTo(request.client)) continue;
     const bool known = std::ranges::count(scope.indices, id, &ShareIndex::id) > 0;
     if (known || !IsOfNow(core, id, *share)) continue;
     if (auto who = Admitted(scope.eyes, *share)) {

@@ -46,8 +46,9 @@ struct Scope {
 };
 
 /// Of the index ids those that exist, as their share's settings are now, and whose share the eyes
-/// may enter and reach from "/" on. A malformed one throws Error (120).
-Scope ScopeOf(const Core& core, Eyes eyes, const std::vector<std::string>& ids);
+/// may enter and reach from "/" on, and is open to the client's address: for administrators and
+/// root as for all. A malformed one throws Error (120).
+Scope ScopeOf(const Request& request, Eyes eyes, const std::vector<std::string>& ids);
 
 /// Throws Error (120) for what can be no index id at all: empty, with a slash or a control
 /// character, "." or "..".

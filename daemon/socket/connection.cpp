@@ -22,21 +22,40 @@ bool IsBlankLine(const std::string& line) {
 bool Connection::Receive() {
   char chunk[kChunk];
   for (int i = 0; i < kChunksAtOnce && !line_too_long_ && input_.size() <= kMaxRequest; ++i) {
-    const ssize_t count = recv(Socket(), chunk, sizeof chunk, MSG_DONTWAIT);
+    uid_t sender;
+    const ssize_t count = ReceiveFrom(Socket(), chunk, sizeof chunk, MSG_DONTWAIT, sender);
     if (count < 0) return errno == EAGAIN || errno == EINTR;
     if (count == 0) {
       ended_ = true;
       return true;
     }
-    const bool begins = !WithinLine();
-    if (discarded_ > 0) {
-      Discard(chunk, static_cast<std::size_t>(count));
-    } else {
-      input_.append(chunk, static_cast<std::size_t>(count));
-    }
-    if (begins) since = std::chrono::steady_clock::now();
-    if (static_cast<std::size_t>(count) < sizeof chunk) break;
+    std::string_view bytes(chunk, static_cast<std::size_t>(count));
+    if (!TakeIntroduction(bytes, sender)) return false;
+    Append(bytes);
+    if (!bytes.empty() && static_cast<std::size_t>(count) < sizeof chunk) break;
   }
+  return true;
+}
+
+void Connection::Append(std::string_view bytes) {
+  if (!WithinLine()) since = std::chrono::steady_clock::now();
+  if (discarded_ > 0) {
+    Discard(bytes.data(), bytes.size());
+  } else {
+    input_.append(bytes);
+  }
+}
+
+/// Takes the line in which root says for whom it, or who was root, asks; it comes in one piece.
+/// False when it is not root's, not in its place, or no such line.
+bool Connection::TakeIntroduction(std::string_view& bytes, uid_t sender) {
+  constexpr std::string_view beginning = kIntroduction;
+  if (!bytes.starts_with(beginning[0])) return true;
+  const std::size_t end = bytes.find('\n');
+  if (WithinLine() || sender != 0 || !bytes.starts_with(beginning) || end == bytes.npos)
+    return false;
+  client_ = ClientAddress(std::string(bytes.substr(beginning.size(), end - beginning.size())));
+  bytes.remove_prefix(end + 1);
   return true;
 }
 

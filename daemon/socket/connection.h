@@ -3,7 +3,9 @@
 #include <chrono>
 #include <cstddef>
 #include <string>
+#include <string_view>
 
+#include "system/client_address.h"
 #include "system/rights.h"
 #include "system/unique_fd.h"
 
@@ -32,9 +34,11 @@ class Connection {
 
   int Socket() const { return socket_.Get(); }
   const Identity& Caller() const { return caller_; }
+  /// From where the requests come: this machine, unless root has said otherwise.
+  const ClientAddress& Client() const { return client_; }
 
   /// Takes what has arrived, without waiting; memory grows only with bytes received. False when
-  /// the connection is broken.
+  /// the connection is broken, or somebody else than root has begun a line as only root may.
   bool Receive();
   /// The next line that is not blank, without its line break.
   Input Take(std::string& line);
@@ -59,10 +63,13 @@ class Connection {
   std::chrono::steady_clock::time_point since = std::chrono::steady_clock::now();
 
  private:
+  void Append(std::string_view bytes);
+  bool TakeIntroduction(std::string_view& bytes, uid_t sender);
   void Discard(const char* bytes, std::size_t count);
 
   UniqueFd socket_;
   Identity caller_;
+  ClientAddress client_ = ClientAddress::OfThisMachine();
   std::string input_;
   /// Lines before this were taken.
   std::size_t begin_ = 0;

@@ -146,7 +146,7 @@ void Server::Accept() {
       return;
     }
     std::optional<Identity> caller = IdentityOfPeer(socket.Get(), service_);
-    if (!caller) continue;
+    if (!caller || !HearSenders(socket.Get())) continue;
     if (!MakeRoom(*caller)) {
       const std::string refusal =
           LineOf(ErrorReply(maruseeker::kErrorDaemonExchange, "Too many connections"));
@@ -241,7 +241,7 @@ void Server::Execute(Connection& connection, const std::string& line) noexcept {
     reply.append(message).append(1, '\n');
   };
   try {
-    Answer(core_, connection.Caller(), line, output, cancelled);
+    Answer(core_, {connection.Caller(), connection.Client()}, line, output, cancelled);
     connection.SetReply(std::move(reply));
     connection.Flush();
   } catch (const std::exception& error) {

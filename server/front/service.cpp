@@ -44,8 +44,9 @@ std::string LabelOf(const Route& route) {
   return label ? label : route.name.api + "/" + route.name.method;
 }
 
-/// The last address of a list: a proxy adds what it sees to what the client claims.
-std::string LastAddress(std::string_view list, const std::string& otherwise) {
+/// The last address of a list: a proxy adds what it sees to what the client claims. Its own address
+/// is no client's.
+std::string LastAddress(std::string_view list) {
   list.remove_prefix(std::min(list.size(), list.find_last_of(", ") + 1));
   const std::string text(list.substr(0, list.find('%')));
   unsigned char bytes[sizeof(in6_addr)];
@@ -53,7 +54,7 @@ std::string LastAddress(std::string_view list, const std::string& otherwise) {
   for (const int family : {AF_INET, AF_INET6})
     if (inet_pton(family, text.c_str(), bytes) == 1)
       return inet_ntop(family, bytes, address, sizeof(address));
-  return otherwise;
+  return "unknown";
 }
 
 bool IsText(const std::string& text, std::size_t limit) {
@@ -109,8 +110,7 @@ std::optional<std::chrono::seconds> Transaction::Patience() const {
 }
 
 Ask Transaction::MakeAsk() const {
-  std::string source =
-      service_.config_.behind_proxy ? LastAddress(head_.forwarded_for, peer_) : peer_;
+  std::string source = service_.config_.behind_proxy ? LastAddress(head_.forwarded_for) : peer_;
   return {*RowOf(route_).ask, route_.token, route_.name, 0, std::move(source), {}, {}};
 }
 

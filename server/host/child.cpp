@@ -17,6 +17,7 @@
 #include "server/wire/answer.h"
 #include "system/accounts.h"
 #include "system/acting.h"
+#include "system/client_address.h"
 #include "system/json.h"
 #include "system/keep_errno.h"
 #include "system/log.h"
@@ -163,6 +164,7 @@ int ServeOne(const UniqueFd& tasks, Packet& packet, const Plugin& plugin) {
   ForgetAccounts();
   LimitLog(kMaxLogged);
   if (!task || !socket) return 1;
+  WorkFor(ClientAddress(task->source));
   Reply reply(socket, tasks);
   try {
     if (const int status = Serve(*task, socket, tasks, packet, plugin, reply)) return status;

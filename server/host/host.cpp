@@ -207,8 +207,9 @@ void Host::Take(Ask ask, UniqueFd request) {
 void Host::TakeCall(const Ask& ask, Session& session, UniqueFd request) {
   if (session.running >= kMaxPerSession) return Reply(request, Refusal(429));
   const Seconds now = Now();
-  const Task task{ask.kind,    ask.name,     ask.body_size, session.id,
-                  session.uid, session.user, session.stamp, now - session.admitted >= kAdmittedFor};
+  const Task task{ask.kind,      ask.name,    ask.body_size,
+                  session.id,    session.uid, session.user,
+                  session.stamp, ask.source,  now - session.admitted >= kAdmittedFor};
   if (!children_.Hand(task, request, now)) return Reply(request, Refusal(503));
   ++session.running;
   if (task.ask_pam) session.admitted = now;

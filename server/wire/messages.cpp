@@ -54,14 +54,15 @@ std::optional<Ask> UnpackAsk(std::string_view packet) {
 std::string Pack(const Task& task) {
   return PackFields({Letter(task.kind), task.name.api, std::to_string(task.name.version),
                      task.name.method, std::to_string(task.body_size), task.session_id,
-                     std::to_string(task.uid), task.user, task.stamp, task.ask_pam ? "1" : "0"});
+                     std::to_string(task.uid), task.user, task.stamp, task.source,
+                     task.ask_pam ? "1" : "0"});
 }
 
 std::optional<Task> UnpackTask(std::string_view packet) {
-  const auto fields = UnpackFields<10>(packet);
+  const auto fields = UnpackFields<11>(packet);
   if (!fields) return std::nullopt;
   const auto& [kind_text, api, version, method, size_text, session_id, uid_text, user, stamp,
-               ask_pam] = *fields;
+               source, ask_pam] = *fields;
   const auto kind = ParseKind(kind_text);
   auto name = ParseName(api, version, method);
   const auto size = ParseNumber(size_text, kMaxBody);
@@ -74,6 +75,7 @@ std::optional<Task> UnpackTask(std::string_view packet) {
               static_cast<uid_t>(*uid),
               std::string(user),
               std::string(stamp),
+              std::string(source),
               ask_pam == "1"};
 }
 

@@ -27,7 +27,7 @@ struct Ask {
   std::string token;
   MethodName name;
   std::size_t body_size = 0;
-  /// The client's address.
+  /// The client's address; behind a proxy that names none, no address.
   std::string source;
   /// For kSignIn only.
   std::string user, password;
@@ -47,6 +47,8 @@ struct Task {
   std::string user;
   /// The account's when the session began (server/host/user.h).
   std::string stamp;
+  /// The client's address.
+  std::string source;
   /// PAM is to be asked whether the account is still admitted.
   bool ask_pam = false;
 };

@@ -79,7 +79,7 @@ class DaemonTest : public testing::Test {
   std::vector<Json::Value> Say(const Identity& who, const std::string& line) {
     std::vector<Json::Value> messages;
     Answer(
-        core_, who, line,
+        core_, {who, client_}, line,
         [&](std::string_view message, bool last) {
           Json::Value value;
           EXPECT_TRUE(json::FromString(std::string(message), value)) << message;
@@ -141,6 +141,7 @@ class DaemonTest : public testing::Test {
   Identity bin_, games_;
   std::int64_t now_ = 1'800'000'000;
   std::map<uid_t, Strings> history_;
+  ClientAddress client_ = ClientAddress::OfThisMachine();
   CancelCheck cancelled_ = [] { return false; };
   std::string settings_ = "[global]\n";
   std::shared_ptr<const ShareTable> table_;

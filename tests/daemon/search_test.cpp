@@ -283,6 +283,24 @@ Strings Openable(const Identity& who, const std::string& folder) {
   return names;
 }
 
+TEST_F(SearchTest, AShareIsThereForTheAddressesItIsOpenTo) {
+  AddShare("near", "hosts deny = 192.0.2.");
+  AddShare("far", "hosts deny = ALL\n\thosts allow = 192.0.2.0/24");
+  File("near/near.txt", "word");
+  File("far/far.txt", "word");
+  Index("near");
+  Index("far");
+  const Identity root{0, {}, true};
+  for (const Identity& who : {bin_, root}) {
+    client_ = ClientAddress::OfThisMachine();
+    EXPECT_EQ(Names(who, "word"), Strings{"near.txt"});
+    client_ = ClientAddress("192.0.2.7");
+    EXPECT_EQ(Names(who, "word"), Strings{"far.txt"});
+    client_ = ClientAddress();
+    EXPECT_EQ(Names(who, "word"), Strings{});
+  }
+}
+
 TEST_F(SearchTest, SeesWhatTheKernelLetsThatUserOpen) {
   std::mt19937 random(7);
   const unsigned modes[] = {0755, 0711, 0700, 0750, 0644, 0640, 0600, 0044, 0604, 0000};

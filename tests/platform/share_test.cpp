@@ -4,8 +4,10 @@
 #include <gtest/gtest.h>
 
 #include "platform/account.h"
+#include "platform/acl.h"
 #include "platform/file_index.h"
 #include "platform/process.h"
+#include "system/client_address.h"
 #include "system/share_table.h"
 #include "tests/support/support.h"
 
@@ -50,6 +52,26 @@ TEST_F(Shares, AnswerWhatTheSettingsSay) {
   EXPECT_STREQ(MLIBCSzListGet(names, 0), "homes");
   EXPECT_STREQ(MLIBCSzListGet(names, 1), "photo");
   MLIBCSzListFree(names);
+}
+
+TEST_F(Shares, AreOpenToTheirAddressesOnly) {
+  NEEDS_ACCOUNTS();
+  folder_.Write("smb.conf", "[docs]\npath = /mnt/docs\nhosts deny = 192.0.2.0/24\n");
+  MARUSHARE* share = nullptr;
+  ASSERT_EQ(MARUShareGet("docs", &share), 0);
+  for (const auto& [address, privilege] :
+       {std::pair("127.0.0.1", kSharePrivReadOnly), std::pair("192.0.2.7", kSharePrivNone),
+        std::pair("198.51.100.1", kSharePrivReadOnly), std::pair("unknown", kSharePrivNone)}) {
+    maru::WorkFor(maru::ClientAddress(address));
+    EXPECT_EQ(MARUShareUserPrivGet("alice", share), privilege) << address;
+    EXPECT_EQ(MARUShareUserPrivGet("carol", share) == kSharePrivNone, privilege == kSharePrivNone)
+        << "an administrator, too";
+    unsigned int bits = 4;
+    EXPECT_EQ(MARUACLPermGet("/volume1/docs", &bits) == 0 && bits == 0, privilege == kSharePrivNone)
+        << address;
+  }
+  maru::WorkFor(maru::ClientAddress::OfThisMachine());
+  MARUShareFree(share);
 }
 
 TEST_F(Shares, AdmitAdministratorsEverywhere) {

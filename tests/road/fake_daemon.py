@@ -101,7 +101,10 @@ class FakeDaemon:
 
     def serve(self, connection):
         with connection, contextlib.suppress(OSError), connection.makefile("rb") as stream:
-            request = json.loads(stream.readline() or b"null")
+            line = stream.readline()
+            if line.startswith(b"\x01client "):
+                line = stream.readline()
+            request = json.loads(line or b"null")
             credentials = connection.getsockopt(socket.SOL_SOCKET, socket.SO_PEERCRED, 12)
             self.peers.append(struct.unpack("3i", credentials)[0])
             self.requests.append(request)

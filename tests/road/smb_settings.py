@@ -16,14 +16,15 @@ NAMES = ("alice", "ALICE", "bob", "Bob", "carol", "@family", "+work", "@work", "
          "60001", "BOX\\alice", "box\\bob", "WORKGROUP\\alice", "\"Unix User\\bob\"",
          "@\"Unix Group\\family\"", "\"Unix Group\\work\"", "S-1-22-1-60001", "S-1-22-2-60102",
          "nobody", "@no such", "%S", "%U")
+HOSTS = ("ALL", "EXCEPT", "127.", "127.0.0.1", "127.0.0.0/24", "127.0.0.0/255.0.0.0", "127.0.0.2/31",
+         "10.", "10.0.0.0/8", "192.168.1.7", "localhost", "::1", "::ffff:127.0.0.1", "fe80::/64")
 # What withholds a share: only such a share may be missing.
 WITHHOLDING = {
     "vfs objects = acl_xattr": "acl_xattr",
     "preexec = /bin/false\n\tpreexec close = yes": "preexec",
     "root preexec = /bin/false\n\troot preexec close = yes": "preexec",
-    "hosts deny = 127.": "hosts",
-    "hosts allow = 10. 192.168.": "hosts",
-    "hosts deny = ALL\n\thosts allow = 127.0.0.1": "hosts",
+    "hosts deny = LOCAL 127.0.0.*": "hosts",
+    "hosts allow = 10. .example.org": "hosts",
     "include = /etc/samba/%U.conf": "client",
     "veto files = /*%U*/": "user",
     "path = needle": "absolute",
@@ -63,6 +64,10 @@ class World:
     def names(self):
         return ", ".join(self.random.sample(NAMES, self.random.randrange(1, 4)))
 
+    def hosts(self):
+        return self.random.choice((" ", ", ")).join(
+            self.random.sample(HOSTS, self.random.randrange(1, 5)))
+
     def rules(self):
         """Lines that any section may have."""
         pick = self.random.choice
@@ -84,7 +89,8 @@ class World:
                 ("hide files = /*.txt/", 0.1),
                 ("available = no", 0.04),
                 ("browseable = no", 0.1),
-                ("hosts allow = ALL", 0.05)):
+                (f"hosts allow = {self.hosts()}", 0.15),
+                (f"hosts deny = {self.hosts()}", 0.15)):
             if self.chance(probability):
                 rules.append(line)
         return rules
@@ -95,6 +101,7 @@ class World:
                  f"guest account = {self.random.choice(('nobody', 'nobody', 'games', 'bob'))}"]
         for line in (f"veto files = {self.random.choice(PATTERNS[:-1])}", "case sensitive = yes",
                      f"force user = {self.random.choice(USERS)}", "guest only = yes",
+                     f"hosts allow = {self.hosts()}", f"hosts deny = {self.hosts()}",
                      f"invalid users = {self.names()}", f"admin users = {self.names()}"):
             if self.chance(0.06):
                 rules.append(line)

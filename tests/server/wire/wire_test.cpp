@@ -104,7 +104,8 @@ TEST(Messages, ComeBackAsTheyWere) {
   EXPECT_EQ(again->token, ask.token);
   EXPECT_EQ(again->body_size, kMaxBody);
 
-  const Task task{AskKind::kWho, {"A", 1, "m"}, 5, "id", 4'000'000'000u, "bob", "stamp", true};
+  const Task task{AskKind::kWho, {"A", 1, "m"}, 5,     "id", 4'000'000'000u,
+                  "bob",         "stamp",       "::1", true};
   const auto same = UnpackTask(Pack(task));
   ASSERT_TRUE(same);
   EXPECT_EQ(Pack(*same), Pack(task));
