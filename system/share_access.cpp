@@ -7,6 +7,7 @@
 #include <mutex>
 #include <optional>
 
+#include "system/accounts.h"
 #include "system/text.h"
 #include "system/volume_path.h"
 
@@ -113,6 +114,12 @@ std::optional<Identity> ForcedIdentity(const std::string& account) {
   return identity;
 }
 
+/// Of a forced user a forced group takes the primary group's place.
+void LosePrimaryGroup(const std::string& account, gid_t kept, Identity& identity) {
+  const std::optional<Account> forced = AccountByName(account);
+  if (forced && forced->gid != kept) std::erase(identity.groups, forced->gid);
+}
+
 /// False when there is no such group, or who is forced is to be its member and is not.
 bool ForceGroup(const ShareSettings& share, Identity& identity) {
   std::string_view group = share.force_group;
@@ -120,6 +127,7 @@ bool ForceGroup(const ShareSettings& share, Identity& identity) {
   if (members_only) group.remove_prefix(1);
   const std::optional<gid_t> gid = GroupByName(std::string(group));
   if (!gid) return false;
+  if (!share.force_user.empty()) LosePrimaryGroup(share.force_user, *gid, identity);
   if (identity.InGroup(*gid)) return true;
   if (members_only) return share.force_user.empty() && !share.guest_only;
   identity.groups.insert(std::ranges::upper_bound(identity.groups, *gid), *gid);
