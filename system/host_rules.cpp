@@ -62,8 +62,8 @@ struct Network {
 
 /// IPv4 in IPv6 is IPv4 here.
 std::string Unmapped(const std::string& entry) {
-  constexpr std::string_view mapped = "::ffff:";
-  return SameWord(entry.substr(0, mapped.size()), mapped) ? entry.substr(mapped.size()) : entry;
+  constexpr std::string_view kMapped = "::ffff:";
+  return SameWord(entry.substr(0, kMapped.size()), kMapped) ? entry.substr(kMapped.size()) : entry;
 }
 
 /// Of IPv4 in IPv6 Samba makes a network of each.

@@ -27,8 +27,8 @@ constexpr uid_t kNobody = 65'534;
 
 /// By the ids that Debian gives people.
 bool IsPersons(const Account& account) {
-  constexpr uid_t first = 1000;
-  return account.uid >= first && account.uid < kNobody;
+  constexpr uid_t kFirst = 1000;
+  return account.uid >= kFirst && account.uid < kNobody;
 }
 
 /// Where most people's homes lie.
@@ -77,10 +77,10 @@ void SettlePersonal(ShareSettings& share, bool homes) {
   }
   const std::size_t at = PersonalComponent(share.path, homes);
   if (at == std::string::npos) return;
-  constexpr std::size_t component = std::string_view("/%U").size();
+  constexpr std::size_t kComponent = std::string_view("/%U").size();
   share.personal = {.by_home = false,
                     .own_only = share.path[at + 2] != 'S' || IsOwnName(share.valid_users),
-                    .inside = share.path.substr(at + component)};
+                    .inside = share.path.substr(at + kComponent)};
   StripSlashes(share.personal->inside);
   share.path.resize(std::max<std::size_t>(at, 1));
 }

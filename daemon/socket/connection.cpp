@@ -49,12 +49,12 @@ void Connection::Append(std::string_view bytes) {
 /// Takes the line in which root says for whom it, or who was root, asks; it comes in one piece.
 /// False when it is not root's, not in its place, or no such line.
 bool Connection::TakeIntroduction(std::string_view& bytes, uid_t sender) {
-  constexpr std::string_view beginning = kIntroduction;
-  if (!bytes.starts_with(beginning[0])) return true;
+  constexpr std::string_view kBeginning = kIntroduction;
+  if (!bytes.starts_with(kBeginning[0])) return true;
   const std::size_t end = bytes.find('\n');
-  if (WithinLine() || sender != 0 || !bytes.starts_with(beginning) || end == bytes.npos)
+  if (WithinLine() || sender != 0 || !bytes.starts_with(kBeginning) || end == bytes.npos)
     return false;
-  client_ = ClientAddress(std::string(bytes.substr(beginning.size(), end - beginning.size())));
+  client_ = ClientAddress(std::string(bytes.substr(kBeginning.size(), end - kBeginning.size())));
   bytes.remove_prefix(end + 1);
   return true;
 }
