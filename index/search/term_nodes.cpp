@@ -8,10 +8,11 @@ namespace {
 /// A term with so many times the documents of a set is looked up for each of the set.
 constexpr std::uint64_t kMuchMore = 8;
 
-/// To a multiple of 2^-30: sums of such weights are exact, so that a score is the same in whatever
-/// order terms are gone through, which follows from how many documents have them, seen or not.
+/// To a multiple of 2^-24: sums of such weights are exact up to 2^29, which no query reaches, so
+/// that a score is the same in whatever order terms are gone through, which follows from how many
+/// documents have them, seen or not.
 double Rounded(double weight) {
-  constexpr double kUnits = 3 << 21;
+  constexpr double kUnits = 3 << 27;
   return (weight + kUnits) - kUnits;
 }
 

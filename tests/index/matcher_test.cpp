@@ -70,8 +70,8 @@ class Babble {
 /// equals is then anybody's guess, also at the borders of a page.
 bool IsTied(const std::vector<Hit>& hits, std::size_t hit) {
   if (hit == 0 || hit + 1 == hits.size()) return true;
-  return std::abs(hits[hit - 1].score - hits[hit].score) < 1e-7 ||
-         std::abs(hits[hit].score - hits[hit + 1].score) < 1e-7;
+  return std::abs(hits[hit - 1].score - hits[hit].score) < 1e-6 ||
+         std::abs(hits[hit].score - hits[hit + 1].score) < 1e-6;
 }
 
 class MatcherTest : public IndexTest {
@@ -88,7 +88,7 @@ class MatcherTest : public IndexTest {
     ASSERT_EQ(ours.hits.size(), theirs.size());
     for (std::size_t hit = 0; hit < ours.hits.size(); ++hit) {
       if (page.sort_field.empty()) {
-        EXPECT_NEAR(ours.hits[hit].score, theirs[hit].weight, 1e-7);
+        EXPECT_NEAR(ours.hits[hit].score, theirs[hit].weight, 1e-6);
       }
       if (IsTied(ours.hits, hit)) continue;
       EXPECT_EQ(ours.hits[hit].share, theirs[hit].share);
@@ -229,7 +229,7 @@ TEST_F(MatcherTest, WhatIsKeptIsSetRightByEachCommit) {
         const SearchResult theirs = read->Search(query, page);
         ASSERT_EQ(ours.total, theirs.total);
         for (std::size_t i = 0; i < theirs.hits.size(); ++i) {
-          ASSERT_NEAR(ours.hits[i].score, theirs.hits[i].score, 1e-7);
+          ASSERT_NEAR(ours.hits[i].score, theirs.hits[i].score, 1e-6);
           if (IsTied(theirs.hits, i)) continue;
           ASSERT_EQ(ours.hits[i].document, theirs.hits[i].document);
         }

@@ -104,7 +104,7 @@ class Twins : public testing::Test {
     Query query;
     const int form = depth == 0 ? Below(4) : Below(8);
     query.fields = {{std::string(kText), 1}};
-    if (Below(2)) query.fields.push_back({std::string(kName), 3});
+    if (Below(2)) query.fields.push_back({std::string(kName), 997.78});
     switch (form) {
       case 0:
       case 1:
