@@ -49,6 +49,8 @@ struct Stamp {
   std::int64_t mtime_ns = 0;
   std::uint64_t size = 0;
   std::uint64_t inode = 0;
+  /// When the file was made: an inode is given out again. 0 where the file system does not tell.
+  std::int64_t born_ns = 0;
 
   friend bool operator==(const Stamp&, const Stamp&) = default;
 };

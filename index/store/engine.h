@@ -24,7 +24,7 @@ auto WithEngine(const char* doing, Work&& work) -> decltype(work()) {
 inline constexpr const char* kFormatKey = "format";
 inline constexpr const char* kRootKey = "root";
 inline constexpr const char* kTextsKey = "texts";
-inline constexpr const char* kFormat = "5";
+inline constexpr const char* kFormat = "6";
 /// The database's folder within an index folder.
 inline constexpr const char* kDatabaseFolder = "/db";
 /// In it: the file that each commit replaces.

@@ -77,7 +77,7 @@ std::string EntriesKey(DirectoryId directory) {
 void EncodeEntry(Encoder& out, const Entry& entry) {
   out.String(entry.name).Number(entry.document).Number(entry.directory);
   out.Signed(entry.stamp.ctime_ns).Signed(entry.stamp.mtime_ns);
-  out.Number(entry.stamp.size).Number(entry.stamp.inode);
+  out.Number(entry.stamp.size).Number(entry.stamp.inode).Signed(entry.stamp.born_ns);
 }
 
 Entry DecodeEntry(Decoder& in) {
@@ -89,6 +89,7 @@ Entry DecodeEntry(Decoder& in) {
   entry.stamp.mtime_ns = in.Signed();
   entry.stamp.size = in.Number();
   entry.stamp.inode = in.Number();
+  entry.stamp.born_ns = in.Signed();
   return entry;
 }
 

@@ -36,6 +36,9 @@ index::Stamp StampOf(const struct statx& status) {
   stamp.mtime_ns = Nanoseconds(status.stx_mtime.tv_sec, status.stx_mtime.tv_nsec);
   stamp.size = status.stx_size;
   stamp.inode = status.stx_ino;
+  if (status.stx_mask & STATX_BTIME) {
+    stamp.born_ns = Nanoseconds(status.stx_btime.tv_sec, status.stx_btime.tv_nsec);
+  }
   return stamp;
 }
 
@@ -56,7 +59,7 @@ std::int64_t Found::ModTime() const {
 std::optional<Found> Look(int dir_fd, const char* name) {
   struct statx status {};
   constexpr unsigned kWanted =
-      STATX_TYPE | STATX_NLINK | STATX_INO | STATX_SIZE | STATX_MTIME | STATX_CTIME;
+      STATX_TYPE | STATX_NLINK | STATX_INO | STATX_SIZE | STATX_MTIME | STATX_CTIME | STATX_BTIME;
   constexpr int kFlags = AT_SYMLINK_NOFOLLOW | AT_NO_AUTOMOUNT | AT_EMPTY_PATH;
   const std::int64_t now = FileClock();
   if (statx(dir_fd, name, kFlags, kWanted, &status) != 0) return std::nullopt;

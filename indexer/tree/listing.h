@@ -37,7 +37,9 @@ struct Found {
 
   bool IsFolder() const { return type == FileType::kFolder; }
   /// The stamp to keep: one that no file has when this one cannot be relied on.
-  index::Stamp KeptStamp() const { return is_racy ? index::Stamp{0, 0, 0, stamp.inode} : stamp; }
+  index::Stamp KeptStamp() const {
+    return is_racy ? index::Stamp{0, 0, 0, stamp.inode, stamp.born_ns} : stamp;
+  }
   /// Seconds since the epoch.
   std::int64_t ModTime() const;
 };

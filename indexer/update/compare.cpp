@@ -55,7 +55,7 @@ bool SameContent(const Entry& entry, const Found& found) {
   const index::Stamp& now = found.stamp;
   return SameType(entry, found) &&
          (found.IsFolder() || (before.mtime_ns == now.mtime_ns && before.size == now.size &&
-                               before.inode == now.inode));
+                               before.inode == now.inode && before.born_ns == now.born_ns));
 }
 
 }  // namespace maru::indexer

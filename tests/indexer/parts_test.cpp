@@ -1,6 +1,7 @@
 #include "fixture.h"
 #include "indexer/crawl/progress.h"
 #include "indexer/follow/pending.h"
+#include "indexer/update/compare.h"
 
 namespace maru::indexer::test {
 namespace {
@@ -47,6 +48,18 @@ TEST(ProgressTest, TellsRatesAndTheTimeLeftOnceItCan) {
   counts.failed = 1;
   EXPECT_EQ("ph?[31moto: 5000 new, 0 changed, 0 unchanged, 0 removed, 3 failed, 10.0 s",
             Progress::Summary("ph\033[31moto", counts, 10));
+}
+
+TEST(Compare, AnInodeThatIsGivenOutAgainIsAnotherFile) {
+  index::Entry entry;
+  entry.stamp = {1, 2, 3, 4, 5};
+  Found found;
+  found.type = FileType::kFile;
+  found.stamp = entry.stamp;
+  found.stamp.ctime_ns = 7;
+  EXPECT_TRUE(SameContent(entry, found));
+  found.stamp.born_ns = 6;
+  EXPECT_FALSE(SameContent(entry, found));
 }
 
 }  // namespace
